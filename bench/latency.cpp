@@ -1,0 +1,60 @@
+// How soon an idle daemon answers, against a bare server that answers every packet with one byte.
+#include "bench/bare_receivers.h"
+#include "bench/load.h"
+#include "bench/measure.h"
+#include "bench/sections.h"
+
+namespace kivd::bench {
+
+namespace {
+
+struct samples {
+    std::vector<double> median_us;
+    std::vector<double> slowest_us;  // the 99th percentile
+};
+
+void ping(int connection, unsigned count, samples& into) {
+    std::vector<double> times;
+    for (unsigned i = 0; i < count; ++i) {
+        const int64_t start = now_ns();
+        if (ask(connection, "IA") != "1") give_up("IA not answered with 1");
+        times.push_back(static_cast<double>(now_ns() - start) / 1e3);
+    }
+    into.median_us.push_back(percentile(times, 50));
+    into.slowest_us.push_back(percentile(times, 99));
+}
+
+}  // namespace
+
+void measure_latency(const setup& s) {
+    print_section("An answer to IA");
+    const scratch_directory bare_directory(s.scratch);
+    child_process server = start_echo_server(bare_directory.path());
+    const scratch_directory directory(s.scratch);
+    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
+    const unique_fd bare_connection = connect_control(bare_directory.path());
+    const unique_fd connection = connect_control(directory.path());
+
+    samples bare;
+    samples real;
+    samples unused;
+    const unsigned count = amount(s, 2000, 500);
+    ping(bare_connection.get(), count, unused);
+    ping(connection.get(), count, unused);
+    for (unsigned i = 0; i < amount(s, 25, 7); ++i) {
+        ping(bare_connection.get(), count, bare);
+        ping(connection.get(), count, real);
+    }
+    (void)daemon.process.stop();
+    (void)server.stop();
+
+    print_row("bare echo, 50th percentile", bare.median_us, "us");
+    print_row("kivd, 50th percentile", real.median_us, "us");
+    print_row("bare echo, 99th percentile", bare.slowest_us, "us");
+    print_row("kivd, 99th percentile", real.slowest_us, "us");
+    print_row("50th percentile, kivd : bare", ratios(real.median_us, bare.median_us), "x");
+    print_row("99th percentile, kivd : bare", ratios(real.slowest_us, bare.slowest_us), "x",
+              {bound::at_most, 1.3});
+}
+
+}  // namespace kivd::bench

@@ -1,0 +1,184 @@
+#include "bench/process.h"
+
+#include <linux/perf_event.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "bench/measure.h"
+
+namespace kivd::bench {
+
+namespace {
+
+constexpr int stop_limit_ms = 5000;
+constexpr int join_limit_ms = 60'000;
+
+void wait_for(pid_t pid) {
+    while (waitpid(pid, nullptr, 0) == -1 && errno == EINTR) {
+    }
+}
+
+std::string proc_path(pid_t pid, const char* name) {
+    return "/proc/" + std::to_string(pid) + "/" + name;
+}
+
+// The first number of a schedstat file: time on a processor, in ns.
+int64_t read_schedstat(const std::string& path) {
+    std::ifstream file(path);
+    int64_t value = 0;
+    file >> value;
+    return value;
+}
+
+// The number behind `key` in a file of "key: number" lines.
+int64_t read_field(const std::string& path, const std::string& key) {
+    std::ifstream file(path);
+    std::string line;
+    while (std::getline(file, line)) {
+        if (!line.starts_with(key)) continue;
+        return strtoll(line.c_str() + key.size(), nullptr, 10);
+    }
+    return 0;
+}
+
+unique_fd open_process(pid_t pid) {
+    return unique_fd(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
+}
+
+bool becomes_readable(int fd, int limit_ms) {
+    pollfd event{.fd = fd, .events = POLLIN, .revents = 0};
+    return poll(&event, 1, limit_ms) == 1;
+}
+
+unique_fd open_counter(perf_event_attr& attributes, pid_t pid) {
+    attributes.size = sizeof attributes;
+    return unique_fd(static_cast<int>(
+        syscall(SYS_perf_event_open, &attributes, pid, -1, -1, PERF_FLAG_FD_CLOEXEC)));
+}
+
+}  // namespace
+
+child_process& child_process::operator=(child_process&& other) noexcept {
+    if (this == &other) return *this;
+    kill_now();
+    pid_ = std::exchange(other.pid_, -1);
+    return *this;
+}
+
+void child_process::kill_now() noexcept {
+    if (pid_ <= 0) return;
+    (void)kill(pid_, SIGKILL);
+    wait_for(pid_);
+    pid_ = -1;
+}
+
+int64_t child_process::stop() {
+    const unique_fd watched = open_process(pid_);
+    const int64_t start = now_ns();
+    (void)kill(pid_, SIGTERM);
+    const bool ended = becomes_readable(watched.get(), stop_limit_ms);
+    const int64_t taken = now_ns() - start;
+    const pid_t pid = pid_;
+    kill_now();
+    if (!ended) give_up("process %d did not end on SIGTERM", static_cast<int>(pid));
+    return taken;
+}
+
+void child_process::join() {
+    const unique_fd watched = open_process(pid_);
+    int status = 0;
+    if (!becomes_readable(watched.get(), join_limit_ms) || !ended(status) || status != 0)
+        give_up("a measuring process did not end as it should");
+}
+
+bool child_process::ended(int& status) {
+    if (waitpid(pid_, &status, WNOHANG) != pid_) return false;
+    pid_ = -1;
+    return true;
+}
+
+child_process fork_child(const std::function<void()>& body) {
+    (void)fflush(stdout);
+    const pid_t parent = getpid();
+    const pid_t pid = fork();
+    if (pid == -1) give_up("fork: %s", strerror(errno));
+    if (pid != 0) return child_process(pid);
+    (void)prctl(PR_SET_PDEATHSIG, SIGKILL);
+    (void)signal(SIGTERM, SIG_DFL);
+    (void)signal(SIGINT, SIG_IGN);  // the terminal's ^C is for the parent, which ends us
+    if (getppid() == parent) body();
+    _exit(0);
+}
+
+scratch_directory::scratch_directory(const std::string& parent) {
+    std::string name = parent + "/kivd-bench-XXXXXX";
+    if (mkdtemp(name.data()) == nullptr) give_up("%s: %s", name.c_str(), strerror(errno));
+    path_ = name;
+}
+
+scratch_directory::~scratch_directory() {
+    std::error_code ignored;
+    (void)std::filesystem::remove_all(path_, ignored);
+}
+
+int64_t process_cpu_ns(pid_t pid) {
+    int64_t sum = 0;
+    std::error_code error;
+    for (const auto& task : std::filesystem::directory_iterator(proc_path(pid, "task"), error))
+        sum += read_schedstat(task.path() / "schedstat");
+    return sum;
+}
+
+int64_t main_thread_cpu_ns(pid_t pid) {
+    const std::string thread = "task/" + std::to_string(pid) + "/schedstat";
+    return read_schedstat(proc_path(pid, thread.c_str()));
+}
+
+int64_t voluntary_switches(pid_t pid) {
+    int64_t sum = 0;
+    std::error_code error;
+    for (const auto& task : std::filesystem::directory_iterator(proc_path(pid, "task"), error))
+        sum += read_field(task.path() / "status", "voluntary_ctxt_switches:");
+    return sum;
+}
+
+int64_t private_dirty_bytes(pid_t pid) {
+    return read_field(proc_path(pid, "smaps_rollup"), "Private_Dirty:") * 1024;
+}
+
+unique_fd open_system_call_counter(pid_t thread) {
+    std::ifstream file("/sys/kernel/tracing/events/raw_syscalls/sys_enter/id");
+    uint64_t id = 0;
+    if (!(file >> id)) return unique_fd();
+    perf_event_attr attributes{};
+    attributes.type = PERF_TYPE_TRACEPOINT;
+    attributes.config = id;
+    return open_counter(attributes, thread);
+}
+
+unique_fd open_family_cpu_counter(pid_t pid) {
+    perf_event_attr attributes{};
+    attributes.type = PERF_TYPE_SOFTWARE;
+    attributes.config = PERF_COUNT_SW_TASK_CLOCK;
+    attributes.inherit = 1;
+    return open_counter(attributes, pid);
+}
+
+int64_t read_counter(int fd) {
+    int64_t value = 0;
+    if (read(fd, &value, sizeof value) != sizeof value) return 0;
+    return value;
+}
+
+}  // namespace kivd::bench

@@ -1,0 +1,71 @@
+// Child processes and what the kernel says about them.
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <functional>
+#include <string>
+
+#include "util/unique_fd.h"
+
+namespace kivd::bench {
+
+// Owns a child process and kills it, by its id, when it has not been stopped.
+class child_process {
+ public:
+    explicit child_process(pid_t pid = -1) noexcept : pid_(pid) {}
+    child_process(child_process&& other) noexcept : pid_(std::exchange(other.pid_, -1)) {}
+    child_process& operator=(child_process&& other) noexcept;
+    ~child_process() { kill_now(); }
+
+    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
+    // SIGTERM, then waits until the process is gone; one that takes over five seconds is killed
+    // and the run given up. The time from the signal to the end, in ns.
+    int64_t stop();
+    // Whether it has ended by itself; if so, with the status of waitpid.
+    [[nodiscard]] bool ended(int& status);
+    // Waits until it has; gives the run up when that takes over a minute or has ended badly.
+    void join();
+
+ private:
+    void kill_now() noexcept;
+    pid_t pid_;
+};
+
+// Runs `body` in a child that dies with this process, and ends it when `body` returns.
+[[nodiscard]] child_process fork_child(const std::function<void()>& body);
+
+// A directory of its own below `parent`, removed with all that is in it.
+class scratch_directory {
+ public:
+    explicit scratch_directory(const std::string& parent);
+    scratch_directory(const scratch_directory&) = delete;
+    scratch_directory& operator=(const scratch_directory&) = delete;
+    ~scratch_directory();
+    [[nodiscard]] const std::string& path() const noexcept { return path_; }
+
+ private:
+    std::string path_;
+};
+
+// CPU time of all threads, user and system, in ns, with the scheduler's own precision; without the
+// time of child processes.
+[[nodiscard]] int64_t process_cpu_ns(pid_t pid);
+// The same for the first thread alone.
+[[nodiscard]] int64_t main_thread_cpu_ns(pid_t pid);
+// How often the threads have gone to sleep of their own accord.
+[[nodiscard]] int64_t voluntary_switches(pid_t pid);
+// Memory that no other process shares and no file backs.
+[[nodiscard]] int64_t private_dirty_bytes(pid_t pid);
+
+// Kernel counters, read with read_counter. None where the kernel or its settings don't allow them.
+//
+// System calls of the thread `thread`, children and other threads not included.
+[[nodiscard]] unique_fd open_system_call_counter(pid_t thread);
+// CPU time in ns of `pid` and of all its threads and children from now on. A child is added when
+// it ends.
+[[nodiscard]] unique_fd open_family_cpu_counter(pid_t pid);
+[[nodiscard]] int64_t read_counter(int fd);
+
+}  // namespace kivd::bench

@@ -1,0 +1,60 @@
+#include "daemon/error/child_process.h"
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+
+#include "daemon/error/daemon_error.h"
+#include "daemon/stop.h"
+#include "platform/android_log.h"
+
+namespace kivd {
+namespace {
+
+constinit int inherited_fd = -1;
+
+void drop_descriptors() {
+    const auto first = static_cast<unsigned>(STDERR_FILENO + 1);
+    if (inherited_fd < STDERR_FILENO + 1) {
+        (void)close_range(first, ~0U, 0);
+    } else {
+        const auto kept = static_cast<unsigned>(inherited_fd);
+        if (kept > first) (void)close_range(first, kept - 1, 0);
+        (void)close_range(kept + 1, ~0U, 0);
+    }
+    daemon_error_forget_connection();
+    log_forget_descriptor();
+    stop_forget_event();
+}
+
+}  // namespace
+
+void set_inherited_descriptor(int fd) { inherited_fd = fd; }
+
+pid_t fork_child() {
+    // No handler may run in the child while it still shares the parent's wake-up event.
+    sigset_t all;
+    sigset_t before;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &before);
+    daemon_error_lock();
+
+    const pid_t pid = fork();
+    const int fork_errno = errno;
+    if (pid == 0) drop_descriptors();
+
+    daemon_error_unlock();
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    errno = fork_errno;
+    return pid;
+}
+
+void wait_for_child(pid_t pid) {
+    while (waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
+    }
+}
+
+}  // namespace kivd

@@ -1,0 +1,19 @@
+// The one door to fork.
+#pragma once
+
+#include <sys/types.h>
+
+namespace kivd {
+
+// The descriptor that children hold open beside 0 to 2: the daemon's lock, so that no new daemon
+// meets the work of an old one's child half done.
+void set_inherited_descriptor(int fd);
+
+// fork(). The child may log and raise errors, keeps the flag-only stop handler, and has lost every
+// descriptor but 0 to 2 and the inherited one; it has to end with _exit.
+[[nodiscard]] pid_t fork_child();
+
+// Waits until the child `pid` has ended; the system reaps it.
+void wait_for_child(pid_t pid);
+
+}  // namespace kivd

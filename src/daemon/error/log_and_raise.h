@@ -1,0 +1,10 @@
+// Reporting a failure: into the log, and as a daemon error event.
+#pragma once
+
+namespace kivd {
+
+// Logs at ERROR under `tag`, then raises "tag: text". Returns -1, so that a failing function can
+// end in `return log_and_raise(...)`. Keeps errno.
+[[gnu::format(printf, 2, 3)]] int log_and_raise(const char* tag, const char* format, ...);
+
+}  // namespace kivd

@@ -1,0 +1,28 @@
+// The one event loop.
+#pragma once
+
+namespace kivd {
+
+// The object behind every descriptor in the loop. It must outlive its registration.
+struct event_handler {
+    // Called when `fd` is readable. It may free or close its own handler, as its last act, and no
+    // other: up to ten events are taken in one wait and come with raw pointers.
+    void (*callback)(event_handler& handler);
+    int fd;  // -1 while closed
+};
+
+// Makes the loop. -1 on failure, logged.
+[[nodiscard]] int event_loop_init();
+
+// Adds a handler with its descriptor, or takes it out. -1 with errno set when it cannot be added.
+[[nodiscard]] int event_loop_add(event_handler& handler);
+void event_loop_remove(event_handler& handler);
+
+// From now on a timer cuts short whatever blocks a callback for more than a second, for kernels on
+// which clients can make the closing of received descriptors block.
+void event_loop_bound_stalls();
+
+// Serves events and the timed save until a stop is requested.
+void event_loop_run();
+
+}  // namespace kivd

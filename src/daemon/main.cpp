@@ -1,0 +1,3 @@
+#include "daemon/startup.h"
+
+int main(int argc, char** argv) { return kivd::run_daemon(argc, argv); }

@@ -1,0 +1,101 @@
+#include "daemon/net/client_sockets.h"
+
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+
+#include "daemon/event_loop.h"
+#include "daemon/net/connections.h"
+#include "daemon/net/datagrams.h"
+#include "daemon/net/packet_buffer.h"
+#include "platform/android_log.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd";
+constexpr mode_t socket_mode = 0622;
+constexpr int listen_backlog = 5;
+
+#ifndef SO_PASSRIGHTS
+constexpr int SO_PASSRIGHTS = 83;  // Linux 6.16
+#endif
+
+struct client_socket {
+    int type;
+    const char* name;
+    event_handler handler;
+};
+constinit client_socket client_sockets[] = {
+    {SOCK_DGRAM, paths::datagram_socket, {receive_dgram_client, -1}},
+    {SOCK_SEQPACKET, paths::sequenced_packet_socket, {accept_seq_client, -1}},
+    {SOCK_STREAM, paths::stream_socket, {accept_stream_client, -1}},
+};
+
+// Logs what failed with the system error, and ends the process.
+[[noreturn]] void give_up(const char* what) {
+    __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to %s: %s", what, strerror(errno));
+    exit(1);
+}
+
+// No client may hand us descriptors. Where the kernel cannot refuse them, closing one may block.
+void refuse_descriptors(int fd) {
+    const int off = 0;
+    if (setsockopt(fd, SOL_SOCKET, SO_PASSRIGHTS, &off, sizeof off) != 0) {
+        event_loop_bound_stalls();
+    }
+}
+
+int create_socket(int type, const char* name) {
+    unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
+    if (!fd.ok()) give_up("create AF_UNIX socket");
+    refuse_descriptors(fd.get());
+    if (type == SOCK_DGRAM) {  // before the first packet can arrive
+        set_socket_timeouts(fd.get());
+        const int on = 1;
+        (void)setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
+    }
+
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    strncpy(address.sun_path, name, sizeof address.sun_path - 1);
+    if (unlink(name) != 0 && errno != ENOENT) give_up("unlink socket");
+    if (bind(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        give_up("bind to socket");
+    }
+    (void)chmod(name, socket_mode);
+    if (type != SOCK_DGRAM && listen(fd.get(), listen_backlog) != 0) {
+        give_up("listen to uds-socket");
+    }
+    return fd.release();
+}
+
+}  // namespace
+
+void create_client_sockets() {
+    if (packet_buffers_init() != 0) give_up("map packet buffers");
+    for (client_socket& each : client_sockets) {
+        each.handler.fd = create_socket(each.type, each.name);
+        if (event_loop_add(each.handler) != 0) give_up("add socket to epoll");
+    }
+}
+
+void remove_client_sockets() {
+    for (const client_socket& each : client_sockets) (void)unlink(each.name);
+    for (client_socket& each : client_sockets) {
+        event_loop_remove(each.handler);
+        (void)close(each.handler.fd);
+        each.handler.fd = -1;
+    }
+    connections_release();
+    packet_buffers_release();
+}
+
+}  // namespace kivd

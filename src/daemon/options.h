@@ -1,0 +1,15 @@
+// The command line.
+#pragma once
+
+namespace kivd {
+
+struct options {
+    const char* base_directory;  // as given
+    bool detach;
+};
+
+// Reads the command line into the modules that it concerns and gives the rest. Ends the process
+// when help is asked for or a certificate path does not exist; what it does not know is ignored.
+[[nodiscard]] options parse_options(int argc, char** argv);
+
+}  // namespace kivd

@@ -1,0 +1,66 @@
+#include "daemon/request/request.h"
+
+#include <cstring>
+
+#include "daemon/error/log_and_raise.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd";
+constexpr char delimiters[] = " \t\r\n";
+constexpr size_t max_probe_id_size = 256;  // package and name together
+
+const char* or_null(const char* text) { return text != nullptr ? text : "null"; }
+
+}  // namespace
+
+request make_request(int fd, std::span<char> packet, const msghdr* message) {
+    return {fd, packet, message, packet.data(), packet.data()};
+}
+
+const char* next_token(request& r) {
+    char* const token = r.rest + strspn(r.rest, delimiters);
+    const size_t length = strcspn(token, delimiters);
+    r.token_end = token + length;
+    const bool ends_text = *r.token_end == '\0';
+    *r.token_end = '\0';
+    r.rest = ends_text ? r.token_end : r.token_end + 1;
+    return length > 0 ? token : nullptr;
+}
+
+std::span<const char> raw_rest(const request& r) {
+    const char* const packet_end = r.packet.data() + r.packet.size();
+    if (r.token_end >= packet_end) return {};
+    return {r.token_end + 1, packet_end};
+}
+
+const char* text_rest(const request& r) { return r.rest; }
+
+size_t reply(request& r, std::string_view text) { return text.copy(r.packet.data(), text.size()); }
+
+bool take_probe_id(request& r, const char* command, probe_id& probe) {
+    probe.package = next_token(r);
+    probe.name = next_token(r);
+    if (probe.package == nullptr || probe.name == nullptr) {
+        (void)log_and_raise(tag, "[%s] Null in probe id - dropping. [%s:%s]", command,
+                            or_null(probe.package), or_null(probe.name));
+        return false;
+    }
+    const size_t size = strlen(probe.package) + strlen(probe.name);
+    if (size > max_probe_id_size) {
+        (void)log_and_raise(tag, "[%s] To large probe id, %zu > %d - dropping. [%s:%s]", command,
+                            size, static_cast<int>(max_probe_id_size), probe.package, probe.name);
+        return false;
+    }
+    return true;
+}
+
+bool check_probe_value(const char* command, const probe_id& probe, const char* value) {
+    if (value != nullptr && *value != '\0') return true;
+    (void)log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command,
+                        probe.package, probe.name);
+    return false;
+}
+
+}  // namespace kivd

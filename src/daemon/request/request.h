@@ -1,0 +1,48 @@
+// One request packet while it is being handled: text split into tokens at blanks (space, tab,
+// carriage return, line feed), in place. A NUL ends the token and the splitting.
+#pragma once
+
+#include <sys/socket.h>
+
+#include <cstddef>
+#include <span>
+#include <string_view>
+
+namespace kivd {
+
+struct request {
+    int fd;                  // the connection; -1 for a datagram
+    std::span<char> packet;  // followed by a NUL and by room for a reply
+    const msghdr* message;   // of a datagram: carries its sender's credentials
+    char* token_end;         // the NUL behind the last token taken
+    char* rest;              // where the next token is looked for
+};
+
+[[nodiscard]] request make_request(int fd, std::span<char> packet, const msghdr* message);
+
+// The next token, or null when there is none left.
+[[nodiscard]] const char* next_token(request& r);
+
+// What follows the one delimiter behind the last token, as raw bytes, NULs included.
+[[nodiscard]] std::span<const char> raw_rest(const request& r);
+
+// The same as text, up to the first NUL; empty when the last token ended the text.
+[[nodiscard]] const char* text_rest(const request& r);
+
+// Writes a reply over the packet; gives its length.
+size_t reply(request& r, std::string_view text);
+
+// A probe's id: package and name.
+struct probe_id {
+    const char* package;  // null when missing
+    const char* name;     // null when missing
+};
+
+// Takes the next two tokens as a probe's id. False, logged and raised, when one is missing or
+// together they are too long.
+[[nodiscard]] bool take_probe_id(request& r, const char* command, probe_id& probe);
+
+// Whether a value is there and not empty; otherwise that has been logged and raised.
+[[nodiscard]] bool check_probe_value(const char* command, const probe_id& probe, const char* value);
+
+}  // namespace kivd

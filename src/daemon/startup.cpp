@@ -1,0 +1,224 @@
+#include "daemon/startup.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "config/limits.h"
+#include "daemon/error/child_process.h"
+#include "daemon/error/daemon_error.h"
+#include "daemon/event_loop.h"
+#include "daemon/net/client_sockets.h"
+#include "daemon/options.h"
+#include "daemon/save_clock.h"
+#include "daemon/stop.h"
+#include "platform/android_log.h"
+#include "report/header_record.h"
+#include "report/identity.h"
+#include "report/output_dir.h"
+#include "report/record_file.h"
+#include "report/report_generation.h"
+#include "report/state_file.h"
+#include "store/counter_store.h"
+#include "store/static_store.h"
+#include "util/file_io.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd";
+
+constinit char* base_directory = nullptr;  // absolute; a block of malloc
+
+// A data file that became descriptor 0, 1 or 2 would take whatever is printed there.
+void open_standard_descriptors() {
+    int fd = 0;
+    do {
+        fd = open("/dev/null", O_RDWR);  // NOLINT(android-cloexec-open): the standard ones stay
+    } while (fd >= 0 && fd <= STDERR_FILENO);
+    if (fd > STDERR_FILENO) (void)close(fd);
+}
+
+// The errors that the daemon raises find its sockets from here, whatever the directory is by then.
+void set_base_directory(const char* given) {
+    if (given[0] == '/') {
+        base_directory = strdup(given);
+    } else {
+        const unique_malloc<char> current(getcwd(nullptr, 0));
+        if (!current || asprintf(&base_directory, "%s/%s", current.get(), given) < 0) {
+            base_directory = nullptr;
+        }
+    }
+    if (base_directory == nullptr) fatal_error("OOM: base_dir_p");
+}
+
+void detach() {
+    const pid_t pid = fork();
+    if (pid < 0) exit(1);
+    if (pid > 0) _exit(0);
+    if (setsid() < 0) exit(1);
+    (void)close_range(0, ~0U, 0);
+    if (open("/dev/null", O_RDWR) != 0 || dup(0) != 1 || dup(0) != 2) exit(1);  // NOLINT
+    log_to_system();
+}
+
+[[gnu::format(printf, 1, 2), noreturn]] void give_up(const char* format, ...) {
+    char text[error_text_size];
+    va_list arguments;
+    va_start(arguments, format);
+    vsnprintf(text, sizeof text, format, arguments);
+    va_end(arguments);
+    __android_log_print(ANDROID_LOG_ERROR, tag, "%s", text);
+    exit(1);
+}
+
+// The lock is held, through the open descriptor, until the process and its children have ended.
+void take_lock() {
+    unique_fd fd(open(paths::lock_file, O_RDWR | O_CREAT | O_CLOEXEC, 0644));
+    if (!fd.ok()) {
+        give_up("Failed to open lock file %s, and errno is %s", paths::lock_file, strerror(errno));
+    }
+    if (flock(fd.get(), LOCK_EX | LOCK_NB) != 0) {
+        give_up("Another kivd is already running, and errno is %s", strerror(errno));
+    }
+    char line[20];
+    const int size = snprintf(line, sizeof line, "%d\n", getpid());
+    if (write_all(fd.get(), line, static_cast<size_t>(size)) < 0) exit(1);
+    set_inherited_descriptor(fd.release());
+}
+
+struct signal_action {
+    int number;
+    void (*handler)(int);
+    const char* name;
+};
+// Of all the others that would end the daemon, those that something may send without meaning it to.
+// SIGALRM only interrupts a call that blocks.
+const signal_action signal_actions[] = {
+    {SIGINT, [](int) { request_stop(); }, "SIGINT"},
+    {SIGTERM, [](int) { request_stop(); }, "SIGTERM"},
+    {SIGCHLD, SIG_IGN, "SIGCHLD"},
+    {SIGHUP, SIG_IGN, "SIGHUP"},
+    {SIGPIPE, SIG_IGN, "SIGPIPE"},
+    {SIGQUIT, SIG_IGN, "SIGQUIT"},
+    {SIGUSR1, SIG_IGN, "SIGUSR1"},
+    {SIGUSR2, SIG_IGN, "SIGUSR2"},
+    {SIGALRM, [](int) {}, "SIGALRM"},
+};
+
+void install_signal_handlers() {
+    for (const signal_action& each : signal_actions) {
+        struct sigaction action = {};
+        action.sa_handler = each.handler;
+        sigemptyset(&action.sa_mask);
+        if (sigaction(each.number, &action, nullptr) == 0) continue;
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to install %s handler: %s", each.name,
+                            strerror(errno));
+    }
+}
+
+void create_directory(const char* path, mode_t mode, const char* name) {
+    if (mkdir(path, mode) == 0 || errno == EEXIST) return;
+    give_up("Failed to create %s directory: %s", name, strerror(errno));
+}
+
+void create_directories() {
+    umask(0);
+    create_directory(paths::private_dir, 0700, "private");
+    create_directory(paths::output_dir, 0755, "output");
+    create_directory(paths::input_dir, 0755, "input");
+    umask(022);
+}
+
+// One client a descriptor: there are as many as the system allows.
+void raise_descriptor_limit() {
+    rlimit limit = {};
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+    limit.rlim_cur = limit.rlim_max;
+    (void)setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+// Puts the process into its place: detached, in its directory, the only one there.
+void enter_working_directory(const options& given) {
+    set_base_directory(given.base_directory);
+    if (given.detach && getppid() != 1) {
+        detach();
+    } else {
+        puts("Will not detach (or already detached)");
+        fflush(stdout);
+    }
+    if (chdir(given.base_directory) != 0) {
+        give_up("Could not chdir(%s), and errno is %s", given.base_directory, strerror(errno));
+    }
+    take_lock();
+    stop_init();
+    install_signal_handlers();
+}
+
+void load_everything() {
+    daemon_error_init(base_directory);
+    rescue_event_file(paths::events, record_header::expected);
+    counters_init();
+    sdata_init();
+    init_header(get_header_record());
+    config_load();
+    (void)prune_dir();
+    ensure_device_id();
+    update_header_info();
+}
+
+void release_all() {
+    counters_free();
+    sdata_free();
+    free_header();
+    free(base_directory);
+    base_directory = nullptr;
+}
+
+void shut_down() {
+    __android_log_print(ANDROID_LOG_INFO, tag, "Shutting down...");
+    counters_save();
+    sdata_save();
+    config_save();
+    wait_for_compactor();  // a restart must not meet a report half written
+    (void)unlink(paths::lock_file);
+    remove_client_sockets();
+    release_all();
+    __android_log_print(ANDROID_LOG_INFO, tag, "Exiting.");
+}
+
+}  // namespace
+
+int run_daemon(int argc, char** argv) {
+    open_standard_descriptors();
+    init_settings();
+    enter_working_directory(parse_options(argc, argv));
+    check_disabled();
+
+    __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
+    raise_descriptor_limit();
+    create_directories();
+    load_everything();
+
+    if (event_loop_init() != 0) exit(1);
+    create_client_sockets();
+    mark_saved();
+    __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the world.");
+    event_loop_run();
+
+    shut_down();
+    return 0;
+}
+
+}  // namespace kivd

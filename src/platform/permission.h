@@ -1,0 +1,13 @@
+// The permission service on plain Linux.
+#pragma once
+
+#include <sys/types.h>
+
+namespace kivd {
+
+// Whether the process `pid` of user `uid` holds `permission`. User 0 holds every permission; the
+// members of the group kiv_private hold com.vantrelis.permission.KIV_PRIVATE. The answer is looked
+// up once for each user, in the local group and user files only, and then kept.
+[[nodiscard]] bool check_permission(const char* permission, pid_t pid, uid_t uid);
+
+}  // namespace kivd

@@ -1,0 +1,137 @@
+#include "report/identity.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "daemon/error/daemon_error.h"
+#include "daemon/error/log_and_raise.h"
+#include "report/header_record.h"
+#include "report/header_sources.h"
+#include "report/report_generation.h"
+#include "report/state_file.h"
+#include "util/clock.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-util";
+
+void add_group_ids(group_id_list& to, const group_id_list& from) {
+    for (size_t i = 0; i < from.count; ++i) add_group_id(to, from.ids[i].get());
+}
+
+// What no source gives is taken from what is remembered.
+void fill_from_record(header_record& candidate, const header_record& record) {
+    add_group_ids(candidate.groups, record.groups);
+    add_group_id_property(candidate);
+    if (!candidate.device_id.is_known()) candidate.device_id = record.device_id;
+    if (!candidate.serial_number.is_known()) candidate.serial_number = record.serial_number;
+    if (candidate.device_imei.empty()) candidate.device_imei = record.device_imei;
+    candidate.config_checksum.set(get_config_checksum_text().get());
+}
+
+bool same_group_ids(const group_id_list& a, const group_id_list& b) {
+    if (a.count != b.count) return false;
+    for (size_t i = 0; i < a.count; ++i) {
+        if (strncmp(a.ids[i].get(), b.ids[i].get(), group_id_compared) != 0) return false;
+    }
+    return true;
+}
+
+// A value that is not known any more is no change.
+bool is_changed(const header_record& candidate, const header_record& previous) {
+    const auto changed = [](const auto& now, const auto& before) {
+        return now.is_known() && !(now == before);
+    };
+    return changed(candidate.product_id, previous.product_id) ||
+           changed(candidate.software_version, previous.software_version) ||
+           changed(candidate.software_variant, previous.software_variant) ||
+           changed(candidate.build_type, previous.build_type) ||
+           !(candidate.config_checksum == previous.config_checksum) ||
+           changed(candidate.cdf_id, previous.cdf_id) ||
+           changed(candidate.serial_number, previous.serial_number) ||
+           !(candidate.device_imei == previous.device_imei) ||
+           changed(candidate.device_id, previous.device_id) ||
+           !same_group_ids(candidate.groups, previous.groups);
+}
+
+void rebuild_header(header_record& record) {
+    header_record candidate;
+    gather_header(candidate);
+    fill_from_record(candidate, record);
+    const header_record previous = record;
+
+    copy_known_values(record, candidate);
+    add_group_ids(record.groups, candidate.groups);
+    pack_report_header();
+
+    if (!is_changed(candidate, previous)) return;
+    if (previous.product_id.is_known() && previous.device_id.is_known()) (void)generate_report();
+    config_save();
+}
+
+void announce_group_ids() {
+    config_save();
+    update_header_info();
+}
+
+}  // namespace
+
+void update_header_info() {
+    header_record& record = get_header_record();
+    if (is_test_mode()) {
+        set_test_identity(record);
+        pack_report_header();
+    } else {
+        rebuild_header(record);
+    }
+    if (get_report_header().empty()) fatal_error("OOM: header_buf_p");
+}
+
+void ensure_device_id() {
+    header_record& record = get_header_record();
+    if (record.device_id.is_known()) return;
+    const unique_file file(fopen(paths::random_uuid, "re"));
+    if (!file) {
+        (void)log_and_raise(tag, "Failed to open uuid file: %s", strerror(errno));
+        return;
+    }
+    char line[40];
+    if (fgets(line, sizeof line, file.get()) == nullptr) return;
+    line[std::max(strlen(line), size_t{1}) - 1] = '\0';  // the line end
+    record.device_id.set(line);
+    config_save();
+}
+
+void get_device_id(device_id_buffer& buffer) {
+    const std::string_view id = get_header_record().device_id.get();
+    buffer = {};
+    (void)id.copy(buffer.data(), buffer.size());
+}
+
+void set_group_id(const char* id) {
+    if (add_group_id(get_header_record().groups, id) != 0) announce_group_ids();
+}
+
+void delete_group_id(const char* id) {
+    group_id_list& groups = get_header_record().groups;
+    const size_t position = find_group_id(groups, id);
+    if (position == max_group_ids) return;
+    std::shift_left(groups.ids.begin() + position, groups.ids.begin() + groups.count, 1);
+    --groups.count;
+    announce_group_ids();
+}
+
+void replace_group_id(const char* new_id, const char* old_id) {
+    group_id_list& groups = get_header_record().groups;
+    const size_t position = find_group_id(groups, old_id);
+    if (position == max_group_ids) return;
+    groups.ids[position].set(new_id);
+    announce_group_ids();
+}
+
+}  // namespace kivd

@@ -1,0 +1,162 @@
+#include "report/output_dir.h"
+
+#include <sys/stat.h>
+#include <sys/statfs.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <optional>
+#include <string_view>
+
+#include "config/limits.h"
+#include "daemon/error/log_and_raise.h"
+#include "daemon/stop.h"
+#include "platform/android_log.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-compactor";
+constexpr char remove_tag[] = "kivd-util";
+constexpr uint64_t compaction_overhead = 256000;  // bytes beside a report of the largest size
+constexpr uint64_t min_free_inodes = 8;
+
+struct entry_path {
+    explicit entry_path(const char* name) {
+        snprintf(text, sizeof text, "%s%s", paths::output_dir, name);
+    }
+    char text[sizeof paths::output_dir + NAME_MAX];
+};
+
+// Calls `function` with the name of each entry but "config_request".
+void for_each_entry(DIR* directory, auto function) {
+    while (const dirent* entry = readdir(directory)) {
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != ".." && name != paths::config_request_name) {
+            function(entry->d_name);
+        }
+    }
+}
+
+// Reads a name as scanf does with "kiv_%d": what follows the number does not matter.
+std::optional<int32_t> report_number(const char* name) {
+    constexpr size_t prefix_size = sizeof paths::report_prefix - 1;
+    if (strncmp(name, paths::report_prefix, prefix_size) != 0) return std::nullopt;
+    char* end = nullptr;
+    const long number = strtol(name + prefix_size, &end, 10);
+    if (end == name + prefix_size) return std::nullopt;
+    return static_cast<int32_t>(number);
+}
+
+struct directory_state {
+    uint64_t total_size = 0;
+    int32_t highest = 0;
+    int32_t lowest = INT32_MAX;
+    bool any_report = false;
+};
+
+bool scan_output_dir(directory_state& state) {
+    const unique_dir directory(opendir(paths::output_dir));
+    if (!directory) {
+        (void)log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
+        return false;
+    }
+    for_each_entry(directory.get(), [&state](const char* name) {
+        const entry_path path(name);
+        struct stat status = {};
+        if (lstat(path.text, &status) != 0) {
+            __android_log_print(ANDROID_LOG_WARN, tag, "Failed to stat %s: %s", path.text,
+                                strerror(errno));
+            return;
+        }
+        state.total_size += static_cast<uint64_t>(status.st_size);
+        const std::optional<int32_t> number = report_number(name);
+        if (!number) {
+            __android_log_print(ANDROID_LOG_WARN, tag, "Bad file in our %s directory: %s",
+                                paths::output_dir, name);
+            return;
+        }
+        state.any_report = true;
+        if (*number > state.highest) state.highest = *number;
+        if (*number < state.lowest) state.lowest = *number;
+    });
+    return true;
+}
+
+bool is_free_space_enough() {
+    struct statfs status = {};
+    if (statfs(paths::output_dir, &status) != 0) {
+        (void)log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
+        return false;
+    }
+    const uint64_t needed = 2 * (get_limits().max_report_size + compaction_overhead);
+    const uint64_t available = static_cast<uint64_t>(status.f_bsize) * status.f_bavail;
+    return needed <= available && (status.f_files == 0 || status.f_ffree >= min_free_inodes);
+}
+
+// Wraps in 32 bits when the limits are the wrong way round: then only free space counts.
+uint32_t size_budget() { return get_limits().max_output_dir_size - get_limits().max_report_size; }
+
+void log_deleted(const char* log_tag, const char* path) {
+    __android_log_print(ANDROID_LOG_INFO, log_tag, "Deleting %s from output directory", path);
+}
+
+void delete_all_entries() {
+    const unique_dir directory(opendir(paths::output_dir));
+    if (!directory) return;
+    for_each_entry(directory.get(), [](const char* name) {
+        const entry_path path(name);
+        if (unlink(path.text) == 0) log_deleted(remove_tag, path.text);
+    });
+}
+
+}  // namespace
+
+report_path::report_path(int64_t number) {
+    snprintf(text, sizeof text, "%s%s%lld", paths::output_dir, paths::report_prefix,
+             static_cast<long long>(number));
+}
+
+int32_t prune_dir() {
+    for (;;) {
+        directory_state state;
+        if (!scan_output_dir(state)) return -1;
+        if (is_free_space_enough() && size_budget() > state.total_size) return state.highest;
+        if (!state.any_report) {
+            return log_and_raise(tag, "Failed to prune files from output directory");
+        }
+        const report_path oldest(state.lowest);
+        if (unlink(oldest.text) != 0) return -1;
+        log_deleted(tag, oldest.text);
+    }
+}
+
+int64_t next_report_number(int32_t highest) {
+    if (highest < INT32_MAX) return int64_t{highest} + 1;
+    // Numbers have run out: the lowest one that nothing is kept under.
+    int64_t number = 1;
+    while (access(report_path(number).text, F_OK) == 0) ++number;
+    return number;
+}
+
+void delete_reports(int32_t number) {
+    if (number == 0) return delete_all_entries();
+    const report_path path(number);
+    if (unlink(path.text) == 0) return log_deleted(remove_tag, path.text);
+    __android_log_print(ANDROID_LOG_WARN, remove_tag, "Failed to delete %s : %s", path.text,
+                        strerror(errno));
+}
+
+void check_disabled() {
+    if (access(paths::disable_marker, F_OK) != 0) return;
+    __android_log_print(ANDROID_LOG_ERROR, remove_tag, "KIV will disable itself.");
+    wait_for_stop();
+}
+
+}  // namespace kivd

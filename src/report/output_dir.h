@@ -1,0 +1,29 @@
+// The directory output/: finished reports under their numbers, kept within two limits, their own
+// size budget and the free space of the file system. Collectors take reports away at any moment;
+// every change is one rename or unlink and every pass scans afresh.
+#pragma once
+
+#include <cstdint>
+
+namespace kivd {
+
+// Deletes the oldest reports until another one fits. Gives the highest report number left, 0 when
+// there is none, or -1 when room cannot be made; what stood in the way has mostly been logged.
+[[nodiscard]] int32_t prune_dir();
+
+// The path of the report with that number, NUL-terminated.
+struct report_path {
+    explicit report_path(int64_t number);
+    char text[64];
+};
+
+// The number of the report that follows the highest one.
+[[nodiscard]] int64_t next_report_number(int32_t highest);
+
+// Deletes the report with that number, or with 0 every file but the configuration request.
+void delete_reports(int32_t number);
+
+// When the disable marker exists: says so and waits until a stop is requested.
+void check_disabled();
+
+}  // namespace kivd

@@ -1,0 +1,105 @@
+#include "report/report_generation.h"
+
+#include <sys/types.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "daemon/error/child_process.h"
+#include "daemon/error/log_and_raise.h"
+#include "diag/gzip_file.h"
+#include "platform/android_log.h"
+#include "report/header_sources.h"
+#include "report/output_dir.h"
+#include "report/state_file.h"
+#include "store/counter_store.h"
+#include "store/event_store.h"
+#include "store/static_store.h"
+#include "util/clock.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-compactor";
+constexpr size_t buffer_size = 65536;
+
+constinit pid_t compactor_pid = -1;
+constinit gzip_level compression = gzip_level::best;
+
+// Moves what has been collected into the file that the compactor takes.
+int flush_stores() {
+    if (events_flush() != 0) return log_and_raise(tag, "Failed to flush events");
+
+    char buffer[buffer_size];  // outlives the stream
+    const unique_file file(fopen(paths::flushed_data, "ae"));
+    if (!file) {
+        return log_and_raise(tag, "Failed to open flushed data for writing: %s", strerror(errno));
+    }
+    setvbuf(file.get(), buffer, _IOFBF, sizeof buffer);
+    const int64_t flush_time = now_ms();
+    counters_write_report(file.get(), get_last_flush());
+    sdata_write_report(file.get(), get_last_flush());
+    set_last_flush(flush_time);
+    return 0;
+}
+
+void start_compactor() {
+    const pid_t pid = fork_child();
+    if (pid < 0) {
+        (void)log_and_raise(tag, "Failed to fork compactor thread.");
+        return;
+    }
+    if (pid > 0) {
+        compactor_pid = pid;
+        return;
+    }
+    if (compact_report() != 0) _exit(1);
+    __android_log_print(ANDROID_LOG_INFO, tag, "Compactor all done.");
+    _exit(0);
+}
+
+}  // namespace
+
+int generate_report() {
+    if (!has_data_to_report()) return -1;
+    __android_log_print(ANDROID_LOG_INFO, tag, "Generating Report...");
+    wait_for_compactor();
+    if (flush_stores() != 0) return -1;
+    start_compactor();
+    return 0;
+}
+
+bool has_data_to_report() {
+    return has_header_info() || counters_pending(get_last_flush()) ||
+           sdata_pending(get_last_flush()) || events_pending();
+}
+
+int compact_report() {
+    const int32_t highest = prune_dir();
+    if (highest < 0) return log_and_raise(tag, "Corrupt output directory - will not do anything.");
+    if (fu_gzip_file(paths::flushed_data, paths::compacted_data, compression) == 0) {
+        return log_and_raise(tag, "Failed to compact file");
+    }
+    const report_path report(next_report_number(highest));
+    if (rename(paths::compacted_data, report.text) != 0) {
+        return log_and_raise(tag, "Failed to rename output file: %s", strerror(errno));
+    }
+    (void)unlink(paths::flushed_data);
+    return 0;
+}
+
+void wait_for_compactor() {
+    if (compactor_pid < 0) return;
+    wait_for_child(compactor_pid);
+    compactor_pid = -1;
+}
+
+void set_output_compression(bool enabled) {
+    compression = enabled ? gzip_level::best : gzip_level::stored;
+}
+
+}  // namespace kivd

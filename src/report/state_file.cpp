@@ -1,0 +1,214 @@
+#include "report/state_file.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <string_view>
+
+#include "config/limits.h"
+#include "daemon/error/daemon_error.h"
+#include "daemon/error/log_and_raise.h"
+#include "util/clock.h"
+#include "util/file_io.h"
+#include "util/numbers.h"
+#include "util/paths.h"
+#include "util/text_scan.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-util";
+constexpr size_t line_size = 256;
+
+constinit int64_t last_flush = 0;
+constinit bool data_collection = false;
+constinit config_checksum checksum_in_force = {};
+
+// A digit that is none counts as 0.
+uint8_t value_of_hex_digit(char digit) {
+    if (digit >= '0' && digit <= '9') return static_cast<uint8_t>(digit - '0');
+    if (digit >= 'a' && digit <= 'f') return static_cast<uint8_t>(digit - 'a' + 10);
+    return 0;
+}
+
+void read_checksum(const char* text) {
+    const std::string_view digits = scan_word(text, 59);
+    config_checksum checksum;
+    if (digits.size() != 2 * checksum.size()) return;
+    for (size_t i = 0; i < checksum.size(); ++i) {
+        checksum[i] = static_cast<uint8_t>(value_of_hex_digit(digits[2 * i]) << 4U |
+                                           value_of_hex_digit(digits[2 * i + 1]));
+    }
+    set_config_checksum(checksum);
+    get_header_record().config_checksum.set(digits);
+}
+
+void write_checksum(FILE* file) { fputs(get_config_checksum_text().get(), file); }
+
+void read_last_flush(const char* text) {
+    const auto time_ms = scan_number(text);
+    if (!time_ms) return;
+    set_last_flush(*time_ms);
+    set_test_clock(*time_ms / 1000 + 1000);
+}
+
+void write_last_flush(FILE* file) {
+    fprintf(file, "%lld", static_cast<long long>(get_last_flush()));
+}
+
+void read_shutdown_time(const char* text) {
+    if (const auto time_ms = scan_number(text)) set_test_clock(*time_ms / 1000);
+}
+
+void write_shutdown_time(FILE* file) { fprintf(file, "%lld", static_cast<long long>(now_ms())); }
+
+template <auto field>
+void read_text(const char* text) {
+    auto& value = get_header_record().*field;
+    if (const std::string_view word = scan_word(text, value.capacity); !word.empty()) {
+        value.set(word);
+    }
+}
+
+template <auto field>
+void write_text(FILE* file) {
+    fputs((get_header_record().*field).get(), file);
+}
+
+// The file has these unsigned values in signed form.
+template <auto field>
+void read_limit(const char* text) {
+    if (const auto number = scan_number(text)) {
+        get_limits().*field = static_cast<uint32_t>(saturate_int32(*number));
+    }
+}
+
+template <auto field>
+void write_limit(FILE* file) {
+    fprintf(file, "%d", static_cast<int32_t>(get_limits().*field));
+}
+
+void read_data_collection(const char* text) {
+    if (const auto digit = scan_number(text, 1)) set_data_collection(*digit != 0);
+}
+
+void write_data_collection(FILE* file) { fputs(is_data_collection_enabled() ? "1" : "0", file); }
+
+void read_error_nr(const char* text) {
+    if (const auto number = scan_number(text)) set_error_nr(saturate_int32(*number));
+}
+
+void write_error_nr(FILE* file) { fprintf(file, "%d", get_error_nr()); }
+
+void read_error_time(const char* text) {
+    if (const auto number = scan_number(text)) set_error_time(saturate_int32(*number));
+}
+
+void write_error_time(FILE* file) { fprintf(file, "%d", saturate_int32(get_error_time())); }
+
+void read_group_id(const char* text) {
+    const std::string_view id = scan_word(text, group_id::capacity);
+    if (!id.empty()) add_group_id(get_header_record().groups, id);
+}
+
+// One row for each line but those of the group ids, in the order in which they are written.
+struct state_value {
+    std::string_view key;
+    void (*read)(const char* text);  // leaves the value as it is when `text` holds none
+    void (*write)(FILE* file);
+};
+// clang-format off
+constexpr state_value state_values[] = {
+    {"config-checksum:",     read_checksum,        write_checksum},
+    {"last-flush:",          read_last_flush,      write_last_flush},
+    {"shutdown-time:",       read_shutdown_time,   write_shutdown_time},
+    {"device_id:",           read_text<&header_record::device_id>,        write_text<&header_record::device_id>},
+    {"report-max-size:",     read_limit<&limits::max_report_size>,        write_limit<&limits::max_report_size>},
+    {"output-dir-max-size:", read_limit<&limits::max_output_dir_size>,    write_limit<&limits::max_output_dir_size>},
+    {"product:",             read_text<&header_record::product_id>,       write_text<&header_record::product_id>},
+    {"sw_version:",          read_text<&header_record::software_version>, write_text<&header_record::software_version>},
+    {"variant:",             read_text<&header_record::software_variant>, write_text<&header_record::software_variant>},
+    {"build_type:",          read_text<&header_record::build_type>,       write_text<&header_record::build_type>},
+    {"cdf_id:",              read_text<&header_record::cdf_id>,           write_text<&header_record::cdf_id>},
+    {"serial_num:",          read_text<&header_record::serial_number>,    write_text<&header_record::serial_number>},
+    {"device_imei:",         read_text<&header_record::device_imei>,      write_text<&header_record::device_imei>},
+    {"expire-counters:",     read_limit<&limits::expire_counters_age>,    write_limit<&limits::expire_counters_age>},
+    {"expire-sdata:",        read_limit<&limits::expire_sdata_age>,       write_limit<&limits::expire_sdata_age>},
+    {"data-collection:",     read_data_collection, write_data_collection},
+    {"error_nr:",            read_error_nr,        write_error_nr},
+    {"error_time:",          read_error_time,      write_error_time},
+};
+// clang-format on
+constexpr std::string_view group_id_key = "group_id:";
+
+void read_line(const char* line) {
+    for (const state_value& value : state_values) {
+        if (const char* const text = scan_key(line, value.key)) return value.read(text);
+    }
+    if (const char* const text = scan_key(line, group_id_key)) read_group_id(text);
+}
+
+void write_lines(FILE* file) {
+    for (const state_value& value : state_values) {
+        fprintf(file, "%s ", value.key.data());
+        value.write(file);
+        fputc('\n', file);
+    }
+    const group_id_list& groups = get_header_record().groups;
+    for (size_t i = 0; i < groups.count; ++i) {
+        fprintf(file, "%s %s\n", group_id_key.data(), groups.ids[i].get());
+    }
+}
+
+}  // namespace
+
+void config_load() {
+    const unique_file file = open_to_read(paths::state);
+    if (!file) {
+        if (errno == ENOENT) return;
+        (void)log_and_raise(tag, "Failed to open configuration file %s: %s", paths::state,
+                            strerror(errno));
+        return;
+    }
+    char line[line_size];
+    while (fgets(line, sizeof line, file.get()) != nullptr) read_line(line);
+}
+
+void config_save() {
+    unique_file file(fopen(paths::state_new, "we"));
+    if (!file) {
+        (void)log_and_raise(tag, "Failed to create new configuration file: %s", strerror(errno));
+        return;
+    }
+    write_lines(file.get());
+    file.reset();  // a line that got lost only leaves its value at the default
+    if (rename(paths::state_new, paths::state) != 0) {
+        (void)log_and_raise(tag, "Failed to rename configuration file: %s", strerror(errno));
+    }
+}
+
+int64_t get_last_flush() { return last_flush; }
+
+void set_last_flush(int64_t time_ms) { last_flush = time_ms; }
+
+bool is_data_collection_enabled() { return data_collection; }
+
+void set_data_collection(bool enabled) { data_collection = enabled; }
+
+config_checksum get_config_checksum() { return checksum_in_force; }
+
+void set_config_checksum(const config_checksum& checksum) { checksum_in_force = checksum; }
+
+limited_text<40> get_config_checksum_text() {
+    constexpr char digits[] = "0123456789abcdef";
+    limited_text<40> text;
+    char* out = text.data();
+    for (const uint8_t byte : checksum_in_force) {
+        *out++ = digits[byte >> 4U];
+        *out++ = digits[byte & 0xFU];
+    }
+    return text;
+}
+
+}  // namespace kivd

@@ -1,0 +1,35 @@
+// private/kivd.state: the values that are remembered across restarts and kept nowhere else. Three of
+// them live here; the others belong to the header record, the limits and the error facility.
+#pragma once
+
+#include <array>
+#include <cstdint>
+
+#include "report/header_record.h"
+
+namespace kivd {
+
+// SHA-1 of the configuration package in force; all zero before any arrived.
+using config_checksum = std::array<uint8_t, 20>;
+
+// Reads the file into the values that it has lines for. A missing file is fine; another failure to
+// open it has been logged and raised.
+void config_load();
+
+// Replaces the file. Failures have been logged and raised; the old file is then still there.
+void config_save();
+
+// The time of the last report flush, in ms: what changed then or later belongs to the next report.
+[[nodiscard]] int64_t get_last_flush();
+void set_last_flush(int64_t time_ms);
+
+// While data collection is off, probe data is ignored and no report is made on request.
+[[nodiscard]] bool is_data_collection_enabled();
+void set_data_collection(bool enabled);
+
+[[nodiscard]] config_checksum get_config_checksum();
+void set_config_checksum(const config_checksum& checksum);
+// The same as 40 lowercase hexadecimal digits.
+[[nodiscard]] limited_text<40> get_config_checksum_text();
+
+}  // namespace kivd

@@ -1,0 +1,127 @@
+#include "store/counter_store.h"
+
+#include <cerrno>
+#include <cstring>
+
+#include "config/limits.h"
+#include "daemon/error/daemon_error.h"
+#include "daemon/error/log_and_raise.h"
+#include "report/record_file.h"
+#include "report/record_format.h"
+#include "store/list_file.h"
+#include "store/sorted_list.h"
+#include "util/clock.h"
+#include "util/numbers.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-counters";
+constexpr size_t report_record_size = 346;
+
+// One block of malloc with the two texts behind it.
+struct counter_entry {
+    probe_key key;
+    int64_t from_timestamp;  // created, in ms
+    int64_t to_timestamp;    // last set or incremented, in ms
+    int64_t value;
+};
+
+constinit sorted_list* clist_p = nullptr;
+constinit bool counters_dirty = false;
+
+void* make_entry(const probe_key& key, int64_t from, int64_t to, int64_t value) {
+    void* const block = new_probe_element(sizeof(counter_entry), key);
+    if (block == nullptr) return nullptr;
+    auto& counter = *static_cast<counter_entry*>(block);
+    counter.from_timestamp = from;
+    counter.to_timestamp = to;
+    counter.value = value;
+    return block;
+}
+
+void* parse_record(const char* record, const char* terminator, void* /*context*/) {
+    record_fields fields;
+    if (!split_record(record, terminator, fields)) {
+        (void)log_and_raise(tag, "Failed to parse counter line.");
+        return nullptr;
+    }
+    return make_entry({fields[0], fields[1]}, parse_int64(fields[2]), parse_int64(fields[3]),
+                      parse_int64(fields[4]));
+}
+
+int write_record(FILE* file, const void* element, void* context) {
+    const auto& counter = *static_cast<const counter_entry*>(element);
+    const int64_t cutoff_ms = *static_cast<const int64_t*>(context);
+    if (counter.to_timestamp <= cutoff_ms) return 1;
+
+    record_writer writer(file);
+    writer.text(counter.key.package);
+    writer.text(counter.key.name);
+    writer.number(counter.from_timestamp);
+    writer.number(counter.to_timestamp);
+    writer.number(counter.value);
+    if (writer.finish()) return 1;
+    (void)log_and_raise(tag, "Failed to write to counters file: %s", strerror(errno));
+    return 0;
+}
+
+}  // namespace
+
+void counters_init() {
+    clist_p = list_create(256, 128, compare_probes, nullptr);
+    if (clist_p == nullptr) fatal_error("OOM, while creating clist_p");
+    counters_dirty = false;
+    (void)list_load(*clist_p, paths::counters, parse_record, nullptr);
+}
+
+void counters_update(const char* package, const char* name, int32_t value, counter_mode mode) {
+    const probe_key key = {package, name};
+    const int64_t now = now_ms();
+    if (void* const found = list_find(*clist_p, &key)) {
+        auto& counter = *static_cast<counter_entry*>(found);
+        const auto base = mode == counter_mode::increment ? static_cast<uint64_t>(counter.value) : 0;
+        counter.value = static_cast<int64_t>(base + static_cast<uint64_t>(int64_t{value}));
+        counter.to_timestamp = now;
+        counters_dirty = true;
+        return;
+    }
+    void* entry = make_entry(key, now, now, value);
+    if (entry == nullptr) return;
+    if (list_add(*clist_p, entry) == 0) {
+        (void)log_and_raise(tag, "Failed to add new counter.");
+        return;
+    }
+    counters_dirty = true;
+}
+
+void counters_save() {
+    if (!counters_dirty) return;
+    int64_t cutoff_ms = expiry_cutoff_ms(get_limits().expire_counters_age);
+    if (list_save(*clist_p, paths::counters, write_record, &cutoff_ms) != 0) counters_dirty = false;
+}
+
+void counters_write_report(FILE* file, int64_t since_ms) {
+    list_foreach<counter_entry>(*clist_p, [=](const counter_entry& counter) {
+        if (counter.to_timestamp < since_ms) return;
+        uint8_t record[report_record_size];
+        const size_t size =
+            pack_counter_record(record, counter.key.package, counter.key.name,
+                                counter.from_timestamp, counter.to_timestamp, counter.value);
+        append_record(file, {record, size}, tag);
+    });
+    finish_records(file, tag);
+}
+
+bool counters_pending(int64_t since_ms) {
+    for (uint32_t i = 0; i < clist_p->count; ++i) {
+        const auto& counter = *static_cast<const counter_entry*>(clist_p->elements[i]);
+        if (counter.to_timestamp >= since_ms) return true;
+    }
+    return false;
+}
+
+void counters_free() { list_destroy(clist_p); }
+
+}  // namespace kivd

@@ -1,0 +1,94 @@
+#include "store/event_store.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "config/limits.h"
+#include "daemon/error/log_and_raise.h"
+#include "report/header_record.h"
+#include "report/record_format.h"
+#include "util/clock.h"
+#include "util/file_io.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-events";
+
+// Not a unique_fd: the descriptor stays open until the process ends, after all else is released.
+constinit int events_fd = -1;
+constinit uint64_t events_size = 0;
+
+// The file is only ever appended to, so this is its size.
+void measure_size() {
+    const off_t size = lseek(events_fd, 0, SEEK_END);
+    if (size >= 0) events_size = static_cast<uint64_t>(size);
+}
+
+// A report that began without its header could not be read, so such a file is not kept.
+void start_file() {
+    if (write_report_header(events_fd) == 0) {
+        measure_size();
+        return;
+    }
+    (void)close(events_fd);
+    events_fd = -1;
+    (void)unlink(paths::events);
+}
+
+void append_event(const char* package, const char* name, std::span<const char> payload) {
+    static constinit std::array<uint8_t, 356> head = {};
+    const size_t head_size = pack_event_record(head, package, name, now_ms(), payload.size());
+    if (head_size == 0) {
+        (void)log_and_raise(tag, "Failed to serialize header.");
+        return;
+    }
+    std::array pieces = {iovec{head.data(), head_size},
+                         iovec{const_cast<char*>(payload.data()), payload.size()}};
+    const ssize_t written = write_all(events_fd, std::span(pieces).first(payload.empty() ? 1 : 2));
+    if (written >= 0) {
+        events_size += static_cast<uint64_t>(written);
+        return;
+    }
+    (void)log_and_raise(tag, "Failed to write event %s::%s with %d bytes payload. Error: %s",
+                        package, name, static_cast<int>(payload.size()), strerror(errno));
+    measure_size();
+}
+
+}  // namespace
+
+void events_open() {
+    if (events_fd >= 0) return;
+    events_fd = open(paths::events, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0700);
+    if (events_fd < 0) {
+        (void)log_and_raise(tag, "Failed to open partial event file: %s", strerror(errno));
+        return;
+    }
+    measure_size();
+    if (events_size == 0) start_file();
+}
+
+event_file events_add(const char* package, const char* name, std::span<const char> payload) {
+    events_open();
+    if (events_fd < 0) return event_file::open;
+    append_event(package, name, payload);
+    return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
+}
+
+int events_flush() {
+    events_open();
+    if (events_fd >= 0) (void)close(events_fd);
+    events_fd = -1;
+    return rename(paths::events, paths::flushed_data);
+}
+
+bool events_pending() { return access(paths::events, F_OK) == 0; }
+
+}  // namespace kivd

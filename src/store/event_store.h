@@ -1,0 +1,31 @@
+// Events are not kept in memory: each accepted one is appended to private/events, a record file
+// that begins with the report header of the moment at which it was started.
+#pragma once
+
+#include <cstdint>
+#include <span>
+
+namespace kivd {
+
+// What became of the event file.
+enum class event_file : bool {
+    open,
+    full,  // it has reached the report size limit: a report is due
+};
+
+// Stores one event. Failures have been logged and raised; the event is then lost.
+[[nodiscard]] event_file events_add(const char* package, const char* name,
+                                    std::span<const char> payload);
+
+// Makes sure that private/events is open and begins with a header. Failures have been logged and
+// raised.
+void events_open();
+
+// Moves the event file, which is made if there is none, to private/flushed_data. 0, or -1 with
+// errno set.
+[[nodiscard]] int events_flush();
+
+// Whether there is an event file.
+[[nodiscard]] bool events_pending();
+
+}  // namespace kivd

@@ -1,0 +1,3 @@
+add_executable(kivctl kivctl.cpp)
+target_compile_definitions(kivctl PRIVATE KIV_DEFAULT_DIRECTORY="${KIV_DEFAULT_DIRECTORY}")
+target_link_libraries(kivctl PRIVATE kiv CLI11::CLI11 kiv_warnings)

@@ -1,0 +1,354 @@
+// kivctl: talks to a running kivd from the command line.
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "kiv.h"
+
+namespace {
+
+enum exit_status : int {
+    status_done = 0,
+    status_refused = 1,  // or the data is bad
+    status_usage = 2,
+    status_unreachable = 3,  // or not in time
+};
+
+// A command that couldn't be carried out, in one sentence.
+struct failure : std::runtime_error {
+    using std::runtime_error::runtime_error;
+};
+
+// What the command line gave; each command uses a few.
+struct given {
+    std::string package;
+    std::string name;
+    std::string value;
+    std::string payload;
+    std::string file;
+    std::string amount = "1";
+    std::string state;
+    std::string number;
+    std::string id;
+    std::string old_id;
+};
+
+struct argument {
+    const char* name;  // an option when it starts with dashes
+    std::string given::*target;
+    const char* description;
+    bool is_required;
+    std::string (*check)(const std::string&);  // a complaint, empty when all is well; or null
+};
+
+struct command {
+    const char* group;  // null for none
+    const char* name;
+    const char* description;
+    std::vector<argument> arguments;
+    int (*run)(kiv_handle*, const given&);  // gives what libkiv gives
+};
+
+// How results of libkiv are told; {base} and {timeout} stand for the options.
+struct explanation {
+    int error;
+    exit_status status;
+    const char* text;
+};
+
+constexpr char no_daemon[] =
+    "no daemon listens in {base}; check that kivd runs and that --base is the directory it was "
+    "started with";
+
+constexpr explanation explanations[] = {
+    {ENOENT, status_unreachable, no_daemon},
+    {ECONNREFUSED, status_unreachable, no_daemon},
+    {EACCES, status_unreachable,
+     "no permission to reach the daemon in {base}; check the modes of that directory and of the "
+     "sockets in it"},
+    {ETIMEDOUT, status_unreachable,
+     "the daemon in {base} has not answered within {timeout} ms; it may be busy or stopped, and "
+     "--timeout lets it take longer"},
+    {EAGAIN, status_unreachable,
+     "the queue of the daemon in {base} stayed full for {timeout} ms; it may be busy or stopped, "
+     "and --timeout lets it take longer"},
+    {ECONNRESET, status_unreachable, "the daemon in {base} ended before it answered"},
+    {EPROTO, status_refused, "the daemon in {base} gave an answer that makes no sense"},
+    {EPERM, status_refused,
+     "the daemon refused the request; it takes it from its own user, from root and from members "
+     "of the group kiv_private"},
+    {EINVAL, status_refused,
+     "a package, name or group id is empty or holds a blank, or a value is empty"},
+    {EMSGSIZE, status_refused,
+     "the request is too long; a package and a name may have 256 bytes together, a payload 30720, "
+     "and the whole request 31176"},
+    {ERANGE, status_refused,
+     "the number is beyond what a counter holds, -2147483648 to 2147483647"},
+    {ENAMETOOLONG, status_refused, "the path {base} is too long for that of a socket"},
+};
+
+// `text` as a number, cut to the range of the type; false when it isn't one.
+bool parse_number(const std::string& text, int64_t& number) {
+    const char* end = text.data() + text.size();
+    const auto parsed = std::from_chars(text.data(), end, number);
+    if (parsed.ec == std::errc::result_out_of_range) {
+        using range = std::numeric_limits<int64_t>;
+        number = text.front() == '-' ? range::min() : range::max();
+    }
+    return parsed.ec != std::errc::invalid_argument && parsed.ptr == end;
+}
+
+std::string check_number(const std::string& text) {
+    int64_t number = 0;
+    return parse_number(text, number) ? "" : "\"" + text + "\" is not a whole number";
+}
+
+int64_t to_number(const std::string& checked_text) {
+    int64_t number = 0;
+    (void)parse_number(checked_text, number);
+    return number;
+}
+
+// The daemon reads anything that isn't a number as 0, and removes every report then.
+std::string check_report_number(const std::string& text) {
+    if (text == "all") return "";
+    int64_t number = 0;
+    const bool is_number = parse_number(text, number);
+    if (is_number && number >= 1 && number <= std::numeric_limits<int32_t>::max()) return "";
+    return "\"" + text + "\" is neither a report number, 1 or more, nor \"all\"";
+}
+
+std::string check_state(const std::string& text) {
+    return text == "on" || text == "off" ? "" : "\"" + text + "\" is neither \"on\" nor \"off\"";
+}
+
+struct file_closer {
+    void operator()(FILE* file) const noexcept { (void)fclose(file); }
+};
+
+// The content of the file, or of standard input for "-".
+std::string read_payload(const std::string& path) {
+    std::unique_ptr<FILE, file_closer> opened;
+    FILE* file = stdin;
+    if (path != "-") {
+        opened.reset(fopen(path.c_str(), "re"));
+        file = opened.get();
+    }
+    if (file == nullptr) throw failure("cannot open " + path + ": " + strerror(errno));
+    std::string payload(KIV_PAYLOAD_MAX + 1, '\0');  // one more shows that there is more
+    payload.resize(fread(payload.data(), 1, payload.size(), file));
+    if (ferror(file) != 0) throw failure("cannot read " + path + ": " + strerror(errno));
+    if (payload.size() > KIV_PAYLOAD_MAX) {
+        throw failure(path + " is too large for a payload, which has at most " +
+                      std::to_string(KIV_PAYLOAD_MAX) + " bytes");
+    }
+    return payload;
+}
+
+void print_line(const char* text) {
+    if (puts(text) < 0 || fflush(stdout) != 0) {
+        throw failure(std::string("cannot write to standard output: ") + strerror(errno));
+    }
+}
+
+int add_event(kiv_handle* daemon, const given& g) {
+    const std::string payload = g.file.empty() ? g.payload : read_payload(g.file);
+    return kiv_add_event(daemon, g.package.c_str(), g.name.c_str(), payload.data(),
+                         payload.size());
+}
+
+int show_alive(kiv_handle* daemon, const given&) {
+    const int result = kiv_is_alive(daemon);
+    if (result == 0) print_line("alive");
+    return result;
+}
+
+int show_device_id(kiv_handle* daemon, const given&) {
+    char device_id[KIV_DEVICE_ID_MAX + 1];
+    const int result = kiv_get_device_id(daemon, device_id);
+    if (result == 0) print_line(device_id);
+    return result;
+}
+
+int remove_report(kiv_handle* daemon, const given& g) {
+    const int64_t number = g.number == "all" ? 0 : to_number(g.number);
+    return kiv_remove_reports(daemon, static_cast<int32_t>(number));
+}
+
+// clang-format off
+const argument package = {"PACKAGE", &given::package, "First half of the probe's id", true, nullptr};
+const argument name = {"NAME", &given::name, "Second half of the probe's id", true, nullptr};
+const argument group_id = {"ID", &given::id, "A group id", true, nullptr};
+
+constexpr struct {
+    const char* name;
+    const char* description;
+} groups[] = {
+    {"counter", "Set a counter or add to it"},
+    {"group",   "Change the group ids that every report carries"},
+};
+
+const command commands[] = {
+    {nullptr, "event", "Add an event; its payload is empty unless given", {package, name,
+         {"PAYLOAD", &given::payload, "The payload; write -- before one that starts with a dash",
+          false, nullptr},
+         {"--file", &given::file, "Take the payload from a file, or with - from standard input",
+          false, nullptr}},
+     add_event},
+    {"counter", "set", "Give a counter a value", {package, name,
+         {"VALUE", &given::value, "The new value", true, check_number}},
+     [](kiv_handle* daemon, const given& g) {
+         return kiv_set_counter(daemon, g.package.c_str(), g.name.c_str(), to_number(g.value));
+     }},
+    {"counter", "inc", "Add to a counter", {package, name,
+         {"AMOUNT", &given::amount, "What to add; may be negative", false, check_number}},
+     [](kiv_handle* daemon, const given& g) {
+         return kiv_inc_counter(daemon, g.package.c_str(), g.name.c_str(), to_number(g.amount));
+     }},
+    {nullptr, "static", "Set static data", {package, name,
+         {"VALUE", &given::value, "The new value; may hold blanks", true, nullptr}},
+     [](kiv_handle* daemon, const given& g) {
+         return kiv_set_static_data(daemon, g.package.c_str(), g.name.c_str(), g.value.c_str());
+     }},
+    {nullptr, "alive", "Ask whether the daemon answers", {}, show_alive},
+    {nullptr, "flush", "Make a report now (nothing happens while data collection is off)", {},
+     [](kiv_handle* daemon, const given&) { return kiv_flush(daemon); }},
+    {nullptr, "save", "Save counters and static data now", {},
+     [](kiv_handle* daemon, const given&) { return kiv_save(daemon); }},
+    {nullptr, "device-id", "Print the device id", {}, show_device_id},
+    {nullptr, "collection", "Switch data collection on or off", {
+         {"STATE", &given::state, "on or off", true, check_state}},
+     [](kiv_handle* daemon, const given& g) {
+         return kiv_set_data_collection(daemon, g.state == "on" ? 1 : 0);
+     }},
+    {nullptr, "remove-report", "Remove one report or all of them", {
+         {"NUMBER", &given::number, "The report's number, or all", true, check_report_number}},
+     remove_report},
+    {"group", "add", "Add a group id", {group_id},
+     [](kiv_handle* daemon, const given& g) { return kiv_set_group_id(daemon, g.id.c_str()); }},
+    {"group", "delete", "Delete a group id", {group_id},
+     [](kiv_handle* daemon, const given& g) { return kiv_delete_group_id(daemon, g.id.c_str()); }},
+    {"group", "replace", "Put one group id in the place of another", {
+         {"NEW", &given::id, "The id to put in", true, nullptr},
+         {"OLD", &given::old_id, "The id to take out", true, nullptr}},
+     [](kiv_handle* daemon, const given& g) {
+         return kiv_replace_group_id(daemon, g.id.c_str(), g.old_id.c_str());
+     }},
+};
+// clang-format on
+
+struct options {
+    std::string base = KIV_DEFAULT_DIRECTORY;
+    unsigned timeout_ms = 2000;
+    const command* chosen = nullptr;
+    given arguments;
+};
+
+void add_command(CLI::App& parent, const command& added, options& chosen) {
+    CLI::App* subcommand = parent.add_subcommand(added.name, added.description);
+    subcommand->callback([&added, &chosen] { chosen.chosen = &added; });
+    for (const argument& a : added.arguments) {
+        CLI::Option* option =
+            subcommand->add_option(a.name, chosen.arguments.*a.target, a.description);
+        option->required(a.is_required);
+        option->option_text(a.is_required || *a.name == '-' ? " " : "[optional]");
+        if (a.check != nullptr) {
+            option->check([check = a.check](const std::string& text) { return check(text); });
+        }
+    }
+}
+
+void set_up(CLI::App& app, options& chosen) {
+    app.description("Sends probe data and requests to a running kivd.");
+    app.footer(
+        "Exit status: 0 done, 1 refused or bad data, 2 wrong usage,\n"
+        "             3 daemon not reachable or not in time");
+    app.require_subcommand(1);
+    app.add_option("--base", chosen.base, "The daemon's directory, where its sockets are")
+        ->option_text("DIR [" + chosen.base + "]");
+    app.add_option("--timeout", chosen.timeout_ms,
+                   "How long to wait for the daemon, in milliseconds")
+        ->option_text("MS [" + std::to_string(chosen.timeout_ms) + "]")
+        ->check(CLI::Range(1, 86'400'000));
+    for (const auto& group : groups) {
+        app.add_subcommand(group.name, group.description)->require_subcommand(1);
+    }
+    for (const command& c : commands) {
+        add_command(c.group == nullptr ? app : *app.get_subcommand(c.group), c, chosen);
+    }
+    CLI::App* event = app.get_subcommand("event");
+    event->get_option("--file")->option_text("FILE")->excludes(event->get_option("PAYLOAD"));
+}
+
+std::string replace(std::string text, const std::string& from, const std::string& to) {
+    const size_t position = text.find(from);
+    if (position != std::string::npos) text.replace(position, from.size(), to);
+    return text;
+}
+
+// Tells what went wrong when something did; gives the exit status.
+int conclude(int result, const options& chosen) {
+    if (result == 0) return status_done;
+    const auto* found = std::ranges::find(explanations, -result, &explanation::error);
+    if (found == std::end(explanations)) {
+        fprintf(stderr, "kivctl: cannot talk to the daemon in %s: %s\n", chosen.base.c_str(),
+                strerror(-result));
+        return status_unreachable;
+    }
+    std::string text = replace(found->text, "{timeout}", std::to_string(chosen.timeout_ms));
+    text = replace(text, "{base}", chosen.base);
+    fprintf(stderr, "kivctl: %s\n", text.c_str());
+    return found->status;
+}
+
+struct handle_closer {
+    void operator()(kiv_handle* handle) const noexcept { kiv_destroy(handle); }
+};
+
+int run(const options& chosen) {
+    const std::unique_ptr<kiv_handle, handle_closer> daemon(
+        kiv_create_from_path(chosen.base.c_str()));
+    if (!daemon) return conclude(-errno, chosen);
+    kiv_set_wait(daemon.get(), chosen.timeout_ms);
+    kiv_set_timeout(daemon.get(), chosen.timeout_ms);
+    return conclude(chosen.chosen->run(daemon.get(), chosen.arguments), chosen);
+}
+
+int parse_and_run(int argc, char** argv) {
+    CLI::App app;
+    options chosen;
+    set_up(app, chosen);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::Success& help) {
+        return app.exit(help);
+    } catch (const CLI::ParseError& error) {
+        fprintf(stderr, "kivctl: %s (see kivctl --help)\n", error.what());
+        return status_usage;
+    }
+    return run(chosen);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    try {
+        return parse_and_run(argc, argv);
+    } catch (const std::exception& error) {
+        fprintf(stderr, "kivctl: %s\n", error.what());
+        return status_refused;
+    }
+}

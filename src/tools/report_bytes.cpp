@@ -1,0 +1,99 @@
+#include "tools/report_bytes.h"
+
+#include <cerrno>
+#include <cstring>
+#include <new>
+#include <utility>
+
+namespace kivd {
+namespace {
+constexpr int gzip_only = 16 + MAX_WBITS;
+constexpr Bytef gzip_magic[] = {0x1f, 0x8b};
+constexpr size_t piece_size = 65536;
+
+std::string number(uint64_t value) {
+    return std::to_string(value);
+}
+}  // namespace
+
+report_bytes::report_bytes(const std::string& path) : file_(fopen(path.c_str(), "re")) {
+    if (!file_) {
+        fail(std::string("cannot be opened: ") + strerror(errno));
+        return;
+    }
+    if (!fill()) return;
+    is_gzip_ = inflater_.avail_in >= sizeof gzip_magic &&
+               memcmp(inflater_.next_in, gzip_magic, sizeof gzip_magic) == 0;
+    if (is_gzip_ && inflateInit2(&inflater_, gzip_only) != Z_OK) throw std::bad_alloc();
+    in_member_ = is_gzip_;
+}
+
+report_bytes::~report_bytes() {
+    if (is_gzip_) inflateEnd(&inflater_);
+}
+
+bool report_bytes::fail(std::string problem) {
+    problem_ = std::move(problem);
+    return false;
+}
+
+// Makes sure that there is input; false at the end of the file or with a problem.
+bool report_bytes::fill() {
+    if (inflater_.avail_in > 0) return true;
+    const size_t size = fread(input_.data(), 1, input_.size(), file_.get());
+    if (size == 0 && ferror(file_.get())) {
+        return fail(std::string("cannot be read: ") + strerror(errno));
+    }
+    inflater_.next_in = input_.data();
+    inflater_.avail_in = static_cast<uInt>(size);
+    bytes_read_ += size;
+    return size > 0;
+}
+
+bool report_bytes::start_member() {
+    if (!fill()) return false;  // a good end
+    if (*inflater_.next_in != gzip_magic[0]) {
+        return fail("bytes that are not gzip data follow at byte " + number(file_offset()) +
+                    " of the file");
+    }
+    if (inflateReset(&inflater_) != Z_OK) throw std::bad_alloc();
+    in_member_ = true;
+    return true;
+}
+
+bool report_bytes::inflate_some(std::string& to) {
+    const size_t old_size = to.size();
+    to.resize(old_size + piece_size);
+    inflater_.next_out = reinterpret_cast<Bytef*>(to.data() + old_size);
+    inflater_.avail_out = piece_size;
+    const int result = inflate(&inflater_, Z_NO_FLUSH);
+    to.resize(to.size() - inflater_.avail_out);
+    if (result == Z_STREAM_END) in_member_ = false;
+    if (result == Z_STREAM_END || result == Z_OK || result == Z_BUF_ERROR) return true;
+    if (result == Z_MEM_ERROR) throw std::bad_alloc();
+    return fail("the gzip data is damaged at byte " + number(file_offset()) + " of the file (" +
+                (inflater_.msg ? inflater_.msg : zError(result)) + ")");
+}
+
+bool report_bytes::read_some(std::string& to) {
+    if (!problem_.empty()) return false;
+    if (!is_gzip_) {
+        if (!fill()) return false;
+        to.append(reinterpret_cast<const char*>(inflater_.next_in), inflater_.avail_in);
+        inflater_.avail_in = 0;
+        return true;
+    }
+    const size_t old_size = to.size();
+    while (to.size() == old_size) {
+        if (!in_member_ && !start_member()) return false;
+        if (!fill()) {
+            if (!problem_.empty()) return false;
+            return fail("the gzip data is cut short at byte " + number(bytes_read_) +
+                        " of the file");
+        }
+        if (!inflate_some(to)) return to.size() > old_size;
+    }
+    return true;
+}
+
+}  // namespace kivd

@@ -1,0 +1,34 @@
+#include "util/clock.h"
+
+#include <sys/time.h>
+
+#include <ctime>
+
+namespace kivd {
+namespace {
+
+constinit bool test_mode = false;
+constinit int64_t test_clock_seconds = 1262325600;  // 2010-01-01 06:00:00 UTC
+
+}  // namespace
+
+int64_t now_ms() {
+    if (test_mode) return ++test_clock_seconds * 1000;
+    timeval now = {};
+    gettimeofday(&now, nullptr);
+    return int64_t{now.tv_sec} * 1000 + now.tv_usec / 1000;
+}
+
+void enable_test_mode() { test_mode = true; }
+
+bool is_test_mode() { return test_mode; }
+
+void set_test_clock(int64_t seconds) { test_clock_seconds = seconds; }
+
+int64_t monotonic_ms() {
+    timespec now = {};
+    clock_gettime(CLOCK_MONOTONIC, &now);
+    return int64_t{now.tv_sec} * 1000 + now.tv_nsec / 1000000;
+}
+
+}  // namespace kivd

@@ -1,0 +1,60 @@
+#include "util/file_io.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace kivd {
+
+ssize_t write_all(int fd, const void* bytes, size_t size) {
+    iovec piece = {const_cast<void*>(bytes), size};
+    return write_all(fd, {&piece, 1});
+}
+
+ssize_t write_all(int fd, std::span<iovec> pieces) {
+    size_t total = 0;
+    for (const iovec& piece : pieces) total += piece.iov_len;
+
+    size_t left = total;
+    while (left > 0) {
+        const ssize_t n = writev(fd, pieces.data(), static_cast<int>(pieces.size()));
+        if (n < 0 && errno == EINTR) continue;
+        if (n == 0) errno = ENOSPC;
+        if (n <= 0) return -1;
+        left -= static_cast<size_t>(n);
+        auto written = static_cast<size_t>(n);
+        while (!pieces.empty() && written >= pieces.front().iov_len) {
+            written -= pieces.front().iov_len;
+            pieces = pieces.subspan(1);
+        }
+        if (written > 0) {
+            pieces.front().iov_base = static_cast<char*>(pieces.front().iov_base) + written;
+            pieces.front().iov_len -= written;
+        }
+    }
+    return static_cast<ssize_t>(total);
+}
+
+int64_t get_file_size(FILE* file) {
+    if (fseeko(file, 0, SEEK_END) != 0) return -1;
+    const off_t size = ftello(file);
+    if (size < 0 || fseeko(file, 0, SEEK_SET) != 0) return -1;
+    return size;
+}
+
+unique_file open_to_read(const char* path) {
+    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC));
+    if (!fd.ok()) return nullptr;
+    struct stat status = {};
+    if (fstat(fd.get(), &status) == 0 && S_ISDIR(status.st_mode)) {
+        errno = EISDIR;
+        return nullptr;
+    }
+    unique_file file(fdopen(fd.get(), "r"));
+    if (file) (void)fd.release();
+    return file;
+}
+
+}  // namespace kivd

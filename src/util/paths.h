@@ -1,0 +1,32 @@
+// The names of all files of the working directory, and of those outside it that the daemon reads.
+#pragma once
+
+namespace kivd::paths {
+
+inline constexpr char lock_file[] = "kivd.pid";
+
+inline constexpr char datagram_socket[] = "kiv_cl";
+inline constexpr char sequenced_packet_socket[] = "kiv_co";
+inline constexpr char stream_socket[] = "kiv_co_stream";
+
+inline constexpr char private_dir[] = "private/";
+inline constexpr char output_dir[] = "output/";
+inline constexpr char input_dir[] = "input/";
+
+inline constexpr char events[] = "private/events";
+inline constexpr char counters[] = "private/counters.txt";
+inline constexpr char static_data[] = "private/sdata.txt";
+inline constexpr char state[] = "private/kivd.state";
+inline constexpr char state_new[] = "private/kivd.state_tmp";
+inline constexpr char header_info[] = "private/header_info.conf";
+
+inline constexpr char flushed_data[] = "private/flushed_data";
+inline constexpr char compacted_data[] = "private/flushed_data.compacted";
+
+inline constexpr char report_prefix[] = "kiv_";                   // and a number, in output_dir
+inline constexpr char config_request_name[] = "config_request";  // in output_dir
+inline constexpr char disable_marker[] = "output/kiv_disabled";
+
+inline constexpr char random_uuid[] = "/proc/sys/kernel/random/uuid";
+
+}  // namespace kivd::paths

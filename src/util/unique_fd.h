@@ -1,0 +1,44 @@
+// Owners of what the system hands out: descriptors, streams, directories.
+#pragma once
+
+#include <dirent.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <utility>
+
+namespace kivd {
+
+// The deleter that calls `release`, for std::unique_ptr.
+template <auto release>
+struct releaser {
+    void operator()(auto* object) const noexcept { release(object); }
+};
+
+using unique_file = std::unique_ptr<FILE, releaser<fclose>>;
+using unique_dir = std::unique_ptr<DIR, releaser<closedir>>;
+template <class type>
+using unique_malloc = std::unique_ptr<type, releaser<free>>;
+
+// Owns a descriptor; -1 is none.
+class unique_fd {
+   public:
+    explicit unique_fd(int fd = -1) noexcept : fd_(fd) {}
+    unique_fd(unique_fd&& other) noexcept : fd_(other.release()) {}
+    unique_fd& operator=(unique_fd&& other) noexcept {
+        reset(other.release());
+        return *this;
+    }
+    ~unique_fd() { reset(); }
+
+    [[nodiscard]] int get() const noexcept { return fd_; }
+    [[nodiscard]] bool ok() const noexcept { return fd_ >= 0; }  // not operator bool: 0 is valid
+    [[nodiscard]] int release() noexcept { return std::exchange(fd_, -1); }
+    void reset(int fd = -1) noexcept;  // closes once, not again after EINTR; keeps errno
+
+   private:
+    int fd_;
+};
+
+}  // namespace kivd

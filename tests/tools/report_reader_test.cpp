@@ -1,0 +1,157 @@
+#include "tools/report_reader.h"
+
+#include <filesystem>
+#include <vector>
+
+#include "sample_reports.h"
+
+namespace kivd {
+namespace {
+
+using namespace std::string_literals;
+
+class report_reader : public report_files {};
+
+const std::vector<std::string> sample_records = {
+    records_of(header_text), records_of(event_text("first", 1, "payload")),
+    records_of(event_text("empty")), records_of(counter_text("count", -1, 2)),
+    records_of(static_text("text", std::string(200, 'v')))};
+
+std::string sample() {
+    std::string all;
+    for (const std::string& record : sample_records) all += record;
+    return all;
+}
+
+int records_in(const kiv::Report& report) {
+    return report.has_header() + report.events_size() + report.counters_size() +
+           report.statics_size();
+}
+
+bool says(const report_file& file, const std::string& text) {
+    return file.problem.find(text) != std::string::npos;
+}
+
+TEST_F(report_reader, any_cut_leaves_the_whole_records_before_it) {
+    std::string all;
+    for (int whole = 0; whole < std::ssize(sample_records); ++whole) {
+        const std::string& record = sample_records[static_cast<size_t>(whole)];
+        for (size_t cut = 1; cut <= record.size(); ++cut) {
+            const report_file file = read_report(write("events", all + record.substr(0, cut)));
+            SCOPED_TRACE(std::to_string(all.size() + cut) + " " + file.problem);
+            const bool is_torn = cut < record.size();
+            EXPECT_EQ(records_in(file.report), is_torn ? whole : whole + 1);
+            EXPECT_EQ(!file.problem.empty(), is_torn);
+            EXPECT_EQ(says(file, "stopped at byte " + std::to_string(all.size()) + ": "), is_torn);
+        }
+        all += record;
+    }
+}
+
+TEST_F(report_reader, a_cut_gzip_file_gives_what_it_holds_and_says_so) {
+    const std::string packed = gzip(sample(), 0);  // stored, so that a cut costs only what it cuts
+    int last_count = 0;
+    for (size_t size = 2; size < packed.size(); ++size) {
+        const report_file file = read_report(write("kiv_1", packed.substr(0, size)));
+        SCOPED_TRACE(std::to_string(size) + " " + file.problem);
+        EXPECT_TRUE(
+            says(file, "stopped at byte " + std::to_string(file.data_size) +
+                           " of the decompressed data: the gzip data is cut short at byte " +
+                           std::to_string(size) + " of the file"));
+        EXPECT_GE(records_in(file.report), last_count);
+        last_count = records_in(file.report);
+    }
+    EXPECT_EQ(last_count, 5);  // only the checksum was missing
+}
+
+TEST_F(report_reader, spoilt_bytes_end_the_reading_where_they_start) {
+    const std::string good = sample();
+    const struct {
+        const char* what;
+        std::string bytes;
+        const char* problem;
+    } cases[] = {
+        {"text", "garbage", "no record starts with the byte 0x67"},
+        {"zeros", std::string(9, '\0'), "no record starts with the byte 0x00"},
+        {"unknown field", "\x62\x01x", "no record starts with the byte 0x62"},
+        {"header as a number", "\x08\x01", "no record starts with the byte 0x08"},
+        {"key of two bytes", "\x92\x01\x01x", "no record starts with the byte 0x92"},
+        {"endless length", "\x12\xff\xff\xff\xff\xff\x01", "no valid length"},
+        {"length of 4 GiB", "\x12\xff\xff\xff\xff\x0f" + good, "claims a length of 4294967295"},
+        {"length of 2 GiB", "\x42\xff\xff\xff\xff\x07" + good, "claims a length of 2147483647"},
+        {"length beyond the end",
+         "\x42\xff\xff\x03"
+         "abc",
+         "it has 7 of its 65539 bytes"},
+        {"field beyond its record", "\x12\x03\x0a\x7fp", "cannot be decoded as events"},
+        {"no name, time or payload", "\x12\x03\x0a\x01p", "cannot be decoded as events"},
+    };
+    for (const auto& spoilt : cases) {
+        SCOPED_TRACE(spoilt.what);
+        for (const std::string& bytes : {good + spoilt.bytes, gzip(good + spoilt.bytes)}) {
+            const report_file file = read_report(write("kiv_1", bytes));
+            EXPECT_EQ(records_in(file.report), 5);
+            EXPECT_TRUE(says(file, spoilt.problem)) << file.problem;
+            EXPECT_TRUE(says(file, "stopped at byte " + std::to_string(good.size())))
+                << file.problem;
+        }
+    }
+}
+
+TEST_F(report_reader, what_is_wrong_with_the_gzip_layer_is_told_too) {
+    const std::string good = sample();
+    const std::string packed = gzip(good);
+    std::string wrong_checksum = packed;
+    wrong_checksum[packed.size() - 8] ^= 1;
+    const struct {
+        std::string bytes;
+        const char* problem;
+    } cases[] = {
+        {packed + "garbage", "bytes that are not gzip data follow at byte "},
+        {packed + '\0', "bytes that are not gzip data follow at byte "},
+        {wrong_checksum, "the gzip data is damaged at byte "},
+        {packed + packed.substr(0, 12), "the gzip data is cut short at byte "},
+        // Members end to end are one gzip file, wherever the records are split.
+        {gzip(good.substr(0, 99)) + gzip("") + gzip(good.substr(99)), ""},
+    };
+    for (const auto& file_case : cases) {
+        const report_file file = read_report(write("kiv_1", file_case.bytes));
+        EXPECT_EQ(records_in(file.report), 5);
+        EXPECT_TRUE(says(file, file_case.problem)) << file.problem;
+        EXPECT_EQ(file.problem.empty(), file_case.problem[0] == '\0') << file.problem;
+    }
+}
+
+TEST_F(report_reader, a_file_without_records_is_told) {
+    EXPECT_EQ(read_report(directory / "none").problem,
+              "cannot be opened: No such file or directory");
+    EXPECT_EQ(read_report(directory).problem, "cannot be read: Is a directory");
+    EXPECT_EQ(read_report(write("events", "")).problem, "the file is empty");
+    EXPECT_EQ(read_report(write("kiv_1", gzip(""))).problem, "the gzip data is empty");
+}
+
+TEST_F(report_reader, a_small_file_cannot_stand_for_any_amount_of_memory) {
+    const std::string event = records_of(event_text(""));
+    std::string events;
+    while (events.size() < 1'000'000) events += event;
+    const std::string bomb = write("kiv_1", gzip(events));
+    ASSERT_LT(std::filesystem::file_size(bomb), 5000u);
+
+    // Both sides of the limit for data, then the one for memory, which such events reach earlier.
+    EXPECT_EQ(read_report(bomb, {.data_size = events.size()}).problem, "");
+    const report_file long_one = read_report(bomb, {.data_size = events.size() - 1});
+    EXPECT_TRUE(says(long_one, "holds more than")) << long_one.problem;
+    EXPECT_EQ(long_one.data_size, events.size() - event.size());
+    const report_file large_one = read_report(bomb, {.memory_size = 1'000'000});
+    EXPECT_TRUE(says(large_one, "takes more than 1000000 bytes of memory")) << large_one.problem;
+    EXPECT_LT(large_one.report.SpaceUsedLong(), 2'000'000u);
+
+    // One record with a list that grows twentyfold when it is decoded.
+    std::string groups;
+    while (groups.size() < 2'000'000) groups += "\x6a\0"s;
+    const std::string header = write("kiv_2", gzip("\x0a\x80\x89\x7a" + groups));
+    EXPECT_TRUE(says(read_report(header), "claims a length of 2000000"));
+}
+
+}  // namespace
+}  // namespace kivd
