@@ -1,8 +1,5 @@
 // kivctl: talks to a running kivd from the command line.
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cerrno>
@@ -14,7 +11,6 @@
 #include <memory>
 #include <stdexcept>
 #include <string>
-#include <vector>
 
 #include "kiv.h"
 
@@ -47,18 +43,19 @@ struct given {
 };
 
 struct argument {
-    const char* name;  // an option when it starts with dashes
-    std::string given::*target;
-    const char* description;
-    bool is_required;
-    std::string (*check)(const std::string&);  // a complaint, empty when all is well; or null
+    const char* name = nullptr;  // an option when it starts with dashes
+    std::string given::*target = nullptr;
+    const char* description = nullptr;
+    bool is_required = false;
+    std::string (*check)(const std::string&) =
+        nullptr;  // a complaint, empty when all is well; or null
 };
 
 struct command {
     const char* group;  // null for none
     const char* name;
     const char* description;
-    std::vector<argument> arguments;
+    argument arguments[4];                  // the last ones nameless
     int (*run)(kiv_handle*, const given&);  // gives what libkiv gives
 };
 
@@ -131,6 +128,10 @@ std::string check_report_number(const std::string& text) {
     return "\"" + text + "\" is neither a report number, 1 or more, nor \"all\"";
 }
 
+std::string check_directory(const std::string& text) {
+    return text.empty() ? "the directory has no name" : "";
+}
+
 std::string check_state(const std::string& text) {
     return text == "on" || text == "off" ? "" : "\"" + text + "\" is neither \"on\" nor \"off\"";
 }
@@ -141,18 +142,16 @@ struct file_closer {
 
 // The content of the file, or of standard input for "-".
 std::string read_payload(const std::string& path) {
-    std::unique_ptr<FILE, file_closer> opened;
-    FILE* file = stdin;
-    if (path != "-") {
-        opened.reset(fopen(path.c_str(), "re"));
-        file = opened.get();
-    }
-    if (file == nullptr) throw failure("cannot open " + path + ": " + strerror(errno));
+    const bool is_input = path == "-";
+    const std::string source = is_input ? "standard input" : path;
+    const std::unique_ptr<FILE, file_closer> opened(is_input ? nullptr : fopen(path.c_str(), "re"));
+    FILE* file = is_input ? stdin : opened.get();
+    if (file == nullptr) throw failure("cannot open " + source + ": " + strerror(errno));
     std::string payload(KIV_PAYLOAD_MAX + 1, '\0');  // one more shows that there is more
     payload.resize(fread(payload.data(), 1, payload.size(), file));
-    if (ferror(file) != 0) throw failure("cannot read " + path + ": " + strerror(errno));
+    if (ferror(file) != 0) throw failure("cannot read " + source + ": " + strerror(errno));
     if (payload.size() > KIV_PAYLOAD_MAX) {
-        throw failure(path + " is too large for a payload, which has at most " +
+        throw failure(source + " is too large for a payload, which has at most " +
                       std::to_string(KIV_PAYLOAD_MAX) + " bytes");
     }
     return payload;
@@ -166,8 +165,7 @@ void print_line(const char* text) {
 
 int add_event(kiv_handle* daemon, const given& g) {
     const std::string payload = g.file.empty() ? g.payload : read_payload(g.file);
-    return kiv_add_event(daemon, g.package.c_str(), g.name.c_str(), payload.data(),
-                         payload.size());
+    return kiv_add_event(daemon, g.package.c_str(), g.name.c_str(), payload.data(), payload.size());
 }
 
 int show_alive(kiv_handle* daemon, const given&) {
@@ -189,9 +187,9 @@ int remove_report(kiv_handle* daemon, const given& g) {
 }
 
 // clang-format off
-const argument package = {"PACKAGE", &given::package, "First half of the probe's id", true, nullptr};
-const argument name = {"NAME", &given::name, "Second half of the probe's id", true, nullptr};
-const argument group_id = {"ID", &given::id, "A group id", true, nullptr};
+constexpr argument package = {"PACKAGE", &given::package, "First half of the probe's id", true};
+constexpr argument name = {"NAME", &given::name, "Second half of the probe's id", true};
+constexpr argument group_id = {"ID", &given::id, "A group id", true};
 
 constexpr struct {
     const char* name;
@@ -201,12 +199,10 @@ constexpr struct {
     {"group",   "Change the group ids that every report carries"},
 };
 
-const command commands[] = {
+constexpr command commands[] = {
     {nullptr, "event", "Add an event; its payload is empty unless given", {package, name,
-         {"PAYLOAD", &given::payload, "The payload; write -- before one that starts with a dash",
-          false, nullptr},
-         {"--file", &given::file, "Take the payload from a file, or with - from standard input",
-          false, nullptr}},
+         {"PAYLOAD", &given::payload, "The payload; write -- before one that starts with a dash"},
+         {"--file", &given::file, "Take the payload from a file, or with - from standard input"}},
      add_event},
     {"counter", "set", "Give a counter a value", {package, name,
          {"VALUE", &given::value, "The new value", true, check_number}},
@@ -219,7 +215,7 @@ const command commands[] = {
          return kiv_inc_counter(daemon, g.package.c_str(), g.name.c_str(), to_number(g.amount));
      }},
     {nullptr, "static", "Set static data", {package, name,
-         {"VALUE", &given::value, "The new value; may hold blanks", true, nullptr}},
+         {"VALUE", &given::value, "The new value; may hold blanks", true}},
      [](kiv_handle* daemon, const given& g) {
          return kiv_set_static_data(daemon, g.package.c_str(), g.name.c_str(), g.value.c_str());
      }},
@@ -242,8 +238,8 @@ const command commands[] = {
     {"group", "delete", "Delete a group id", {group_id},
      [](kiv_handle* daemon, const given& g) { return kiv_delete_group_id(daemon, g.id.c_str()); }},
     {"group", "replace", "Put one group id in the place of another", {
-         {"NEW", &given::id, "The id to put in", true, nullptr},
-         {"OLD", &given::old_id, "The id to take out", true, nullptr}},
+         {"NEW", &given::id, "The id to put in", true},
+         {"OLD", &given::old_id, "The id to take out", true}},
      [](kiv_handle* daemon, const given& g) {
          return kiv_replace_group_id(daemon, g.id.c_str(), g.old_id.c_str());
      }},
@@ -261,13 +257,12 @@ void add_command(CLI::App& parent, const command& added, options& chosen) {
     CLI::App* subcommand = parent.add_subcommand(added.name, added.description);
     subcommand->callback([&added, &chosen] { chosen.chosen = &added; });
     for (const argument& a : added.arguments) {
+        if (a.name == nullptr) break;
         CLI::Option* option =
             subcommand->add_option(a.name, chosen.arguments.*a.target, a.description);
         option->required(a.is_required);
         option->option_text(a.is_required || *a.name == '-' ? " " : "[optional]");
-        if (a.check != nullptr) {
-            option->check([check = a.check](const std::string& text) { return check(text); });
-        }
+        if (a.check != nullptr) option->check(a.check);
     }
 }
 
@@ -278,7 +273,8 @@ void set_up(CLI::App& app, options& chosen) {
         "             3 daemon not reachable or not in time");
     app.require_subcommand(1);
     app.add_option("--base", chosen.base, "The daemon's directory, where its sockets are")
-        ->option_text("DIR [" + chosen.base + "]");
+        ->option_text("DIR [" + chosen.base + "]")
+        ->check(check_directory);
     app.add_option("--timeout", chosen.timeout_ms,
                    "How long to wait for the daemon, in milliseconds")
         ->option_text("MS [" + std::to_string(chosen.timeout_ms) + "]")
@@ -335,6 +331,13 @@ int parse_and_run(int argc, char** argv) {
         app.parse(argc, argv);
     } catch (const CLI::Success& help) {
         return app.exit(help);
+    } catch (const CLI::RequiredError& error) {
+        // a mistyped command counts as a missing one, but is the better thing to name
+        const auto unknown = app.remaining(true);
+        const std::string text =
+            unknown.empty() ? error.what() : "unexpected \"" + unknown.front() + "\"";
+        fprintf(stderr, "kivctl: %s (see kivctl --help)\n", text.c_str());
+        return status_usage;
     } catch (const CLI::ParseError& error) {
         fprintf(stderr, "kivctl: %s (see kivctl --help)\n", error.what());
         return status_usage;
