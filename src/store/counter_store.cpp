@@ -73,6 +73,7 @@ void counters_init() {
     clist_p = list_create(256, 128, compare_probes, nullptr);
     if (clist_p == nullptr) fatal_error("OOM, while creating clist_p");
     counters_dirty = false;
+    list_use_index(*clist_p);
     (void)list_load(*clist_p, paths::counters, parse_record, nullptr);
 }
 

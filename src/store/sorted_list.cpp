@@ -31,32 +31,18 @@ bool make_room(sorted_list& list) {
 
 }  // namespace
 
-int compare_probes(const void* key, const void* element) {
-    const auto& wanted = *static_cast<const probe_key*>(key);
-    const auto& present = *static_cast<const probe_key*>(element);
-    const int order = strcmp(wanted.package, present.package);
-    return order != 0 ? order : strcmp(wanted.name, present.name);
-}
-
-void* new_probe_element(size_t fixed_size, const probe_key& key) {
-    const size_t package_size = strlen(key.package) + 1;
-    const size_t name_size = strlen(key.name) + 1;
-    void* const block = malloc(fixed_size + package_size + name_size);
-    if (block == nullptr) return nullptr;
-    char* const texts = static_cast<char*>(block) + fixed_size;
-    memcpy(texts, key.package, package_size);
-    memcpy(texts + package_size, key.name, name_size);
-    *static_cast<probe_key*>(block) = {texts, texts + package_size};
-    return block;
-}
-
 sorted_list* list_create(uint32_t capacity, uint32_t grow_by,
                          int (*compare)(const void*, const void*), void (*destroy)(void*)) {
     auto* const list = static_cast<sorted_list*>(malloc(sizeof(sorted_list)));
     if (list == nullptr) return nullptr;
     auto** const elements = static_cast<void**>(malloc(capacity * sizeof(void*)));
-    *list = {elements, 0, elements != nullptr ? capacity : 0, grow_by, compare, destroy};
+    *list = {elements, 0, elements != nullptr ? capacity : 0, grow_by, compare, destroy, {}};
     return list;
+}
+
+void list_use_index(sorted_list& list) {
+    list.index = probe_index_create();
+    for (uint32_t i = 0; i < list.count; ++i) probe_index_add(list.index, list.elements[i]);
 }
 
 uint32_t list_search(const sorted_list& list, const void* key, bool& found) {
@@ -80,6 +66,9 @@ uint32_t list_search(const sorted_list& list, const void* key, bool& found) {
 }
 
 void* list_find(const sorted_list& list, const void* key) {
+    if (list.index.slots != nullptr) {
+        return probe_index_find(list.index, *static_cast<const probe_key*>(key));
+    }
     bool found = false;
     const uint32_t position = list_search(list, key, found);
     return found ? list.elements[position] : nullptr;
@@ -104,6 +93,7 @@ int list_add(sorted_list& list, void*& element) {
     memmove(slot + 1, slot, (list.count - position) * sizeof *slot);
     *slot = element;
     ++list.count;
+    probe_index_add(list.index, element);
     return 1;
 }
 
@@ -113,12 +103,14 @@ int list_append(sorted_list& list, void*& element) {
         return 0;
     }
     list.elements[list.count++] = element;
+    probe_index_add(list.index, element);
     return 1;
 }
 
 void list_destroy(sorted_list*& list) {
     if (list == nullptr) return;
     for (uint32_t i = 0; i < list->count; ++i) destroy_element(*list, list->elements[i]);
+    probe_index_release(list->index);
     free(list->elements);
     free(list);
     list = nullptr;

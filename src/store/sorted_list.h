@@ -2,8 +2,9 @@
 // Elements are never removed one by one: an owner that needs another set builds a new list.
 #pragma once
 
-#include <cstddef>
 #include <cstdint>
+
+#include "store/probe_index.h"
 
 namespace kivd {
 
@@ -17,26 +18,18 @@ struct sorted_list {
     int (*compare)(const void* key, const void* element);
     // Releases what an element owns beside its own block; may be null.
     void (*destroy)(void* element);
+
+    probe_index index;  // none until list_use_index
 };
-
-// The two texts that the elements of every list begin with, and keys for looking them up.
-struct probe_key {
-    const char* package;
-    const char* name;
-};
-
-// Compares packages, then names, byte by byte; for lists whose elements begin with a probe_key.
-[[nodiscard]] int compare_probes(const void* key, const void* element);
-
-// A block of malloc of `fixed_size` bytes that begins with a probe_key, with copies of the two texts
-// behind it. The caller fills in the rest; null when there is no memory.
-[[nodiscard]] void* new_probe_element(size_t fixed_size, const probe_key& key);
 
 // Null when there is no memory for the list. When there is none for the array, the list has a
 // capacity of 0 and grows on first use.
 [[nodiscard]] sorted_list* list_create(uint32_t capacity, uint32_t grow_by,
                                        int (*compare)(const void*, const void*),
                                        void (*destroy)(void*));
+
+// From now on list_find goes through a hash index; for lists that compare_probes orders.
+void list_use_index(sorted_list& list);
 
 // The position of the element equal to `key`, or the one at which it would be inserted.
 [[nodiscard]] uint32_t list_search(const sorted_list& list, const void* key, bool& found);

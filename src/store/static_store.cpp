@@ -93,6 +93,7 @@ void sdata_init() {
     sdlist_p = list_create(256, 128, compare_probes, destroy_entry);
     if (sdlist_p == nullptr) fatal_error("OOM, while creating sdlist_p");
     sdata_dirty = false;
+    list_use_index(*sdlist_p);
     (void)list_load(*sdlist_p, paths::static_data, parse_record, nullptr);
 }
 

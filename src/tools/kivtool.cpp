@@ -2,6 +2,7 @@
 #include <google/protobuf/stubs/logging.h>
 
 #include <CLI/CLI.hpp>
+#include <exception>
 #include <iostream>
 #include <string>
 #include <vector>
@@ -12,7 +13,7 @@ namespace {
 constexpr int wrong_usage = 2;
 }
 
-int main(int argc, char** argv) {
+int main(int argc, char** argv) try {
     google::protobuf::SetLogHandler(nullptr);  // problems are told once, by us
 
     CLI::App app("Looks into the files that kivd leaves.", "kivtool");
@@ -35,4 +36,7 @@ int main(int argc, char** argv) {
     const auto other_view = summary ? kivd::report_view::summary : kivd::report_view::text;
     const auto view = json ? kivd::report_view::json : other_view;
     return kivd::run_report_command(paths, view, std::cout, std::cerr);
+} catch (const std::exception& error) {
+    std::cerr << "kivtool: " << error.what() << '\n';
+    return 1;
 }

@@ -130,6 +130,7 @@ std::vector<event_kind> events_by_kind(const kiv::Report& report) {
         kind.last = std::max(kind.last, event.timestamp());
     }
     std::vector<event_kind> kinds;
+    kinds.reserve(found.size());
     for (auto& [id, kind] : found) kinds.push_back(std::move(kind));
     std::ranges::stable_sort(kinds, std::greater{}, &event_kind::count);
     return kinds;
@@ -168,6 +169,7 @@ void print_counter_list(std::ostream& out, const char* what, const counter_list&
 
 void print_counters(std::ostream& out, const kiv::Report& report) {
     counter_list counters;
+    counters.reserve(static_cast<size_t>(report.counters_size()));
     for (const kiv::Counter& counter : report.counters()) counters.push_back(&counter);
     if (counters.empty()) return;
     std::ranges::stable_sort(counters, std::greater{}, &kiv::Counter::value);

@@ -8,10 +8,12 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd";
-constexpr char delimiters[] = " \t\r\n";
 constexpr size_t max_probe_id_size = 256;  // package and name together
 
 const char* or_null(const char* text) { return text != nullptr ? text : "null"; }
+
+// A loop of our own: strcspn would build a table of its set for every token.
+bool is_delimiter(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
 
 }  // namespace
 
@@ -20,13 +22,14 @@ request make_request(int fd, std::span<char> packet, const msghdr* message) {
 }
 
 const char* next_token(request& r) {
-    char* const token = r.rest + strspn(r.rest, delimiters);
-    const size_t length = strcspn(token, delimiters);
-    r.token_end = token + length;
-    const bool ends_text = *r.token_end == '\0';
-    *r.token_end = '\0';
-    r.rest = ends_text ? r.token_end : r.token_end + 1;
-    return length > 0 ? token : nullptr;
+    char* token = r.rest;
+    while (is_delimiter(*token)) ++token;
+    char* end = token;
+    while (*end != '\0' && !is_delimiter(*end)) ++end;
+    r.token_end = end;
+    r.rest = *end == '\0' ? end : end + 1;
+    *end = '\0';
+    return end > token ? token : nullptr;
 }
 
 std::span<const char> raw_rest(const request& r) {
