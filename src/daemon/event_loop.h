@@ -18,10 +18,6 @@ struct event_handler {
 [[nodiscard]] int event_loop_add(event_handler& handler);
 void event_loop_remove(event_handler& handler);
 
-// From now on a timer cuts short whatever blocks a callback for more than a second, for kernels on
-// which clients can make the closing of received descriptors block.
-void event_loop_bound_stalls();
-
 // Serves events and the timed save until a stop is requested.
 void event_loop_run();
 

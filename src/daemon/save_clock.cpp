@@ -20,9 +20,9 @@ constinit int64_t last_save = 0;  // seconds since the epoch
 void set_save_interval(int32_t seconds) { save_interval = std::min(seconds, max_interval); }
 
 int32_t seconds_until_save() {
-    // The system clock may have been set back or forward by any amount.
-    const int64_t left = last_save + save_interval - time(nullptr);
-    return static_cast<int32_t>(std::clamp(left, int64_t{0}, int64_t{save_interval}));
+    const int64_t now = time(nullptr);
+    last_save = std::min(last_save, now);  // the system clock may have been set back, by years
+    return static_cast<int32_t>(std::max(last_save + save_interval - now, int64_t{0}));
 }
 
 void mark_saved() { last_save = time(nullptr); }

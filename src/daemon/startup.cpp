@@ -39,8 +39,6 @@ namespace {
 
 constexpr char tag[] = "kivd";
 
-constinit char* base_directory = nullptr;  // absolute; a block of malloc
-
 // A data file that became descriptor 0, 1 or 2 would take whatever is printed there.
 void open_standard_descriptors() {
     int fd = 0;
@@ -48,19 +46,6 @@ void open_standard_descriptors() {
         fd = open("/dev/null", O_RDWR);  // NOLINT(android-cloexec-open): the standard ones stay
     } while (fd >= 0 && fd <= STDERR_FILENO);
     if (fd > STDERR_FILENO) (void)close(fd);
-}
-
-// The errors that the daemon raises find its sockets from here, whatever the directory is by then.
-void set_base_directory(const char* given) {
-    if (given[0] == '/') {
-        base_directory = strdup(given);
-    } else {
-        const unique_malloc<char> current(getcwd(nullptr, 0));
-        if (!current || asprintf(&base_directory, "%s/%s", current.get(), given) < 0) {
-            base_directory = nullptr;
-        }
-    }
-    if (base_directory == nullptr) fatal_error("OOM: base_dir_p");
 }
 
 void detach() {
@@ -83,8 +68,7 @@ void detach() {
     exit(1);
 }
 
-// The lock is held, through the open descriptor, until the process and its children have ended.
-void take_lock() {
+unique_fd lock_file() {
     unique_fd fd(open(paths::lock_file, O_RDWR | O_CREAT | O_CLOEXEC, 0644));
     if (!fd.ok()) {
         give_up("Failed to open lock file %s, and errno is %s", paths::lock_file, strerror(errno));
@@ -92,6 +76,21 @@ void take_lock() {
     if (flock(fd.get(), LOCK_EX | LOCK_NB) != 0) {
         give_up("Another kivd is already running, and errno is %s", strerror(errno));
     }
+    return fd;
+}
+
+// Whether the file is still the one of that name: a daemon that was just ending removes its own.
+bool is_current_lock(int fd) {
+    struct stat locked = {};
+    struct stat named = {};
+    return fstat(fd, &locked) == 0 && stat(paths::lock_file, &named) == 0 &&
+           locked.st_ino == named.st_ino && locked.st_dev == named.st_dev;
+}
+
+// The lock is held, through the open descriptor, until the process and its children have ended.
+void take_lock() {
+    unique_fd fd = lock_file();
+    while (!is_current_lock(fd.get())) fd = lock_file();
     char line[20];
     const int size = snprintf(line, sizeof line, "%d\n", getpid());
     if (write_all(fd.get(), line, static_cast<size_t>(size)) < 0) exit(1);
@@ -114,6 +113,11 @@ const signal_action signal_actions[] = {
     {SIGQUIT, SIG_IGN, "SIGQUIT"},
     {SIGUSR1, SIG_IGN, "SIGUSR1"},
     {SIGUSR2, SIG_IGN, "SIGUSR2"},
+    {SIGIO, SIG_IGN, "SIGIO"},
+    {SIGPROF, SIG_IGN, "SIGPROF"},
+    {SIGVTALRM, SIG_IGN, "SIGVTALRM"},
+    {SIGXCPU, SIG_IGN, "SIGXCPU"},
+    {SIGXFSZ, SIG_IGN, "SIGXFSZ"},
     {SIGALRM, [](int) {}, "SIGALRM"},
 };
 
@@ -126,6 +130,9 @@ void install_signal_handlers() {
         __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to install %s handler: %s", each.name,
                             strerror(errno));
     }
+    sigset_t none;  // whoever started us may have blocked some
+    sigemptyset(&none);
+    (void)sigprocmask(SIG_SETMASK, &none, nullptr);
 }
 
 void create_directory(const char* path, mode_t mode, const char* name) {
@@ -151,7 +158,6 @@ void raise_descriptor_limit() {
 
 // Puts the process into its place: detached, in its directory, the only one there.
 void enter_working_directory(const options& given) {
-    set_base_directory(given.base_directory);
     if (given.detach && getppid() != 1) {
         detach();
     } else {
@@ -163,11 +169,10 @@ void enter_working_directory(const options& given) {
     }
     take_lock();
     stop_init();
-    install_signal_handlers();
 }
 
 void load_everything() {
-    daemon_error_init(base_directory);
+    daemon_error_init(paths::working_dir);
     rescue_event_file(paths::events, record_header::expected);
     counters_init();
     sdata_init();
@@ -182,8 +187,6 @@ void release_all() {
     counters_free();
     sdata_free();
     free_header();
-    free(base_directory);
-    base_directory = nullptr;
 }
 
 void shut_down() {
@@ -192,8 +195,9 @@ void shut_down() {
     sdata_save();
     config_save();
     wait_for_compactor();  // a restart must not meet a report half written
-    (void)unlink(paths::lock_file);
+    // The lock file goes last: as soon as it is gone a new daemon may make sockets of its own.
     remove_client_sockets();
+    (void)unlink(paths::lock_file);
     release_all();
     __android_log_print(ANDROID_LOG_INFO, tag, "Exiting.");
 }
@@ -202,6 +206,7 @@ void shut_down() {
 
 int run_daemon(int argc, char** argv) {
     open_standard_descriptors();
+    install_signal_handlers();
     init_settings();
     enter_working_directory(parse_options(argc, argv));
     check_disabled();

@@ -1,6 +1,7 @@
 #include "platform/system_properties.h"
 
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <memory>
 
@@ -11,20 +12,23 @@ struct close_file {
     void operator()(FILE* file) const { fclose(file); }
 };
 
-// "key=value" lines; those that start with # are comments.
+// "key=value" lines; those that start with # are comments. An empty value is none.
 bool find_in_file(const char* path, const char* key, char* value) {
     const std::unique_ptr<FILE, close_file> file(fopen(path, "re"));
     if (!file) return false;
     const size_t key_length = strlen(key);
-    char line[1024];
-    while (fgets(line, sizeof line, file.get()) != nullptr) {
+    char* line = nullptr;
+    size_t capacity = 0;
+    int length = 0;
+    while (length == 0 && getline(&line, &capacity, file.get()) >= 0) {
         if (line[0] == '#') continue;
         if (strncmp(line, key, key_length) != 0 || line[key_length] != '=') continue;
-        const char* text = line + key_length + 1;
-        snprintf(value, PROPERTY_VALUE_MAX, "%.*s", static_cast<int>(strcspn(text, "\r\n")), text);
-        return true;
+        const char* const text = line + key_length + 1;
+        length = static_cast<int>(strcspn(text, "\r\n"));
+        snprintf(value, PROPERTY_VALUE_MAX, "%.*s", length, text);
     }
-    return false;
+    free(line);
+    return length > 0;
 }
 
 }  // namespace

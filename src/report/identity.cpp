@@ -63,7 +63,10 @@ void rebuild_header(header_record& record) {
     header_record candidate;
     gather_header(candidate);
     fill_from_record(candidate, record);
-    const header_record previous = record;
+    header_record previous;
+    init_header(previous);
+    copy_known_values(previous, record);
+    add_group_ids(previous.groups, record.groups);
 
     copy_known_values(record, candidate);
     add_group_ids(record.groups, candidate.groups);

@@ -34,9 +34,15 @@ struct entry_path {
     char text[sizeof paths::output_dir + NAME_MAX];
 };
 
-// Calls `function` with the name of each entry but "config_request".
-void for_each_entry(DIR* directory, auto function) {
-    while (const dirent* entry = readdir(directory)) {
+// Calls `function` with the name of each entry but "config_request". False, with errno set, when
+// the directory cannot be read, or not to its end.
+bool for_each_entry(auto function) {
+    const unique_dir directory(opendir(paths::output_dir));
+    if (!directory) return false;
+    for (;;) {
+        errno = 0;
+        const dirent* const entry = readdir(directory.get());
+        if (entry == nullptr) return errno == 0;
         const std::string_view name = entry->d_name;
         if (name != "." && name != ".." && name != paths::config_request_name) {
             function(entry->d_name);
@@ -62,12 +68,7 @@ struct directory_state {
 };
 
 bool scan_output_dir(directory_state& state) {
-    const unique_dir directory(opendir(paths::output_dir));
-    if (!directory) {
-        (void)log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
-        return false;
-    }
-    for_each_entry(directory.get(), [&state](const char* name) {
+    const bool complete = for_each_entry([&state](const char* name) {
         const entry_path path(name);
         struct stat status = {};
         if (lstat(path.text, &status) != 0) {
@@ -86,7 +87,10 @@ bool scan_output_dir(directory_state& state) {
         if (*number > state.highest) state.highest = *number;
         if (*number < state.lowest) state.lowest = *number;
     });
-    return true;
+    if (!complete) {
+        (void)log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
+    }
+    return complete;
 }
 
 bool is_free_space_enough() {
@@ -108,9 +112,7 @@ void log_deleted(const char* log_tag, const char* path) {
 }
 
 void delete_all_entries() {
-    const unique_dir directory(opendir(paths::output_dir));
-    if (!directory) return;
-    for_each_entry(directory.get(), [](const char* name) {
+    (void)for_each_entry([](const char* name) {
         const entry_path path(name);
         if (unlink(path.text) == 0) log_deleted(remove_tag, path.text);
     });

@@ -2,9 +2,10 @@
 
 #include <unistd.h>
 
-#include <array>
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <utility>
 
 #include "daemon/error/log_and_raise.h"
 #include "platform/android_log.h"
@@ -37,10 +38,6 @@ void cut_file(const char* path, size_t size) {
     (void)log_and_raise(tag, "Failed to truncate event file <%s> at %zu :%s", path, size,
                         strerror(errno));
     (void)remove(path);  // nothing may be appended behind a torn record
-}
-
-void report_write_failure(const char* store_tag) {
-    (void)log_and_raise(store_tag, "Failed to write PB to file: %s", strerror(errno));
 }
 
 }  // namespace
@@ -97,14 +94,20 @@ void rescue_event_file(const char* path, record_header header) {
     }
 }
 
-void append_record(FILE* file, std::span<const uint8_t> record, const char* store_tag) {
-    if (fwrite_unlocked(record.data(), 1, record.size(), file) != record.size()) {
-        report_write_failure(store_tag);
-    }
+void record_appender::append(std::span<const uint8_t> record, const char* store_tag) {
+    if (record.size() > buffer_.size() - used_) flush(store_tag);
+    std::ranges::copy(record, buffer_.begin() + used_);
+    used_ += record.size();
 }
 
-void finish_records(FILE* file, const char* store_tag) {
-    if (fflush(file) != 0) report_write_failure(store_tag);
+void record_appender::flush(const char* store_tag) {
+    const size_t size = std::exchange(used_, 0);
+    if (write_all(fd_, buffer_.data(), size) >= 0) {
+        file_size_ += size;
+        return;
+    }
+    (void)log_and_raise(store_tag, "Failed to write PB to file: %s", strerror(errno));
+    (void)!ftruncate(fd_, static_cast<off_t>(file_size_));
 }
 
 }  // namespace kivd

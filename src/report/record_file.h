@@ -2,6 +2,7 @@
 // records are only ever appended, so a crash can spoil the last one and no other.
 #pragma once
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -23,10 +24,25 @@ enum class record_header : bool { absent, expected };
 // is spoilt. A missing file is fine. Failures are logged; the caller has nothing to do.
 void rescue_event_file(const char* path, record_header header);
 
-// Appends a record (none when empty) to a file that is being written. What a store's records cannot
-// be written with is logged and raised under its tag; a stream is buffered, so the last of them may
-// fail only in finish_records.
-void append_record(FILE* file, std::span<const uint8_t> record, const char* store_tag);
-void finish_records(FILE* file, const char* store_tag);
+// Appends records to a file, several at a time. Records that cannot be written are left out whole:
+// the file then ends at the record before them, and later ones are tried again.
+class record_appender {
+   public:
+    // `fd`, which stays the caller's, is open for appending and stands at its end.
+    record_appender(int fd, uint64_t file_size) : fd_(fd), file_size_(file_size) {}
+
+    // Takes a copy of a record; nothing when it is empty. A failure to write those before it is
+    // logged and raised under `store_tag`, as in `flush`.
+    void append(std::span<const uint8_t> record, const char* store_tag);
+
+    // Writes what has been taken.
+    void flush(const char* store_tag);
+
+   private:
+    int fd_;
+    uint64_t file_size_;  // whole records so far
+    std::array<uint8_t, 8192> buffer_;
+    size_t used_ = 0;
+};
 
 }  // namespace kivd

@@ -37,7 +37,7 @@ class field_writer {
     }
     void bytes(uint8_t field, const void* data, size_t size) {
         head(field, size);
-        memcpy(next_, data, size);
+        if (size > 0) memcpy(next_, data, size);
         next_ += size;
     }
     void text(uint8_t field, std::string_view text) { bytes(field, text.data(), text.size()); }

@@ -1,10 +1,10 @@
 #include "report/report_generation.h"
 
+#include <fcntl.h>
 #include <sys/types.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdio>
 #include <cstring>
 
 #include "daemon/error/child_process.h"
@@ -13,6 +13,7 @@
 #include "platform/android_log.h"
 #include "report/header_sources.h"
 #include "report/output_dir.h"
+#include "report/record_file.h"
 #include "report/state_file.h"
 #include "store/counter_store.h"
 #include "store/event_store.h"
@@ -25,7 +26,6 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-compactor";
-constexpr size_t buffer_size = 65536;
 
 constinit pid_t compactor_pid = -1;
 constinit gzip_level compression = gzip_level::best;
@@ -34,15 +34,15 @@ constinit gzip_level compression = gzip_level::best;
 int flush_stores() {
     if (events_flush() != 0) return log_and_raise(tag, "Failed to flush events");
 
-    char buffer[buffer_size];  // outlives the stream
-    const unique_file file(fopen(paths::flushed_data, "ae"));
-    if (!file) {
+    const unique_fd fd(open(paths::flushed_data, O_WRONLY | O_APPEND | O_CLOEXEC));
+    const off_t size = fd.ok() ? lseek(fd.get(), 0, SEEK_END) : -1;
+    if (size < 0) {
         return log_and_raise(tag, "Failed to open flushed data for writing: %s", strerror(errno));
     }
-    setvbuf(file.get(), buffer, _IOFBF, sizeof buffer);
+    record_appender report(fd.get(), static_cast<uint64_t>(size));
     const int64_t flush_time = now_ms();
-    counters_write_report(file.get(), get_last_flush());
-    sdata_write_report(file.get(), get_last_flush());
+    counters_write_report(report, get_last_flush());
+    sdata_write_report(report, get_last_flush());
     set_last_flush(flush_time);
     return 0;
 }

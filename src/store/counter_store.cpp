@@ -6,7 +6,6 @@
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/error/log_and_raise.h"
-#include "report/record_file.h"
 #include "report/record_format.h"
 #include "store/list_file.h"
 #include "store/sorted_list.h"
@@ -103,16 +102,16 @@ void counters_save() {
     if (list_save(*clist_p, paths::counters, write_record, &cutoff_ms) != 0) counters_dirty = false;
 }
 
-void counters_write_report(FILE* file, int64_t since_ms) {
-    list_foreach<counter_entry>(*clist_p, [=](const counter_entry& counter) {
+void counters_write_report(record_appender& report, int64_t since_ms) {
+    list_foreach<counter_entry>(*clist_p, [&report, since_ms](const counter_entry& counter) {
         if (counter.to_timestamp < since_ms) return;
         uint8_t record[report_record_size];
         const size_t size =
             pack_counter_record(record, counter.key.package, counter.key.name,
                                 counter.from_timestamp, counter.to_timestamp, counter.value);
-        append_record(file, {record, size}, tag);
+        report.append({record, size}, tag);
     });
-    finish_records(file, tag);
+    report.flush(tag);
 }
 
 bool counters_pending(int64_t since_ms) {

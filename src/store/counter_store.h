@@ -4,7 +4,8 @@
 #pragma once
 
 #include <cstdint>
-#include <cstdio>
+
+#include "report/record_file.h"
 
 namespace kivd {
 
@@ -21,7 +22,7 @@ void counters_update(const char* package, const char* name, int32_t value, count
 void counters_save();
 
 // Appends a report record for each counter updated at `since_ms` or later.
-void counters_write_report(FILE* file, int64_t since_ms);
+void counters_write_report(record_appender& report, int64_t since_ms);
 
 // Whether there is any such counter.
 [[nodiscard]] bool counters_pending(int64_t since_ms);

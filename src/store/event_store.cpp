@@ -38,6 +38,7 @@ void start_file() {
         measure_size();
         return;
     }
+    (void)!ftruncate(events_fd, 0);  // in case it cannot be removed either
     (void)close(events_fd);
     events_fd = -1;
     (void)unlink(paths::events);

@@ -8,7 +8,6 @@
 #include "daemon/error/daemon_error.h"
 #include "daemon/error/log_and_raise.h"
 #include "platform/android_log.h"
-#include "report/record_file.h"
 #include "report/record_format.h"
 #include "store/list_file.h"
 #include "store/sorted_list.h"
@@ -122,15 +121,15 @@ void sdata_save() {
         sdata_dirty = false;
 }
 
-void sdata_write_report(FILE* file, int64_t since_ms) {
-    list_foreach<sdata_entry>(*sdlist_p, [=](const sdata_entry& item) {
+void sdata_write_report(record_appender& report, int64_t since_ms) {
+    list_foreach<sdata_entry>(*sdlist_p, [&report, since_ms](const sdata_entry& item) {
         if (item.timestamp < since_ms) return;
         uint8_t record[report_record_size];
         const size_t size =
             pack_static_record(record, item.key.package, item.key.name, item.timestamp, item.value);
-        append_record(file, {record, size}, tag);
+        report.append({record, size}, tag);
     });
-    finish_records(file, tag);
+    report.flush(tag);
 }
 
 bool sdata_pending(int64_t since_ms) {

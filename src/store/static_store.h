@@ -3,7 +3,8 @@
 #pragma once
 
 #include <cstdint>
-#include <cstdio>
+
+#include "report/record_file.h"
 
 namespace kivd {
 
@@ -19,7 +20,7 @@ void sdata_save();
 
 // Appends a report record for each item whose value changed at `since_ms` or later; one that needs
 // more than 512 bytes is left out.
-void sdata_write_report(FILE* file, int64_t since_ms);
+void sdata_write_report(record_appender& report, int64_t since_ms);
 
 // Whether there is any such item.
 [[nodiscard]] bool sdata_pending(int64_t since_ms);

@@ -274,11 +274,13 @@ void set_up(CLI::App& app, options& chosen) {
     app.require_subcommand(1);
     app.add_option("--base", chosen.base, "The daemon's directory, where its sockets are")
         ->option_text("DIR [" + chosen.base + "]")
-        ->check(check_directory);
+        ->check(check_directory)
+        ->take_last();
     app.add_option("--timeout", chosen.timeout_ms,
                    "How long to wait for the daemon, in milliseconds")
         ->option_text("MS [" + std::to_string(chosen.timeout_ms) + "]")
-        ->check(CLI::Range(1, 86'400'000));
+        ->check(CLI::Range(1, 86'400'000))
+        ->take_last();
     for (const auto& group : groups) {
         app.add_subcommand(group.name, group.description)->require_subcommand(1);
     }

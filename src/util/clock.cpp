@@ -2,6 +2,7 @@
 
 #include <sys/time.h>
 
+#include <algorithm>
 #include <ctime>
 
 namespace kivd {
@@ -23,7 +24,10 @@ void enable_test_mode() { test_mode = true; }
 
 bool is_test_mode() { return test_mode; }
 
-void set_test_clock(int64_t seconds) { test_clock_seconds = seconds; }
+void set_test_clock(int64_t seconds) {
+    constexpr int64_t limit = INT64_MAX / 2000;  // leaves room to step and for milliseconds
+    test_clock_seconds = std::clamp(seconds, -limit, limit);
+}
 
 int64_t monotonic_ms() {
     timespec now = {};

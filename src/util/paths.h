@@ -3,6 +3,8 @@
 
 namespace kivd::paths {
 
+inline constexpr char working_dir[] = "./";  // from the start on; all names here are relative to it
+
 inline constexpr char lock_file[] = "kivd.pid";
 
 inline constexpr char datagram_socket[] = "kiv_cl";

@@ -35,7 +35,7 @@ std::string_view scan_word(const char* text, size_t width) {
 
 std::optional<int64_t> scan_number(const char* text, size_t width) {
     std::string_view word = scan_word(text, width > 0 ? width : std::string_view::npos);
-    if (word.starts_with("+")) word.remove_prefix(1);
+    if (word.starts_with("+") && !word.starts_with("+-")) word.remove_prefix(1);
     int64_t value = 0;
     const auto [end, error] = std::from_chars(word.data(), word.data() + word.size(), value);
     if (error == std::errc::result_out_of_range) {

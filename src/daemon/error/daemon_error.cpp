@@ -60,7 +60,7 @@ void log_suppression_once() {
     const time_t end = error_time + flood_interval;
     tm local = {};
     localtime_r(&end, &local);
-    char until[20];
+    char until[20] = "";
     strftime(until, sizeof until, "%Y-%m-%d %H:%M:%S", &local);
     __android_log_print(ANDROID_LOG_ERROR, tag,
                         "KIV daemon error event will not be created until %s to prevent flooding.",

@@ -13,7 +13,7 @@ namespace kivd {
 
 inline constexpr size_t error_text_size = 1024;  // NUL included; longer texts are cut
 
-// `directory` is where the daemon's own sockets are: absolute, and kept by the caller.
+// `directory` is where the daemon's own sockets are; the text is kept by the caller.
 void daemon_error_init(const char* directory);
 
 // Formats a text and sends it; never waits and never fails towards the caller. Keeps errno.

@@ -13,6 +13,7 @@
 #include "daemon/net/connections.h"
 #include "daemon/net/datagrams.h"
 #include "daemon/net/packet_buffer.h"
+#include "daemon/net/wait.h"
 #include "platform/android_log.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -23,10 +24,6 @@ namespace {
 constexpr char tag[] = "kivd";
 constexpr mode_t socket_mode = 0622;
 constexpr int listen_backlog = 5;
-
-#ifndef SO_PASSRIGHTS
-constexpr int SO_PASSRIGHTS = 83;  // Linux 6.16
-#endif
 
 struct client_socket {
     int type;
@@ -45,16 +42,9 @@ constinit client_socket client_sockets[] = {
     exit(1);
 }
 
-// No client may hand us descriptors. Where the kernel cannot refuse them, closing one may block.
-void refuse_descriptors(int fd) {
-    const int off = 0;
-    if (setsockopt(fd, SOL_SOCKET, SO_PASSRIGHTS, &off, sizeof off) != 0) {
-        event_loop_bound_stalls();
-    }
-}
-
 int create_socket(int type, const char* name) {
-    unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
+    // No callback may wait for a client that has gone again.
+    unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!fd.ok()) give_up("create AF_UNIX socket");
     refuse_descriptors(fd.get());
     if (type == SOCK_DGRAM) {  // before the first packet can arrive
@@ -81,6 +71,7 @@ int create_socket(int type, const char* name) {
 
 void create_client_sockets() {
     if (packet_buffers_init() != 0) give_up("map packet buffers");
+    connections_init();
     for (client_socket& each : client_sockets) {
         each.handler.fd = create_socket(each.type, each.name);
         if (event_loop_add(each.handler) != 0) give_up("add socket to epoll");

@@ -11,12 +11,14 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 #include "daemon/error/log_and_raise.h"
 #include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/send.h"
 #include "daemon/net/stream_framing.h"
+#include "daemon/net/wait.h"
 #include "daemon/request/handle_request.h"
 #include "util/clock.h"
 #include "util/unique_fd.h"
@@ -27,6 +29,7 @@ namespace {
 constexpr char tag[] = "kivd";
 constexpr int64_t stream_packet_ms = 3000;  // for a whole packet, however it trickles in
 constexpr int64_t receive_timeout_ms = 1000;
+constexpr useconds_t accept_pause_us = 10000;
 constexpr rlim_t spare_descriptors = 16;  // for reports, saves and all else that opens files
 
 struct connection : event_handler {
@@ -35,6 +38,7 @@ struct connection : event_handler {
 };
 
 constinit connection* connections = nullptr;  // owns them
+constinit int placeholder = -1;               // a descriptor to give up when there are none left
 
 bool add_connection(unique_fd fd, void (*callback)(event_handler&)) {
     auto* const added = static_cast<connection*>(malloc(sizeof(connection)));
@@ -54,6 +58,7 @@ bool add_connection(unique_fd fd, void (*callback)(event_handler&)) {
 // then the loop would go on reporting it.
 void close_connection(event_handler& handler) {
     auto& closed = static_cast<connection&>(handler);
+    const stall_guard guard;
     event_loop_remove(closed);
     (void)close(closed.fd);
     (closed.previous != nullptr ? closed.previous->next : connections) = closed.next;
@@ -69,38 +74,41 @@ bool is_spare(int fd) {
     return static_cast<rlim_t>(fd) >= limit.rlim_cur - kept;
 }
 
-// Takes a client that there is no descriptor for off the queue and hangs up on it: left there, it
-// would wake the loop again at once, for ever.
+void hold_placeholder() { placeholder = open("/dev/null", O_RDONLY | O_CLOEXEC); }
+
+// Takes a client that could not be accepted off the queue and hangs up on it: left there, it would
+// wake the loop again at once, for ever. Where even that fails, the loop at least doesn't spin.
 void turn_away_client(int listening_fd) {
-    static constinit int placeholder = -1;
-    if (placeholder >= 0) {
-        (void)close(placeholder);
-        const unique_fd refused(accept4(listening_fd, nullptr, nullptr, SOCK_CLOEXEC));
-    }
-    placeholder = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    if (placeholder >= 0) (void)close(placeholder);
+    const unique_fd refused(accept4(listening_fd, nullptr, nullptr, SOCK_CLOEXEC));
+    if (!refused.ok()) usleep(accept_pause_us);
+    hold_placeholder();
 }
 
 void accept_client(int listening_fd, void (*callback)(event_handler&)) {
     unique_fd fd(accept4(listening_fd, nullptr, nullptr, SOCK_CLOEXEC));
-    if (fd.ok() && is_spare(fd.get())) {
-        fd.reset();
-        errno = EMFILE;
-    }
     if (!fd.ok()) {
-        const bool out_of_descriptors = errno == EMFILE || errno == ENFILE;
+        if (errno == EAGAIN) return;  // it has hung up already
         (void)log_and_raise(tag, "Accept failed: %s.", strerror(errno));
-        if (out_of_descriptors) turn_away_client(listening_fd);
+        return turn_away_client(listening_fd);
+    }
+    if (is_spare(fd.get())) {
+        (void)log_and_raise(tag, "Accept failed: %s.", strerror(EMFILE));
         return;
     }
     set_socket_timeouts(fd.get());
+    // A byte out of band would wake the loop without being received.
+    const int on = 1;
+    (void)setsockopt(fd.get(), SOL_SOCKET, SO_OOBINLINE, &on, sizeof on);
     (void)add_connection(std::move(fd), callback);
 }
 
 ssize_t receive(int fd, char* bytes, size_t size) {
     wait_before_receive();
+    const stall_guard guard;
     ssize_t n = 0;
     do {
-        n = recv(fd, bytes, size, 0);
+        n = recv(fd, bytes, size, MSG_DONTWAIT);
     } while (n < 0 && errno == EINTR);
     return n;
 }
@@ -109,6 +117,7 @@ ssize_t receive(int fd, char* bytes, size_t size) {
 // size, or 0 when there is no packet; the connection may then be closed.
 size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
     const ssize_t n = receive(handler.fd, buffer, receive_size);
+    if (n < 0 && errno == EAGAIN) return 0;
     if (n < 0) {
         (void)log_and_raise(tag, "recvfrom() error from client %d, %s", handler.fd,
                             strerror(errno));
@@ -148,15 +157,14 @@ void receive_seq_client(event_handler& handler) {
 // Reads on until `buffer` holds `wanted` bytes, or more when more came at once. Gives the bytes now
 // there; fewer than wanted when the client stopped sending.
 size_t receive_rest(int fd, char* buffer, size_t size, size_t wanted) {
-    const int64_t deadline_ms = monotonic_ms() + stream_packet_ms;
+    int64_t deadline_ms = monotonic_ms() + stream_packet_ms;
     while (size < wanted && size < receive_size) {
-        const int64_t wait_ms = std::min(deadline_ms - monotonic_ms(), receive_timeout_ms);
-        pollfd readable = {fd, POLLIN, 0};
-        if (wait_ms <= 0 || poll(&readable, 1, static_cast<int>(wait_ms)) == 0) break;
-        if (readable.revents == 0) continue;  // a signal
+        const int64_t gap_end_ms = monotonic_ms() + receive_timeout_ms;
+        if (!wait_for_client(fd, POLLIN, std::min(deadline_ms, gap_end_ms))) break;
         const ssize_t n = receive(fd, buffer + size, receive_size - size);
         if (n <= 0) break;
         size += static_cast<size_t>(n);
+        deadline_ms += get_receive_delay();  // not the client's time
     }
     return size;
 }
@@ -212,7 +220,10 @@ void set_socket_timeouts(int fd) {
                         "set_socket_timeouts", error, strerror(error));
 }
 
+void connections_init() { hold_placeholder(); }
+
 void connections_release() {
+    if (placeholder >= 0) (void)close(std::exchange(placeholder, -1));
     while (connections != nullptr) close_connection(*connections);
 }
 

@@ -1,6 +1,9 @@
 #include "daemon/net/delays.h"
 
+#include <cerrno>
 #include <ctime>
+
+#include "daemon/stop.h"
 
 namespace kivd {
 namespace {
@@ -10,8 +13,9 @@ constinit int32_t send_delay_ms = 0;
 
 void wait(int32_t delay_ms) {
     if (delay_ms <= 0) return;
-    const timespec delay = {delay_ms / 1000, delay_ms % 1000 * 1000000L};
-    (void)nanosleep(&delay, nullptr);
+    timespec left = {delay_ms / 1000, delay_ms % 1000 * 1000000L};
+    while (nanosleep(&left, &left) != 0 && errno == EINTR && !is_stop_requested()) {
+    }
 }
 
 }  // namespace
@@ -20,7 +24,7 @@ void set_receive_delay(int32_t delay_ms) { receive_delay_ms = delay_ms; }
 
 void set_send_delay(int32_t delay_ms) { send_delay_ms = delay_ms; }
 
-bool has_receive_delay() { return receive_delay_ms > 0; }
+int32_t get_receive_delay() { return receive_delay_ms; }
 
 void wait_before_receive() { wait(receive_delay_ms); }
 

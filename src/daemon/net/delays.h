@@ -10,7 +10,7 @@ namespace kivd {
 void set_receive_delay(int32_t delay_ms);
 void set_send_delay(int32_t delay_ms);
 
-[[nodiscard]] bool has_receive_delay();
+[[nodiscard]] int32_t get_receive_delay();
 void wait_before_receive();
 void wait_before_send();
 

@@ -10,22 +10,16 @@ inline constexpr size_t max_packet_size = 31176;  // the largest request, on eac
 inline constexpr size_t receive_size = max_packet_size + 1;  // shows that a packet is larger
 inline constexpr size_t max_reply_size = 63;                 // with its NUL, at most 64 bytes
 inline constexpr size_t max_batch = 16;
-inline constexpr size_t control_size = 1024;
 
 // What arrived, a NUL, and room for a reply that starts anywhere in it.
 struct alignas(64) packet_buffer {
     std::array<char, receive_size + 1 + max_reply_size> bytes;
 };
 
-struct alignas(64) control_buffer {
-    std::array<char, control_size> bytes;
-};
-
 // They lie in a mapping of their own that forked children don't get: the parent writes to it all
 // the time, and each such page would have to be copied.
 struct packet_buffers {
     std::array<packet_buffer, max_batch> packets;
-    std::array<control_buffer, max_batch> controls;
 };
 
 // Maps the buffers. -1 with errno set when that is not possible.

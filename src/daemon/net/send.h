@@ -6,8 +6,8 @@
 
 namespace kivd {
 
-// Sends all `size` bytes; gives `size`, or -1 with errno set. A client that does not read costs
-// three times the socket's send time-out at most. Raises no signal.
+// Sends all `size` bytes; gives `size`, or -1 with errno set. A client that does not read is
+// waited for up to three seconds. Raises no signal.
 [[nodiscard]] ssize_t send_all(int fd, const char* bytes, size_t size);
 
 }  // namespace kivd
