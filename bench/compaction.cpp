@@ -52,37 +52,42 @@ std::string make_report() {
 }
 
 void write_file(const std::string& path, const void* bytes, size_t size) {
-    FILE* const file = fopen(path.c_str(), "wb");
+    FILE* const file = fopen(path.c_str(), "wbe");
     if (file == nullptr) give_up("%s: %s", path.c_str(), strerror(errno));
     if (fwrite(bytes, 1, size, file) != size) give_up("%s: cannot be written", path.c_str());
     (void)fclose(file);
 }
 
-std::vector<Bytef> read_file(const std::string& path, size_t size) {
-    std::vector<Bytef> bytes(size);
-    FILE* const file = fopen(path.c_str(), "rb");
+void read_file(const std::string& path, std::vector<Bytef>& into) {
+    FILE* const file = fopen(path.c_str(), "rbe");
     if (file == nullptr) give_up("%s: %s", path.c_str(), strerror(errno));
-    if (fread(bytes.data(), 1, size, file) != size) give_up("%s: cannot be read", path.c_str());
+    if (fread(into.data(), 1, into.size(), file) != into.size())
+        give_up("%s: cannot be read", path.c_str());
     (void)fclose(file);
-    return bytes;
 }
 
-// The whole file in memory, one call of deflate with the settings that gzip files have.
-size_t compress_at_once(const std::string& source, const std::string& destination, size_t size,
-                        int level) {
-    std::vector<Bytef> plain = read_file(source, size);
+// Buffers for a whole report, used again and again so that no round pays for fresh memory.
+struct buffers {
+    std::vector<Bytef> plain;
+    std::vector<Bytef> packed;
+};
+
+// The whole file at once, one call of deflate with the settings that gzip files have.
+size_t compress_at_once(const std::string& source, const std::string& destination, int level,
+                        buffers& use) {
+    read_file(source, use.plain);
     z_stream stream{};
     (void)deflateInit2(&stream, level, Z_DEFLATED, gzip_window_bits, default_memory_level,
                        Z_DEFAULT_STRATEGY);
-    std::vector<Bytef> packed(deflateBound(&stream, size));
-    stream.next_in = plain.data();
-    stream.avail_in = static_cast<uInt>(plain.size());
-    stream.next_out = packed.data();
-    stream.avail_out = static_cast<uInt>(packed.size());
+    use.packed.resize(deflateBound(&stream, use.plain.size()));
+    stream.next_in = use.plain.data();
+    stream.avail_in = static_cast<uInt>(use.plain.size());
+    stream.next_out = use.packed.data();
+    stream.avail_out = static_cast<uInt>(use.packed.size());
     if (deflate(&stream, Z_FINISH) != Z_STREAM_END) give_up("deflate failed");
     const size_t packed_size = stream.total_out;
     (void)deflateEnd(&stream);
-    write_file(destination, packed.data(), packed_size);
+    write_file(destination, use.packed.data(), packed_size);
     return packed_size;
 }
 
@@ -98,9 +103,11 @@ void measure_level(const setup& s, const char* name, gzip_level level, int zlib_
     std::vector<double> our_ms;
     std::vector<double> their_ms;
     size_t packed_size = 0;
+    buffers use;
+    use.plain.resize(report.size());
     for (unsigned i = 0; i < amount(s, 25, 7) + 1; ++i) {
         int64_t start = now_ns();
-        packed_size = compress_at_once(source, theirs, report.size(), zlib_level);
+        packed_size = compress_at_once(source, theirs, zlib_level, use);
         const int64_t their_ns = now_ns() - start;
         start = now_ns();
         if (fu_gzip_file(source.c_str(), ours.c_str(), level) == 0) give_up("fu_gzip_file failed");

@@ -88,7 +88,7 @@ std::vector<record> read_records(const std::string& path) {
     std::vector<record> records;
     size_t at = 0;
     const auto field = [&] {
-        const std::string text = bytes.c_str() + at;
+        std::string text = bytes.c_str() + at;
         at += text.size() + 1;
         return text;
     };
@@ -108,7 +108,7 @@ std::vector<record> read_records(const std::string& path) {
 // What somebody would write who has not measured yet.
 void save_plainly(const std::vector<record>& records, const std::string& path) {
     const std::string temporary = path + "_";
-    FILE* const file = fopen(temporary.c_str(), "wb");
+    FILE* const file = fopen(temporary.c_str(), "wbe");
     if (file == nullptr) give_up("%s: %s", temporary.c_str(), strerror(errno));
     for (const auto& r : records) {
         (void)fprintf(file, "%s%c%s%c%lld%c%lld%c%lld%c%c\n", r.package.c_str(), 0, r.name.c_str(),

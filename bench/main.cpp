@@ -13,6 +13,7 @@
 #include <cstring>
 #include <ctime>
 #include <filesystem>
+#include <fstream>
 #include <string_view>
 
 #include "bench/measure.h"
@@ -29,10 +30,10 @@ struct section {
     void (*measure)(const setup&);
 };
 constexpr section sections[] = {
-    {"events", measure_events},         {"counters", measure_counters},
-    {"flush", measure_flush},           {"save", measure_save},
-    {"compaction", measure_compaction}, {"latency", measure_latency},
-    {"footprint", measure_footprint},
+    {"events", measure_events},     {"large_events", measure_large_events},
+    {"counters", measure_counters}, {"flush", measure_flush},
+    {"save", measure_save},         {"compaction", measure_compaction},
+    {"latency", measure_latency},   {"footprint", measure_footprint},
 };
 
 int print_usage() {
@@ -51,11 +52,41 @@ std::string neighbour(const char* name) {
     return (std::filesystem::read_symlink("/proc/self/exe", error).parent_path() / name).string();
 }
 
+struct processor_times {
+    long long idle;
+    long long all;
+};
+
+processor_times read_processor_times() {
+    std::ifstream file("/proc/stat");
+    std::string word;
+    processor_times result{};
+    file >> word;
+    for (int field = 0; field < 8; ++field) {  // user, nice, system, idle, ... steal
+        long long ticks = 0;
+        file >> ticks;
+        if (field == 3) result.idle = ticks;
+        result.all += ticks;
+    }
+    return result;
+}
+
+// How much of the processors nobody else uses: below 90 or so the figures deserve no trust.
+double idle_percent() {
+    const processor_times before = read_processor_times();
+    (void)sleep(2);
+    const processor_times after = read_processor_times();
+    return 100.0 * static_cast<double>(after.idle - before.idle) /
+           static_cast<double>(std::max(1LL, after.all - before.all));
+}
+
 void print_machine() {
     utsname system{};
     (void)uname(&system);
     printf("%ld processors, %s %s %s\n", sysconf(_SC_NPROCESSORS_ONLN), system.sysname,
            system.release, system.machine);
+    printf("%.0f %% idle before the start\n", idle_percent());
+    (void)fflush(stdout);
 }
 
 // Runs until the measurements have ended, a signal asks to stop or the time is up; false unless

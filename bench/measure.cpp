@@ -19,6 +19,15 @@ void format_value(char* text, size_t size, double value) {
     (void)snprintf(text, size, "%.*f", decimals, value);
 }
 
+void print_goal(double value, goal wanted) {
+    const bool at_most = wanted.kind == bound::at_most;
+    const bool met = at_most ? value <= wanted.limit : value >= wanted.limit;
+    char ratio[32] = "-";
+    if (wanted.limit != 0) (void)snprintf(ratio, sizeof ratio, "%.2f", value / wanted.limit);
+    printf("   %2s %6g %6s  %s", at_most ? "<=" : ">=", wanted.limit, ratio,
+           met ? "met" : "MISSED");
+}
+
 }  // namespace
 
 int64_t now_ns() {
@@ -69,12 +78,7 @@ void print_row(const char* measure, const std::vector<double>& samples, const ch
     format_value(low, sizeof low, std::ranges::min(samples));
     format_value(high, sizeof high, std::ranges::max(samples));
     printf("%-52s %10s %-6s %8s .. %9s", measure, middle, unit, low, high);
-    if (wanted.kind != bound::none) {
-        const bool at_most = wanted.kind == bound::at_most;
-        const bool met = at_most ? value <= wanted.limit : value >= wanted.limit;
-        printf("   %2s %6g %6.2f  %s", at_most ? "<=" : ">=", wanted.limit, value / wanted.limit,
-               met ? "met" : "MISSED");
-    }
+    if (wanted.kind != bound::none) print_goal(value, wanted);
     printf("\n");
     (void)fflush(stdout);
 }

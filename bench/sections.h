@@ -7,6 +7,7 @@
 namespace kivd::bench {
 
 void measure_events(const setup& s);
+void measure_large_events(const setup& s);
 void measure_counters(const setup& s);
 void measure_flush(const setup& s);
 void measure_save(const setup& s);

@@ -1,0 +1,89 @@
+#include "report/output_dir.h"
+
+#include <algorithm>
+
+#include "config/limits.h"
+#include "support/scratch_directory.h"
+
+namespace kivd {
+namespace {
+
+class output_dir : public scratch_directory {
+ protected:
+    // Leaves files of 100 bytes each under these names, and room for `room` bytes.
+    static void prepare(const lines& names, uint32_t room) {
+        get_limits().max_output_dir_size = get_limits().max_report_size + room;
+        for (const auto& entry : fs::directory_iterator("output")) fs::remove_all(entry);
+        for (const std::string& name : names) {
+            write_file("output/" + name, std::string(100, 'x'));
+        }
+    }
+    static lines names() {
+        lines all;
+        for (const auto& entry : fs::directory_iterator("output")) {
+            all.push_back(entry.path().filename());
+        }
+        std::ranges::sort(all);
+        return all;
+    }
+};
+
+TEST_F(output_dir, the_lowest_numbers_go_until_there_is_room) {
+    const struct {
+        lines before;
+        uint32_t room;
+        int32_t highest;
+        lines after;
+    } cases[] = {
+        {{}, 0, -1, {}},
+        {{"kiv_3", "kiv_7"}, 201, 7, {"kiv_3", "kiv_7"}},
+        {{"kiv_3", "kiv_7"}, 200, 7, {"kiv_7"}},
+        {{"kiv_10", "kiv_9"}, 101, 10, {"kiv_10"}},  // numbers, not names
+        {{"kiv_3", "kiv_7"}, 100, 0, {}},
+        {{"config_request", "kiv_3"}, 101, 3, {"config_request", "kiv_3"}},
+        {{"bad", "kiv_3"}, 101, 0, {"bad"}},
+        {{"bad", "kiv_", "kiv_disabled"}, 300, -1, {"bad", "kiv_", "kiv_disabled"}},
+        {{"kiv_-5", "kiv_1"}, 101, 1, {"kiv_1"}},
+        {{"kiv_12abc", "kiv_3"}, 101, 12, {"kiv_12abc"}},
+        {{"kiv_12abc", "kiv_13"}, 101, -1, {"kiv_12abc", "kiv_13"}},  // there is no kiv_12
+        {{"kiv_ 5"}, 100, -1, {"kiv_ 5"}},
+        {{"kiv_99999999999"}, 101, 1215752191, {"kiv_99999999999"}},
+        {{"kiv_2147483647"}, 101, 2147483647, {"kiv_2147483647"}},
+    };
+    for (const auto& [before, room, highest, after] : cases) {
+        SCOPED_TRACE(testing::PrintToString(before) + " " + std::to_string(room));
+        prepare(before, room);
+        EXPECT_EQ(prune_dir(), highest);
+        EXPECT_EQ(names(), after);
+    }
+}
+
+TEST_F(output_dir, only_reports_in_the_directory_are_removed) {
+    write_file("precious", "x");
+    prepare({}, 1);
+    fs::create_symlink("../precious", "output/kiv_4");
+    EXPECT_EQ(prune_dir(), 0);
+    EXPECT_TRUE(exists("precious") && !exists("output/kiv_4"));
+    fs::create_directory("output/kiv_3");
+    EXPECT_EQ(prune_dir(), -1);
+}
+
+TEST_F(output_dir, numbers_and_sizes_wrap) {
+    prepare({"kiv_1", "kiv_2147483647"}, 0);
+    get_limits().max_output_dir_size = get_limits().max_report_size - 1;  // no limit, then
+    EXPECT_EQ(next_report_number(prune_dir()), 2);
+    EXPECT_EQ(next_report_number(2147483646), 2147483647);
+}
+
+TEST_F(output_dir, removal_takes_one_report_or_all_but_the_configuration_request) {
+    prepare({"bad", "config_request", "kiv_1", "kiv_2", "kiv_disabled"}, 1);
+    delete_reports(1);
+    delete_reports(1);
+    delete_reports(-1);
+    EXPECT_EQ(names(), (lines{"bad", "config_request", "kiv_2", "kiv_disabled"}));
+    delete_reports(0);
+    EXPECT_EQ(names(), lines{"config_request"});
+}
+
+}  // namespace
+}  // namespace kivd

@@ -1,0 +1,86 @@
+#include "report/report_generation.h"
+
+#include "report/header_record.h"
+#include "report/state_file.h"
+#include "store/counter_store.h"
+#include "store/event_store.h"
+#include "store/static_store.h"
+#include "support/scratch_directory.h"
+#include "util/clock.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+class report_generation : public scratch_directory {};
+
+TEST_F(report_generation, all_files_have_the_documented_bytes) {
+    enable_test_mode();
+    restart();
+    constexpr int64_t start = 1262325600;  // each look at the clock is a second later
+    set_test_clock(start);
+    (void)events_add("app", "start", "\x01\xFF"s);
+    set_test_clock(start);
+    counters_update("app", "starts", 5, counter_mode::increment);
+    set_test_clock(start + 2);
+    counters_update("app", "starts", -7, counter_mode::increment);
+    set_test_clock(start + 4);
+    for (int i = 0; i < 2; ++i) sdata_set("app", "mode", "night, auto");
+    set_test_clock(start + 4);
+    (void)events_add("a", "b", {});
+    counters_save();
+    sdata_save();
+    EXPECT_EQ(read_file(paths::counters), doc_example("files.md", "hex", "counters-file"));
+    EXPECT_EQ(read_file(paths::static_data), doc_example("files.md", "hex", "sdata-file"));
+
+    const auto documented = [](const char* name) {
+        return doc_example("report-format.md", "hex", name);
+    };
+    const std::string report = next_report();
+    EXPECT_TRUE(report.starts_with(documented("header-record") + documented("event-record")));
+    EXPECT_TRUE(report.ends_with(documented("counter-record") + documented("static-record")));
+    const auto empty = get_empty_report_header();
+    EXPECT_EQ(std::string(empty.begin(), empty.end()), "\x0A\x08\x0A\0\x12\0\x1A\0\x22\0"s);
+}
+
+TEST_F(report_generation, each_report_has_what_came_since_the_last_one) {
+    EXPECT_EQ(generate_report(), -1);
+    EXPECT_EQ(take_log(), lines{});
+    counters_update("p", "c1", 1, counter_mode::set);
+    EXPECT_EQ(contents(next_report()), "P1; c1=1; ");
+    set_last_flush(now_ms() + 1);  // it may have been the same millisecond
+
+    set_output_compression(false);
+    (void)events_add("p", "e1", std::string(5000, 'x'));
+    (void)events_add("p", "e2", {});
+    EXPECT_EQ(contents(next_report()), "P1; e1 " + std::string(5000, 'x') + "; e2 ; ");
+    EXPECT_GT(fs::file_size("output/kiv_2"), 5000U);
+
+    write_file(paths::header_info, "");
+    EXPECT_EQ(contents(next_report()), "P1; ");  // every flush makes one now
+    EXPECT_FALSE(exists(paths::flushed_data) || exists(paths::compacted_data));
+}
+
+TEST_F(report_generation, a_failed_flush_leaves_the_event_file) {
+    (void)events_add("p", "e1", {});
+    fs::create_directory(paths::flushed_data);
+    EXPECT_EQ(generate_report(), -1);
+    EXPECT_EQ(take_log(), (lines{"I kivd-compactor: Generating Report...",
+                                 "E kivd-compactor: Failed to flush events"}));
+    (void)events_add("p", "e2", {});
+    fs::remove(paths::flushed_data);
+    EXPECT_EQ(contents(next_report()), "P1; e1 ; e2 ; ");
+}
+
+TEST_F(report_generation, a_failed_compactor_leaves_its_data_and_no_report) {
+    (void)events_add("p", "e", {});
+    EXPECT_EQ(events_flush(), 0);
+    fs::create_symlink("/dev/full", paths::compacted_data);
+    EXPECT_EQ(compact_report(), -1);
+    EXPECT_TRUE(fs::remove(paths::compacted_data) && fs::is_empty("output"));
+    EXPECT_EQ(compact_report(), 0);
+    EXPECT_TRUE(exists("output/kiv_1"));
+}
+
+}  // namespace
+}  // namespace kivd

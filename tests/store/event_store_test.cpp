@@ -1,0 +1,68 @@
+#include "store/event_store.h"
+
+#include "config/limits.h"
+#include "report/record_file.h"
+#include "support/scratch_directory.h"
+#include "util/clock.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+class event_store : public scratch_directory {
+ protected:
+    event_store() {
+        enable_test_mode();
+        restart();
+    }
+    // Adds the documented event.
+    static event_file add() {
+        set_test_clock(1262325600);
+        return events_add("app", "start", "\x01\xFF"s);
+    }
+
+    const std::string header = doc_example("report-format.md", "hex", "header-record");
+    const std::string event = doc_example("report-format.md", "hex", "event-record");
+};
+
+TEST_F(event_store, a_file_has_one_header_and_is_full_at_its_limit) {
+    get_limits().max_report_size = 188;
+    EXPECT_EQ(add(), event_file::open);  // 187 bytes
+    EXPECT_EQ(add(), event_file::full);
+    EXPECT_EQ(events_flush(), 0);
+    EXPECT_EQ(read_file(paths::flushed_data), header + event + event);
+    write_file(paths::events, header + event);  // as a restart finds it
+    get_limits().max_report_size = 213;
+    EXPECT_EQ(add(), event_file::open);
+    EXPECT_EQ(events_add("a", "b", {}), event_file::full);
+    EXPECT_EQ(read_file(paths::events).substr(0, 212), header + event + event);
+}
+
+TEST_F(event_store, no_file_begins_without_its_whole_header) {
+    fs::create_symlink("/dev/full", paths::events);
+    (void)add();
+    EXPECT_FALSE(events_pending());
+    limit_file_size(100);
+    (void)add();
+    EXPECT_FALSE(events_pending());
+    limit_file_size(RLIM_INFINITY);
+    (void)add();
+    EXPECT_EQ(read_file(paths::events), header + event);
+}
+
+TEST_F(event_store, a_torn_event_is_cut_off_at_the_next_start) {
+    (void)add();
+    for (rlim_t written = 0; written < event.size(); ++written) {
+        limit_file_size(header.size() + event.size() + written);
+        (void)add();
+        EXPECT_EQ(take_log(), lines{"E kivd-events: Failed to write event app::start with 2 bytes "
+                                    "payload. Error: File too large"});
+        EXPECT_EQ(read_file(paths::events), header + event + event.substr(0, written));
+        rescue_event_file(paths::events, record_header::expected);
+        EXPECT_EQ(read_file(paths::events), header + event);
+        (void)take_log();
+    }
+}
+
+}  // namespace
+}  // namespace kivd

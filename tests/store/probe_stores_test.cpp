@@ -1,0 +1,113 @@
+// The stores of counters and static data, which have most of their ways in common.
+#include <algorithm>
+
+#include "config/limits.h"
+#include "report/state_file.h"
+#include "store/counter_store.h"
+#include "store/static_store.h"
+#include "support/scratch_directory.h"
+#include "util/clock.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+class probe_stores : public scratch_directory {
+ protected:
+    void save_and_restart() {
+        counters_save();
+        sdata_save();
+        restart();
+    }
+    // What a report since then holds.
+    std::string reported(int64_t since_ms) {
+        set_last_flush(since_ms);
+        return contents(next_report());
+    }
+};
+
+TEST_F(probe_stores, sums_wrap_at_64_bits_and_keep_their_sign) {
+    write_file(paths::counters,
+               "p\0max\0001\0001\0009223372036854775807\0\0\n"s
+               "p\0min\0001\0001\000-9223372036854775808\0\0\n"s);
+    restart();
+    counters_update("p", "max", 1, counter_mode::increment);
+    counters_update("p", "min", -1, counter_mode::increment);
+    counters_update("p", "a", 5, counter_mode::increment);
+    counters_update("p", "a", INT32_MIN, counter_mode::set);
+    save_and_restart();
+    EXPECT_EQ(reported(0),
+              "P1; a=-2147483648; max=-9223372036854775808; "
+              "min=9223372036854775807; ");
+}
+
+TEST_F(probe_stores, any_number_of_probes_is_found_again_in_order) {
+    lines names(3000);
+    for (size_t i = 0; i < 3000; ++i) names[i] = std::string(i % 7, '\xE4') + std::to_string(i);
+    for (const char* sum : {"=1; ", "=2; "}) {
+        for (const auto& n : names) counters_update("p", n.c_str(), 1, counter_mode::increment);
+        std::ranges::sort(names);
+        std::string all = "P1; ";
+        for (const auto& n : names) all += n + sum;
+        EXPECT_EQ(reported(0), all);
+        save_and_restart();
+    }
+}
+
+TEST_F(probe_stores, the_expired_are_left_out_of_the_files_only) {
+    enable_test_mode();
+    get_limits().expire_counters_age = get_limits().expire_sdata_age = 100;
+    set_test_clock(1000);
+    for (const char* name : {"c1", "c2"}) counters_update("p", name, 1, counter_mode::set);
+    for (const char* name : {"s1", "s2"}) sdata_set("p", name, "x");
+    sdata_set("p", "s1", "x");  // at 1005
+    set_test_clock(1100);
+    counters_save();  // what is from 1001 or before
+    set_test_clock(1103);
+    sdata_save();  // from 1004
+    EXPECT_EQ(reported(0), "P1; c1=1; c2=1; s1: x; s2: x; ");
+    EXPECT_EQ(reported(1002000), "P1; c2=1; s1: x; s2: x; ");
+    EXPECT_EQ(reported(1003001), "P1; s2: x; ");  // what was set again to the same has not changed
+    restart();
+    EXPECT_EQ(reported(0), "test_id; c2=1; s1: x; ");
+}
+
+TEST_F(probe_stores, malformed_records_cost_no_others) {
+    const std::string good = "p\0n\0001\0002\0003\0\0\n"s;
+    const std::string bad = "p\0\0\n"s + "p\0n\0001\0002\0\0\n"s + "p\0n\0001\0002\0003\0x\0\0\n"s;
+    for (const char* path : {paths::counters, paths::static_data})
+        write_file(path, good + bad + good);
+    restart();
+    EXPECT_EQ(take_log().size(), 6U);
+    int packets = 0;
+    while (!next_packet().empty()) ++packets;
+    EXPECT_EQ(packets, 6);  // an event and an increment each; those of static data are not raised
+    EXPECT_EQ(reported(0), "P1; n=3; n=3; n: 3; n: 3; ");
+}
+
+TEST_F(probe_stores, a_change_is_saved_once_and_after_a_failure_again) {
+    fs::create_symlink("/dev/full", "private/counters.txt_");
+    fs::create_symlink("/dev/full", "private/sdata.txt_");
+    counters_update("p", "n", 1, counter_mode::set);
+    sdata_set("p", "n", "x");
+    for (const bool saved : {false, true, false}) {
+        counters_save();
+        sdata_save();
+        EXPECT_EQ(fs::remove(paths::counters), saved);
+        EXPECT_EQ(fs::remove(paths::static_data), saved);
+        sdata_set("p", "n", "x");  // no change
+    }
+}
+
+TEST_F(probe_stores, long_values_are_left_out_of_reports_and_cut_in_the_file) {
+    const std::string value(493, 'v');  // 19 bytes short of a record of 512
+    sdata_set("p", "a", (value + "v").c_str());
+    sdata_set("p", "b", value.c_str());
+    EXPECT_EQ(reported(0), "P1; b: " + value + "; ");
+    save_and_restart();
+    EXPECT_EQ(reported(0),
+              "P1; a: " + value.substr(0, 256) + "; b: " + value.substr(0, 256) + "; ");
+}
+
+}  // namespace
+}  // namespace kivd
