@@ -167,11 +167,11 @@ unique_fd open_system_call_counter(pid_t thread) {
     return open_counter(attributes, thread);
 }
 
-unique_fd open_family_cpu_counter(pid_t pid) {
+unique_fd open_cpu_counter(pid_t pid, children with) {
     perf_event_attr attributes{};
     attributes.type = PERF_TYPE_SOFTWARE;
     attributes.config = PERF_COUNT_SW_TASK_CLOCK;
-    attributes.inherit = 1;
+    attributes.inherit = with == children::included ? 1 : 0;
     return open_counter(attributes, pid);
 }
 

@@ -29,6 +29,7 @@ class daemon_errors : public daemon_test {
 TEST_F(daemon_errors, end_with_the_hundredth_of_a_period_even_over_a_restart) {
     daemon_process daemon = start();
     raise_errors(99);
+    EXPECT_TRUE(daemon.wait_idle());  // it has received the last one too
     EXPECT_EQ(daemon.stop(), 0);
     EXPECT_NE(read_file("private/kivd.state").find("error_nr: 99\n"), std::string::npos);
 

@@ -1,9 +1,12 @@
 // Clients that send what they should not, or stop half-way: whatever they do, the daemon serves the
 // others and holds on to nothing.
+#include <fcntl.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 
+#include <array>
 #include <atomic>
+#include <cstring>
 #include <thread>
 
 #include "daemon_test.h"
@@ -17,12 +20,15 @@ using enum socket_kind;
 constexpr socket_kind all_kinds[] = {datagram, packets, stream};
 constexpr socket_kind connection_kinds[] = {packets, stream};
 
+bool is_served(int client, socket_kind kind) {
+    return ask(client, kind == stream ? "HD 2 IA" : "IA") == "1";
+}
+
 // All three sockets work.
 void expect_service() {
-    const unique_fd client = connect_client(packets);
-    EXPECT_EQ(ask(client.get(), "IA"), "1");
-    const unique_fd stream_client = connect_client(stream);
-    EXPECT_EQ(ask(stream_client.get(), "HD 2 IA"), "1");
+    for (const socket_kind kind : connection_kinds) {
+        EXPECT_TRUE(is_served(connect_client(kind).get(), kind));
+    }
     static int number = 0;
     const std::string mark = "alive " + std::to_string(++number) + ";";
     EXPECT_TRUE(send_text(connect_client(datagram).get(), "EV check event " + mark));
@@ -56,93 +62,73 @@ class hostile : public daemon_test {
     int64_t anonymous_kib_ = 0;
 };
 
-TEST_F(hostile, malformed_requests_are_named_and_dropped) {
-    begin({{"-C"}});
-    const struct {
-        std::string bytes;
-        const char* logged;
-    } cases[] = {
-        {"\0IA"s, "Invalid command: none - dropping."},
-        {" \t\r\n", "Invalid command: none - dropping."},
-        {"E\0V a b"s, "Bad command: 69/0 - dropping"},
-        {"\xff\x80 x", "Bad command: 255/128 - dropping"},
-        {"CS %n%s%x %s%n", "[CS] Null in probe value - dropping. [%n%s%x:%s%n]"},
-        {"CS " + std::string(31000, '%'), "[CS] Null in probe id - dropping. [%%%"},
-        {"EV " + std::string(200, 'p') + " " + std::string(57, 'n'),
-         "[EV] To large probe id, 257 >"},
-        {"EV p n " + std::string(30721, 'x'), "Too large event - dropping. [p:n] 30721 bytes"},
-        {std::string(31176, 'X'), "Bad command: 88/88 - dropping"},
-        {std::string(31177, 'X'), "Too large packet ("},
-        {std::string(200000, 'X'), "Too large packet ("},
-    };
-    for (const socket_kind kind : {datagram, packets}) {
-        for (const auto& each : cases) {
-            SCOPED_TRACE(each.logged);
-            const unique_fd client = connect_client(kind);
-            const size_t before = daemon_.log().size();
-            ASSERT_TRUE(send_text(client.get(), each.bytes));
-            EXPECT_TRUE(daemon_.wait_log(each.logged, before)) << daemon_.log().substr(before);
-            EXPECT_TRUE(kind == datagram || ask(client.get(), "IA") == "1");
-        }
-    }
-    expect_nothing_kept();
-}
-
 // Each piece is sent when the daemon has read the one before it.
-TEST_F(hostile, stream_packets_are_put_together_or_dropped_and_the_next_one_works) {
+TEST_F(hostile, malformed_packets_are_named_and_dropped_and_the_next_one_is_served) {
     begin({{"-C"}});
-    const std::string zeros(30000, '0');
+    using sockets = std::vector<socket_kind>;
+    const sockets whole = {datagram, packets};
+    const sockets framed = {stream};
     const std::string device_id = ask(connect_client(packets).get(), "GD");
-    const char* const answered = nullptr;
     const struct {
+        sockets kinds;
         std::vector<std::string> pieces;
         const char* logged;
         std::string reply = "";
     } cases[] = {
-        {{"HD 2", " ", "I", "A"}, answered, "1"},
-        {{"HD\t2\nIA"}, answered, "1"},
-        {{"HD +2 IA"}, answered, "1"},
-        {{"HD 2x IA"}, answered, "1"},
-        {{"HD " + zeros + "2 IA"}, answered, "1"},
-        // ends with the buffer, and so the reply starts at its last but one byte
-        {{"HD " + std::string(31170, '0') + "2", " GD"}, answered, device_id},
-        {{"H"}, "Invalid packet for stream from client"},
-        {{"IA"}, "Invalid packet for stream from client"},
-        {{"\0HD 2 IA"s}, "Invalid packet for stream from client"},
-        {{"HD"}, "No length marked by client"},
-        {{"HD "}, "No length marked by client"},
-        {{"HD\0 2 IA"s}, "No length marked by client"},
-        {{"HD -1 IA"}, "Incorrect size of packet from client"},
-        {{"HD 0 IA"}, "Incorrect size of packet from client"},
-        {{"HD 0x10 IA"}, "Incorrect size of packet from client"},
-        {{"HD 31177 IA"}, "Incorrect size of packet from client"},
-        {{"HD 99999999999999999999 IA"}, "Incorrect size of packet from client"},
-        {{"HD 2", "0 IA IA IA IA IA"}, "Incomplete packet for stream from client"},
-        {{"HD 2 IAHD 2 IA"}, "Incomplete packet for stream from client"},
-        {{"HD 31176 ", std::string(31168, 'X')}, "Incomplete packet for stream from client"},
-        {{std::string(31177, 'H')}, "Too large packet (stream) from client"},
+        {whole, {"\0IA"s}, "Invalid command: none - dropping."},
+        {whole, {" \t\r\n"}, "Invalid command: none - dropping."},
+        {whole, {"E\0V a b"s}, "Bad command: 69/0 - dropping"},
+        {whole, {"\xff\x80 x"}, "Bad command: 255/128 - dropping"},
+        {whole, {"CS %n%s%x %s%n"}, "[CS] Null in probe value - dropping. [%n%s%x:%s%n]"},
+        {whole, {"CS " + std::string(31000, '%')}, "[CS] Null in probe id - dropping. [%%%"},
+        {whole, {"EV p n " + std::string(30721, 'x')}, "Too large event - dropping. [p:n] 30721"},
+        {whole, {std::string(31176, 'X')}, "Bad command: 88/88 - dropping"},
+        {whole, {std::string(31177, 'X')}, "Too large packet ("},
+        {whole, {std::string(200000, 'X')}, "Too large packet ("},
+        {framed, {"HD 2", " ", "I", "A"}, "", "1"},
+        {framed, {"HD\t2\nIA"}, "", "1"},
+        {framed, {"HD +2 IA"}, "", "1"},
+        {framed, {"HD 2x IA"}, "", "1"},
+        {framed, {"HD " + std::string(30000, '0') + "2 IA"}, "", "1"},
+        // ends with the buffer, so that the reply starts at its last but one byte
+        {framed, {"HD " + std::string(31170, '0') + "2", " GD"}, "", device_id},
+        {framed, {"H"}, "Invalid packet for stream from client"},
+        {framed, {"\0HD 2 IA"s}, "Invalid packet for stream from client"},
+        {framed, {"HD"}, "No length marked by client"},
+        {framed, {"HD "}, "No length marked by client"},
+        {framed, {"HD\0 2 IA"s}, "No length marked by client"},
+        {framed, {"HD -1 IA"}, "Incorrect size of packet from client"},
+        {framed, {"HD 0 IA"}, "Incorrect size of packet from client"},
+        {framed, {"HD 0x10 IA"}, "Incorrect size of packet from client"},
+        {framed, {"HD 31177 IA"}, "Incorrect size of packet from client"},
+        {framed, {"HD 99999999999999999999 IA"}, "Incorrect size of packet from client"},
+        {framed, {"HD 2", "0 IA IA IA IA IA"}, "Incomplete packet for stream from client"},
+        {framed, {"HD 2 IAHD 2 IA"}, "Incomplete packet for stream from client"},
+        {framed, {"HD 31176 ", std::string(31168, 'X')}, "Incomplete packet for stream from"},
+        {framed, {std::string(31177, 'H')}, "Too large packet (stream) from client"},
     };
-    const unique_fd client = connect_client(stream);
     for (const auto& each : cases) {
-        SCOPED_TRACE(each.pieces.front().substr(0, 40));
-        const size_t before = daemon_.log().size();
-        for (const std::string& piece : each.pieces) {
-            ASSERT_TRUE(wait_taken(client.get()) && send_text(client.get(), piece));
+        for (const socket_kind kind : each.kinds) {
+            SCOPED_TRACE(each.pieces.front().substr(0, 40));
+            const unique_fd client = connect_client(kind);
+            const size_t before = daemon_.log().size();
+            for (const std::string& piece : each.pieces) {
+                ASSERT_TRUE(wait_taken(client.get()) && send_text(client.get(), piece));
+            }
+            ASSERT_TRUE(daemon_.wait_log(each.logged, before)) << daemon_.log().substr(before);
+            ASSERT_TRUE(each.reply.empty() || receive_text(client.get()) == each.reply);
+            ASSERT_TRUE(kind == datagram || is_served(client.get(), kind));
         }
-        if (each.logged == answered) {
-            EXPECT_EQ(receive_text(client.get()), each.reply);
-        } else {
-            EXPECT_TRUE(daemon_.wait_log(each.logged, before)) << daemon_.log().substr(before);
-        }
-        ASSERT_EQ(ask(client.get(), "HD 2 IA"), "1");
     }
-    descriptors_ += 1;  // this client's
     expect_nothing_kept();
 }
 
 // Whether the kernel refuses them to the sender or hands them over.
 void attach_descriptors() {
-    alignas(cmsghdr) std::array<char, CMSG_SPACE(253 * sizeof(int))> control = {};
+    const unique_fd attached(open(".", O_RDONLY | O_CLOEXEC));
+    std::array<int, 253> copies;
+    copies.fill(attached.get());
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof copies)> control = {};
     for (const socket_kind kind : all_kinds) {
         const unique_fd client = connect_client(kind);
         std::string text = kind == stream ? framed("EV p n x") : "EV p n x";
@@ -153,10 +139,12 @@ void attach_descriptors() {
         message.msg_control = control.data();
         message.msg_controllen = control.size();
         cmsghdr* const header = CMSG_FIRSTHDR(&message);
-        *header = {CMSG_LEN(253 * sizeof(int)), SOL_SOCKET, SCM_RIGHTS};
-        memset(CMSG_DATA(header), 0, 253 * sizeof(int));  // standard input, 253 times
+        *header = {CMSG_LEN(sizeof copies), SOL_SOCKET, SCM_RIGHTS};
+        memcpy(CMSG_DATA(header), copies.data(), sizeof copies);
         for (int i = 0; i < 300; ++i) {
-            EXPECT_TRUE(sendmsg(client.get(), &message, MSG_NOSIGNAL) > 0 || errno == EPERM);
+            EXPECT_TRUE(sendmsg(client.get(), &message, MSG_NOSIGNAL) > 0 || errno == EPERM ||
+                        errno == ETOOMANYREFS)
+                << strerror(errno);
         }
     }
 }
@@ -232,7 +220,7 @@ void hang_up_during_a_flush() {
 }
 
 void many_at_once() {
-    std::vector<unique_fd> clients(2000);
+    std::vector<unique_fd> clients(500);
     for (unique_fd& each : clients) each = connect_client(packets);
     for (const unique_fd& each : clients) EXPECT_TRUE(send_text(each.get(), "IA"));
     for (const unique_fd& each : clients) EXPECT_EQ(receive_text(each.get()), "1");
@@ -262,6 +250,7 @@ TEST_F(hostile, nothing_that_a_client_does_harms_the_others_or_stays) {
         each.act();
         EXPECT_TRUE(daemon_.wait_log(each.logged, before)) << daemon_.log().substr(before);
         expect_nothing_kept();
+        if (HasFailure()) return;  // what follows would only wait
     }
     EXPECT_TRUE(daemon_.wait_idle());
     EXPECT_EQ(daemon_.stop(), 0) << daemon_.log();

@@ -84,7 +84,7 @@ TEST_F(permission, strangers_are_refused_every_privileged_request_on_every_socke
         EXPECT_EQ(ask_as(stranger, kind, requests), kind == datagram ? "" : "1");
         ++sockets;
         for (const auto& each : privileged) {
-            EXPECT_TRUE(wait_until([&] { return daemon.count_in_log(each.refusal) == sockets; }))
+            ASSERT_TRUE(wait_until([&] { return daemon.count_in_log(each.refusal) == sockets; }))
                 << each.refusal;
         }
     }
@@ -109,11 +109,11 @@ TEST_F(permission, own_user_and_root_are_obeyed_on_every_socket) {
             SCOPED_TRACE(testing::Message() << caller << " " << static_cast<int>(kind));
             EXPECT_EQ(ask_as(caller, kind, {"GD"}).size(), kind == datagram ? 0U : 37U);
             (void)ask_as(caller, kind, {"EV p event x", "CI p counter 1", "FL", "FS", "DC 0"});
-            EXPECT_TRUE(wait_until(is_saved("data-collection: 0")));
+            ASSERT_TRUE(wait_until(is_saved("data-collection: 0")));
             (void)wait_report(1);
             EXPECT_TRUE(std::filesystem::remove("private/counters.txt"));
             (void)ask_as(caller, kind, {"RM 1", "DC 1"});
-            EXPECT_TRUE(wait_until(is_saved("data-collection: 1")));
+            ASSERT_TRUE(wait_until(is_saved("data-collection: 1")));
             EXPECT_FALSE(exists("output/kiv_1"));
         }
     }

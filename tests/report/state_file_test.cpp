@@ -49,6 +49,7 @@ TEST_F(state_file, odd_lines_cost_no_more_than_their_value) {
         {"report-max-size: 4294967295", "report-max-size: 2147483647"},
         {"report-max-size: -1", "report-max-size: -1"},
         {"data-collection: 12", "data-collection: 1"},
+        {"data-collection: 01", "data-collection: 0"},
         {"error_nr: 99999999999", "error_nr: 2147483647"},
         {"error_time: -99999999999", "error_time: -2147483648"},
         {"group_id: A\ngroup_id: A\ngroup_id:\ngroup_id: B", "group_id: A\ngroup_id: B"},

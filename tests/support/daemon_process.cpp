@@ -1,5 +1,6 @@
 #include "support/daemon_process.h"
 
+#include <fcntl.h>
 #include <linux/sockios.h>
 #include <poll.h>
 #include <sys/ioctl.h>
@@ -36,10 +37,11 @@ void become(const start_options& options, char* const* arguments, int output, in
         const rlimit limit = {options.descriptor_limit, options.descriptor_limit};
         (void)setrlimit(RLIMIT_NOFILE, &limit);
     }
+    const int program = open(arguments[0], O_PATH | O_CLOEXEC);  // others may not see where it is
     if (options.uid != 0 && (setgid(options.uid) != 0 || setuid(options.uid) != 0)) _exit(126);
     (void)prctl(PR_SET_PDEATHSIG, SIGKILL);
     if (dup2(output, STDOUT_FILENO) < 0 || dup2(log, STDERR_FILENO) < 0) _exit(126);
-    (void)execv(arguments[0], arguments);
+    (void)fexecve(program, arguments, environ);
     _exit(127);
 }
 
