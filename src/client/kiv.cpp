@@ -307,9 +307,7 @@ kiv_handle* kiv_create_from_path(const char* directory) {
     return nullptr;
 }
 
-kiv_handle* kiv_create(void) {
-    return kiv_create_from_path(KIV_DEFAULT_DIRECTORY);
-}
+kiv_handle* kiv_create(void) { return kiv_create_from_path(KIV_DEFAULT_DIRECTORY); }
 
 void kiv_destroy(kiv_handle* handle) {
     if (handle == nullptr) return;
@@ -356,21 +354,15 @@ int kiv_set_static_data(kiv_handle* handle, const char* package, const char* nam
     return produce(*handle, {"SD ", package, " ", name, " ", value});
 }
 
-int kiv_is_alive(kiv_handle* handle) {
-    return control(*handle, access::open, nullptr);
-}
+int kiv_is_alive(kiv_handle* handle) { return control(*handle, access::open, nullptr); }
 
 int kiv_get_device_id(kiv_handle* handle, char* device_id) {
     return control(*handle, access::privileged, nullptr, device_id);
 }
 
-int kiv_flush(kiv_handle* handle) {
-    return control(*handle, access::privileged, {"FL"});
-}
+int kiv_flush(kiv_handle* handle) { return control(*handle, access::privileged, {"FL"}); }
 
-int kiv_save(kiv_handle* handle) {
-    return control(*handle, access::privileged, {"FS"});
-}
+int kiv_save(kiv_handle* handle) { return control(*handle, access::privileged, {"FS"}); }
 
 int kiv_set_data_collection(kiv_handle* handle, int on) {
     return control(*handle, access::privileged, {"DC ", on != 0 ? "1" : "0"});

@@ -6,7 +6,7 @@
 
 namespace kivd {
 
-inline constexpr uint32_t default_max_report_size = 409600;      // bytes
+inline constexpr uint32_t default_max_report_size = 409600;       // bytes
 inline constexpr uint32_t default_max_output_dir_size = 5242880;  // bytes
 inline constexpr uint32_t default_expire_age = 2592000;           // seconds; 30 days
 

@@ -14,7 +14,7 @@ namespace kivd {
 // A text of at most `limit` characters; longer ones are cut.
 template <size_t limit>
 class limited_text {
-   public:
+ public:
     static constexpr size_t capacity = limit;
 
     void set(std::string_view text) {
@@ -29,7 +29,7 @@ class limited_text {
     bool operator==(const limited_text& other) const { return strcmp(get(), other.get()) == 0; }
     bool operator==(std::string_view text) const { return get() == text; }
 
-   private:
+ private:
     std::array<char, limit + 1> text_ = {};
 };
 

@@ -19,12 +19,12 @@ constexpr size_t line_size = 256;
 constexpr size_t cdf_id_limit = 62;
 
 class property {
-   public:
+ public:
     explicit property(const char* name) { property_get(name, value_, "unknown"); }
     [[nodiscard]] bool is_known() const { return get() != "unknown"; }
     [[nodiscard]] std::string_view get() const { return value_; }
 
-   private:
+ private:
     char value_[PROPERTY_VALUE_MAX];
 };
 
@@ -40,8 +40,8 @@ void set_cdf_id(header_record& candidate) {
     if (!revision.is_known()) return candidate.cdf_id.set(customisation.get());
 
     char text[2 * PROPERTY_VALUE_MAX];
-    const int size = snprintf(text, sizeof text, "%s_%s", customisation.get().data(),
-                              revision.get().data());
+    const int size =
+        snprintf(text, sizeof text, "%s_%s", customisation.get().data(), revision.get().data());
     candidate.cdf_id.set(std::string_view(text, static_cast<size_t>(size)).substr(0, cdf_id_limit));
 }
 

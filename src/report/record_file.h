@@ -27,7 +27,7 @@ void rescue_event_file(const char* path, record_header header);
 // Appends records to a file, several at a time. Records that cannot be written are left out whole:
 // the file then ends at the record before them, and later ones are tried again.
 class record_appender {
-   public:
+ public:
     // `fd`, which stays the caller's, is open for appending and stands at its end.
     record_appender(int fd, uint64_t file_size) : fd_(fd), file_size_(file_size) {}
 
@@ -38,7 +38,7 @@ class record_appender {
     // Writes what has been taken.
     void flush(const char* store_tag);
 
-   private:
+ private:
     int fd_;
     uint64_t file_size_;  // whole records so far
     std::array<uint8_t, 8192> buffer_;

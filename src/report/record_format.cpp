@@ -22,13 +22,11 @@ size_t size_of_text(std::string_view text) {
 size_t size_of_number(int64_t value) { return 1 + varint64_size(static_cast<uint64_t>(value)); }
 
 // Size of a whole record whose message has `size` bytes.
-size_t size_of_record(size_t size) {
-    return 1 + varint32_size(static_cast<uint32_t>(size)) + size;
-}
+size_t size_of_record(size_t size) { return 1 + varint32_size(static_cast<uint32_t>(size)) + size; }
 
 // Writes fields one behind the other. The caller has made sure that they fit.
 class field_writer {
-   public:
+ public:
     explicit field_writer(std::span<uint8_t> buffer) : start_(buffer.data()), next_(start_) {}
 
     void head(uint8_t field, size_t size) {
@@ -47,7 +45,7 @@ class field_writer {
     }
     [[nodiscard]] size_t size() const { return static_cast<size_t>(next_ - start_); }
 
-   private:
+ private:
     uint8_t* start_;
     uint8_t* next_;
 };
@@ -130,8 +128,8 @@ size_t pack_crypto_fields(std::span<uint8_t> buffer, const uint8_t* encrypted_ke
                           uint32_t key_bits, std::span<const uint8_t> iv,
                           uint32_t ciphertext_size) {
     const size_t key_size = key_bits / 8;
-    const size_t size = size_of_record(key_size) + size_of_record(iv.size()) + 1 +
-                        varint32_size(ciphertext_size);
+    const size_t size =
+        size_of_record(key_size) + size_of_record(iv.size()) + 1 + varint32_size(ciphertext_size);
     if (size > buffer.size()) return 0;
 
     field_writer writer(buffer);

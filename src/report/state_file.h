@@ -1,5 +1,5 @@
-// private/kivd.state: the values that are remembered across restarts and kept nowhere else. Three of
-// them live here; the others belong to the header record, the limits and the error facility.
+// private/kivd.state: the values that are remembered across restarts and kept nowhere else. Three
+// of them live here; the others belong to the header record, the limits and the error facility.
 #pragma once
 
 #include <array>

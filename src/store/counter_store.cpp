@@ -81,7 +81,8 @@ void counters_update(const char* package, const char* name, int32_t value, count
     const int64_t now = now_ms();
     if (void* const found = list_find(*clist_p, &key)) {
         auto& counter = *static_cast<counter_entry*>(found);
-        const auto base = mode == counter_mode::increment ? static_cast<uint64_t>(counter.value) : 0;
+        const auto base =
+            mode == counter_mode::increment ? static_cast<uint64_t>(counter.value) : 0;
         counter.value = static_cast<int64_t>(base + static_cast<uint64_t>(int64_t{value}));
         counter.to_timestamp = now;
         counters_dirty = true;

@@ -19,7 +19,7 @@ constexpr char terminator[] = {'\0', '\0', '\n'};
 
 // A window on the file that always shows the next `max_record_size` bytes, or all that are left.
 class record_window {
-   public:
+ public:
     explicit record_window(FILE* file) : file_(file) {}
 
     const char* start() const { return bytes_.data() + start_; }
@@ -29,7 +29,7 @@ class record_window {
     }
     void step(size_t size) { start_ += size; }
 
-   private:
+ private:
     void refill() {
         memmove(bytes_.data(), start(), end_ - start_);
         end_ -= start_;

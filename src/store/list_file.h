@@ -31,14 +31,14 @@ int list_load(sorted_list& list, const char* path, list_parse_fn parse, void* co
 
 // Writes the fields of one record. Buffered by the stream, so a failure may show only later.
 class record_writer {
-   public:
+ public:
     explicit record_writer(FILE* file) : file_(file) {}
     void text(std::string_view field);
     void number(int64_t field);
     // Ends the record; false, with errno set, when any of its bytes could not be written.
     [[nodiscard]] bool finish();
 
-   private:
+ private:
     void put(const char* bytes, size_t size);
 
     FILE* file_;

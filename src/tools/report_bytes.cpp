@@ -11,9 +11,7 @@ constexpr int gzip_only = 16 + MAX_WBITS;
 constexpr Bytef gzip_magic[] = {0x1f, 0x8b};
 constexpr size_t piece_size = 65536;
 
-std::string number(uint64_t value) {
-    return std::to_string(value);
-}
+std::string number(uint64_t value) { return std::to_string(value); }
 }  // namespace
 
 report_bytes::report_bytes(const std::string& path) : file_(fopen(path.c_str(), "re")) {

@@ -26,9 +26,7 @@ constexpr utf8_lead leads[] = {
 };
 // clang-format on
 
-uint8_t byte_at(std::string_view text, size_t index) {
-    return static_cast<uint8_t>(text[index]);
-}
+uint8_t byte_at(std::string_view text, size_t index) { return static_cast<uint8_t>(text[index]); }
 
 bool is_tail(std::string_view text, const utf8_lead& lead) {
     if (text.size() < lead.length) return false;

@@ -20,16 +20,13 @@ int64_t parse_int64(const char* text) {
 
 int32_t saturate_int32(int64_t value) {
     using limits = std::numeric_limits<int32_t>;
-    return static_cast<int32_t>(
-        std::clamp(value, int64_t{limits::min()}, int64_t{limits::max()}));
+    return static_cast<int32_t>(std::clamp(value, int64_t{limits::min()}, int64_t{limits::max()}));
 }
 
 int32_t parse_saturated(const char* text) {
     return saturate_int32(strtoll(text, nullptr, 10));  // strtoll saturates by itself
 }
 
-char* format_int64(char* out, int64_t value) {
-    return std::to_chars(out, out + 20, value).ptr;
-}
+char* format_int64(char* out, int64_t value) { return std::to_chars(out, out + 20, value).ptr; }
 
 }  // namespace kivd

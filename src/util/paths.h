@@ -25,7 +25,7 @@ inline constexpr char header_info[] = "private/header_info.conf";
 inline constexpr char flushed_data[] = "private/flushed_data";
 inline constexpr char compacted_data[] = "private/flushed_data.compacted";
 
-inline constexpr char report_prefix[] = "kiv_";                   // and a number, in output_dir
+inline constexpr char report_prefix[] = "kiv_";                  // and a number, in output_dir
 inline constexpr char config_request_name[] = "config_request";  // in output_dir
 inline constexpr char disable_marker[] = "output/kiv_disabled";
 

@@ -23,7 +23,7 @@ using unique_malloc = std::unique_ptr<type, releaser<free>>;
 
 // Owns a descriptor; -1 is none.
 class unique_fd {
-   public:
+ public:
     explicit unique_fd(int fd = -1) noexcept : fd_(fd) {}
     unique_fd(unique_fd&& other) noexcept : fd_(other.release()) {}
     unique_fd& operator=(unique_fd&& other) noexcept {
@@ -37,7 +37,7 @@ class unique_fd {
     [[nodiscard]] int release() noexcept { return std::exchange(fd_, -1); }
     void reset(int fd = -1) noexcept;  // closes once, not again after EINTR; keeps errno
 
-   private:
+ private:
     int fd_;
 };
 

@@ -127,8 +127,6 @@ inline control_server::answer_function allowing(std::string device_id) {
 }
 
 // What a daemon answers to a caller without permission.
-inline control_server::answer_function refusing() {
-    return allowing("");
-}
+inline control_server::answer_function refusing() { return allowing(""); }
 
 }  // namespace kivd

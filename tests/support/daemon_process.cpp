@@ -137,13 +137,9 @@ int daemon_process::stop() {
     return wait_exit();
 }
 
-std::string daemon_process::output() const {
-    return read_from_start(output_.get());
-}
+std::string daemon_process::output() const { return read_from_start(output_.get()); }
 
-std::string daemon_process::log() const {
-    return read_from_start(log_.get());
-}
+std::string daemon_process::log() const { return read_from_start(log_.get()); }
 
 bool daemon_process::wait_log(std::string_view text, size_t from) const {
     return wait_until([&] { return log().find(text, from) != std::string::npos; });

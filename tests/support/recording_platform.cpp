@@ -25,9 +25,7 @@ lines take_log() {
 void log_to_system() {}
 void log_forget_descriptor() {}
 
-bool check_permission(const char*, pid_t, uid_t) {
-    return permission_answer;
-}
+bool check_permission(const char*, pid_t, uid_t) { return permission_answer; }
 
 extern "C" int __android_log_print(int priority, const char* tag, const char* format, ...) {
     char text[2048];

@@ -93,9 +93,7 @@ std::string read_file(const std::string& path) {
     return bytes.str();
 }
 
-bool exists(const std::string& path) {
-    return fs::exists(fs::symlink_status(path));
-}
+bool exists(const std::string& path) { return fs::exists(fs::symlink_status(path)); }
 
 std::string doc_example(const std::string& file, const std::string& kind, const std::string& name) {
     const std::string text = read_file(SOURCE_DIRECTORY "/docs/" + file);

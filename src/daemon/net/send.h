@@ -1,8 +1,8 @@
 // Sending to clients.
 #pragma once
 
-#include <cstddef>
 #include <sys/types.h>
+#include <cstddef>
 
 namespace kivd {
 

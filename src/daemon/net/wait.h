@@ -12,7 +12,7 @@ namespace kivd {
 // While it lives, a timer cuts short whatever blocks for more than a second. It does so only where
 // the kernel cannot refuse descriptors that clients attach: letting go of those may block.
 class stall_guard {
-   public:
+ public:
     stall_guard();
     ~stall_guard();
     stall_guard(const stall_guard&) = delete;

@@ -38,7 +38,8 @@ std::optional<ucred> peer_of(int fd) {
 }  // namespace
 
 bool check_caller_permission(const request& r) {
-    const std::optional<ucred> caller = r.message != nullptr ? sender_of(*r.message) : peer_of(r.fd);
+    const std::optional<ucred> caller =
+        r.message != nullptr ? sender_of(*r.message) : peer_of(r.fd);
     if (!caller) return false;
     return caller->uid == getuid() ||
            check_permission(private_permission, caller->pid, caller->uid);

@@ -8,15 +8,15 @@
 
 namespace kivd {
 
-size_t flush(request& r);                       // FL
-size_t force_save(request& r);                  // FS
-size_t read_device_id(request& r);              // GD
-size_t switch_data_collection(request& r);      // DC
-size_t remove_report(request& r);               // RM
-size_t accept_serial_number(request& r);        // SN
-size_t accept_imei(request& r);                 // IM
-size_t add_group(request& r);                   // SG
-size_t delete_group(request& r);                // DG
-size_t replace_group(request& r);               // RG
+size_t flush(request& r);                   // FL
+size_t force_save(request& r);              // FS
+size_t read_device_id(request& r);          // GD
+size_t switch_data_collection(request& r);  // DC
+size_t remove_report(request& r);           // RM
+size_t accept_serial_number(request& r);    // SN
+size_t accept_imei(request& r);             // IM
+size_t add_group(request& r);               // SG
+size_t delete_group(request& r);            // DG
+size_t replace_group(request& r);           // RG
 
 }  // namespace kivd

@@ -18,7 +18,7 @@ constexpr char tag[] = "kivd";
 
 struct command {
     std::string_view name;
-    size_t (*run)(request&);    // gives the length of the reply, 0 for none
+    size_t (*run)(request&);     // gives the length of the reply, 0 for none
     bool only_while_collecting;  // ignored in silence while data collection is off
     const char* refusal;         // logged when permission is lacking; null: open to all
 };

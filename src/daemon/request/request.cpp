@@ -61,8 +61,8 @@ bool take_probe_id(request& r, const char* command, probe_id& probe) {
 
 bool check_probe_value(const char* command, const probe_id& probe, const char* value) {
     if (value != nullptr && *value != '\0') return true;
-    (void)log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command,
-                        probe.package, probe.name);
+    (void)log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command, probe.package,
+                        probe.name);
     return false;
 }
 
