@@ -40,9 +40,7 @@ unique_fd connect_to(int type, const std::string& path) {
 }
 
 // The length of a varint of a value below 2^14.
-size_t varint_size(size_t value) {
-    return value < 0x80 ? 1 : 2;
-}
+size_t varint_size(size_t value) { return value < 0x80 ? 1 : 2; }
 
 }  // namespace
 
@@ -68,9 +66,7 @@ unique_fd connect_control(const std::string& directory) {
     return connect_to(SOCK_SEQPACKET, directory + "/kiv_co");
 }
 
-void order(int fd, std::string_view request) {
-    send_packet(fd, request);
-}
+void order(int fd, std::string_view request) { send_packet(fd, request); }
 
 std::string ask(int fd, std::string_view request) {
     send_packet(fd, request);
@@ -93,9 +89,7 @@ std::string increment_packet(unsigned number) {
     return packet;
 }
 
-size_t event_payload_offset() {
-    return sizeof event_prefix - 1;
-}
+size_t event_payload_offset() { return sizeof event_prefix - 1; }
 
 size_t event_head_size(size_t payload_size) {
     // Package and name with key and length, a timestamp of six bytes, the payload's length.

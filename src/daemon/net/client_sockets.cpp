@@ -50,7 +50,10 @@ int create_socket(int type, const char* name) {
     if (type == SOCK_DGRAM) {  // before the first packet can arrive
         set_socket_timeouts(fd.get());
         const int on = 1;
-        (void)setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
+        // Without them the room for credentials would take descriptors instead.
+        if (setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) {
+            give_up("receive credentials");
+        }
     }
 
     sockaddr_un address = {};
