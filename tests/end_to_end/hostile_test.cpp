@@ -176,7 +176,7 @@ void close_on_unread_replies() {
 
 void send_out_of_band() {
     const unique_fd client = connect_client(stream);
-    EXPECT_EQ(send(client.get(), "HD", 2, MSG_OOB), 2);
+    EXPECT_EQ(send(client.get(), "X", 1, MSG_OOB), 1);
     expect_service();
     EXPECT_EQ(ask(client.get(), "HD 2 IA"), "1");
 }
@@ -238,7 +238,7 @@ TEST_F(hostile, nothing_that_a_client_does_harms_the_others_or_stays) {
         {"close before the reply", close_before_the_reply, "failed to send to client"},
         {"close on unread replies", close_on_unread_replies,
          "E kivd: recvfrom() error from client"},
-        {"out of band", send_out_of_band, ""},
+        {"out of band", send_out_of_band, "Invalid packet for stream from client"},
         {"trickling sender", trickle, "Incomplete packet for stream from client"},
         {"replies never read", never_read_replies, "E kivd: receive_seq_client: failed to send to"},
         {"hang-up during a flush", hang_up_during_a_flush, "Generating Report..."},
@@ -261,16 +261,20 @@ TEST_F(hostile, clients_that_take_all_descriptors_leave_it_enough_to_work_with) 
     const unique_fd early = connect_client(packets);
     ASSERT_EQ(ask(early.get(), "IA"), "1");
     std::vector<unique_fd> clients(200);
-    for (unique_fd& each : clients) each = connect_client(stream);
-    EXPECT_TRUE(daemon_.wait_log("E kivd: Accept failed: Too many open files."));
-    EXPECT_TRUE(daemon_.wait_idle());
+    for (unique_fd& each : clients) {
+        each = connect_client(stream);
+        ASSERT_TRUE(each.ok());
+    }
+    ASSERT_TRUE(daemon_.wait_log("E kivd: Accept failed: Too many open files."));
+    ASSERT_TRUE(daemon_.wait_idle());
 
     for (const char* request : {"CI p counter 1", "EV p event x", "SG group", "FS", "FL"}) {
         ASSERT_TRUE(send_text(early.get(), request));
     }
-    EXPECT_EQ(ask(early.get(), "IA"), "1");
-    EXPECT_TRUE(exists("private/counters.txt"));
+    ASSERT_EQ(ask(early.get(), "IA"), "1");
+    ASSERT_TRUE(exists("private/counters.txt"));
     const kiv::Report report = wait_report(1);
+    ASSERT_FALSE(HasFailure());
     EXPECT_EQ(report.counters(report.counters_size() - 1).name(), "counter");
     EXPECT_EQ(report.events(report.events_size() - 1).name(), "event");
     EXPECT_EQ(ask(clients.front().get(), "HD 2 IA"), "1");
