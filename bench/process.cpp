@@ -132,6 +132,16 @@ scratch_directory::~scratch_directory() {
     (void)std::filesystem::remove_all(path_, ignored);
 }
 
+pinned_thread::pinned_thread(pid_t pid, int processor) : pid_(pid), before_() {
+    (void)sched_getaffinity(pid_, sizeof before_, &before_);
+    cpu_set_t one;
+    CPU_ZERO(&one);
+    CPU_SET(processor, &one);
+    (void)sched_setaffinity(pid_, sizeof one, &one);
+}
+
+pinned_thread::~pinned_thread() { (void)sched_setaffinity(pid_, sizeof before_, &before_); }
+
 int64_t process_cpu_ns(pid_t pid) {
     int64_t sum = 0;
     std::error_code error;

@@ -1,6 +1,7 @@
 // Child processes and what the kernel says about them.
 #pragma once
 
+#include <sched.h>
 #include <sys/types.h>
 
 #include <cstdint>
@@ -47,6 +48,20 @@ class scratch_directory {
 
  private:
     std::string path_;
+};
+
+// Keeps the first thread of a process (0: this thread) and what it starts from now on on one
+// processor while in scope. With a single processor there is no choice and nothing happens.
+class pinned_thread {
+ public:
+    pinned_thread(pid_t pid, int processor);
+    pinned_thread(const pinned_thread&) = delete;
+    pinned_thread& operator=(const pinned_thread&) = delete;
+    ~pinned_thread();
+
+ private:
+    pid_t pid_;
+    cpu_set_t before_;
 };
 
 // CPU time of all threads, user and system, in ns, with the scheduler's own precision; without the
