@@ -15,11 +15,15 @@ namespace {
 
 constexpr char tag[] = "kivd";
 
-// Takes the next token; a missing one is logged with `complaint` and raised.
-const char* take_argument(request& r, const char* complaint) {
+// Calls `act` with the next token; a missing one is logged with `complaint` and raised. No reply.
+size_t with_argument(request& r, const char* complaint, void (*act)(const char*)) {
     const char* const argument = next_token(r);
-    if (argument == nullptr) (void)log_and_raise(tag, "%s", complaint);
-    return argument;
+    if (argument != nullptr) {
+        act(argument);
+    } else {
+        (void)log_and_raise(tag, "%s", complaint);
+    }
+    return 0;
 }
 
 }  // namespace
@@ -42,49 +46,39 @@ size_t read_device_id(request& r) {
 }
 
 size_t switch_data_collection(request& r) {
-    const char* const value = take_argument(r, "Enable/disable data collection without value.");
-    if (value == nullptr) return 0;
-    set_data_collection(parse_saturated(value) != 0);
-    config_save();
-    return 0;
+    return with_argument(r, "Enable/disable data collection without value.", [](const char* value) {
+        set_data_collection(parse_saturated(value) != 0);
+        config_save();
+    });
 }
 
 size_t remove_report(request& r) {
-    const char* const number = take_argument(r, "Remove report without number.");
-    if (number != nullptr) delete_reports(parse_saturated(number));
-    return 0;
+    return with_argument(r, "Remove report without number.",
+                         [](const char* number) { delete_reports(parse_saturated(number)); });
 }
 
 size_t accept_serial_number(request& r) {
-    const char* const number = take_argument(r, "set_serial_number without value.");
-    if (number != nullptr) set_serial_number(number);
-    return 0;
+    return with_argument(r, "set_serial_number without value.", set_serial_number);
 }
 
-size_t accept_imei(request& r) {
-    const char* const imei = take_argument(r, "set_imei without value.");
-    if (imei != nullptr) set_imei(imei);
-    return 0;
-}
+size_t accept_imei(request& r) { return with_argument(r, "set_imei without value.", set_imei); }
 
 size_t add_group(request& r) {
-    const char* const id = take_argument(r, "set_group_id without value.");
-    if (id != nullptr) set_group_id(id);
-    return 0;
+    return with_argument(r, "set_group_id without value.", set_group_id);
 }
 
 size_t delete_group(request& r) {
-    const char* const id = take_argument(r, "delete_group_id without value.");
-    if (id != nullptr) delete_group_id(id);
-    return 0;
+    return with_argument(r, "delete_group_id without value.", delete_group_id);
 }
 
 size_t replace_group(request& r) {
-    constexpr char complaint[] = "replace_group_id without valid value.";
-    const char* const new_id = take_argument(r, complaint);
-    if (new_id == nullptr) return 0;
-    const char* const old_id = take_argument(r, complaint);
-    if (old_id != nullptr) replace_group_id(new_id, old_id);
+    const char* const new_id = next_token(r);
+    const char* const old_id = next_token(r);
+    if (new_id != nullptr && old_id != nullptr) {
+        replace_group_id(new_id, old_id);
+    } else {
+        (void)log_and_raise(tag, "replace_group_id without valid value.");
+    }
     return 0;
 }
 
