@@ -223,21 +223,6 @@ class senders {
     std::vector<std::jthread> threads_;
 };
 
-TEST_F(libkiv, every_thread_finds_the_restarted_daemon_even_from_a_wait_for_room) {
-    kiv_set_wait(handle.get(), 20'000);
-    const senders four(handle.get(), 4);
-    for (int restarts = 0; restarts < 20; ++restarts) {
-        std::set<std::string> heard;
-        while (heard.size() < 4) {
-            const auto message = producer_socket->receive();
-            ASSERT_TRUE(message) << restarts;
-            heard.insert(parse_counted(*message).first);
-        }
-        restart();
-    }
-    producer_socket.reset();  // nobody waits for room any more
-}
-
 TEST_F(libkiv, both_sides_of_a_fork_go_on_whatever_other_threads_do) {
     constexpr int child_count = 20;
     kiv_set_wait(handle.get(), 20'000);
@@ -264,33 +249,6 @@ TEST_F(libkiv, both_sides_of_a_fork_go_on_whatever_other_threads_do) {
         EXPECT_EQ(status, 0);
     }
     producer_socket.reset();
-}
-
-TEST_F(libkiv, both_sides_of_a_fork_find_the_restarted_daemon) {
-    int gate[2];
-    ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM, 0, gate), 0);
-    char byte = 0;
-    const pid_t child = fork();
-    if (child == 0) {
-        alarm(30);
-        producer_socket.reset();  // or the first daemon's socket would live on here
-        const bool is_told = write(gate[1], "x", 1) == 1 && read(gate[1], &byte, 1) == 1;
-        _exit(is_told && send_counted(handle.get(), "child", 1) == 0 ? 0 : 1);
-    }
-    EXPECT_EQ(read(gate[0], &byte, 1), 1);
-    restart();
-    EXPECT_EQ(send_counted(handle.get(), "parent", 1), 0);
-    EXPECT_EQ(producer_socket->receive(), "EV parent n 1");
-    restart();
-    EXPECT_EQ(write(gate[0], "x", 1), 1);
-    EXPECT_EQ(producer_socket->receive(), "EV child n 1");
-    EXPECT_EQ(send_counted(handle.get(), "parent", 2), 0);
-    EXPECT_EQ(producer_socket->receive(), "EV parent n 2");
-    int status = -1;
-    EXPECT_EQ(waitpid(child, &status, 0), child);
-    EXPECT_EQ(status, 0);
-    close(gate[0]);
-    close(gate[1]);
 }
 
 // Every control call with what the daemon gets to see of it.
@@ -344,18 +302,6 @@ TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_a
     control_server server(directory.path, allowing("id"));
     EXPECT_EQ(kiv_set_group_id(handle.get(), longest.c_str()), 0);
     EXPECT_EQ(kiv_set_group_id(handle.get(), (longest + "g").c_str()), -EMSGSIZE);
-}
-
-TEST_F(libkiv, a_device_id_is_taken_up_to_its_longest) {
-    for (const size_t size : {1u, 40u, 41u}) {
-        SCOPED_TRACE(size);
-        const std::string id(size, 'i');
-        const control_server server(directory.path, allowing(id));
-        char buffer[KIV_DEVICE_ID_MAX + 1] = {};
-        const bool fits = size <= KIV_DEVICE_ID_MAX;
-        EXPECT_EQ(kiv_get_device_id(handle.get(), buffer), fits ? 0 : -EPROTO);
-        EXPECT_EQ(std::string(buffer), fits ? id : "");
-    }
 }
 
 TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {

@@ -105,23 +105,5 @@ TEST(kivctl, tells_a_refused_caller) {
     }
 }
 
-TEST(kivctl, gives_a_silent_daemon_up) {
-    const socket_directory directory;
-    const bound_socket producer_socket(SOCK_DGRAM, directory.path + "/kiv_cl");
-    const bound_socket control_socket(SOCK_SEQPACKET, directory.path + "/kiv_co");
-    listen(control_socket.fd(), 5);
-    const std::string base = "--timeout 50 --base " + directory.path;
-    const auto [status, output] = run_kivctl(base + " alive");
-    EXPECT_EQ(status, 3);
-    EXPECT_NE(output.find("within 50 ms"), std::string::npos) << output;
-
-    outcome event;
-    do {
-        event = run_kivctl(base + " event p n");
-    } while (event.status == 0);
-    EXPECT_EQ(event.status, 3);
-    EXPECT_NE(event.output.find("stayed full for 50 ms"), std::string::npos) << event.output;
-}
-
 }  // namespace
 }  // namespace kivd

@@ -58,19 +58,6 @@ TEST_F(handle_request, what_lacks_an_argument_is_named_and_dropped) {
     EXPECT_TRUE(next_packet().ends_with(doc_example("log.md", "hex", "daemon-error-flooding")));
 }
 
-TEST_F(handle_request, control_requests_take_effect_at_once) {
-    for (const char* packet :
-         {"SG a b", "SG c", "RG d a", "DG c", "SN 1", "IM 1", "CI p n 1", "FS"}) {
-        EXPECT_EQ(ask(packet), "");
-    }
-    EXPECT_TRUE(read_file("private/counters.txt").starts_with("p\0n\0"s));
-    EXPECT_EQ(ask("IA x") + ask("PA p n") + ask("GD").substr(8, 1), "11-");
-    EXPECT_EQ(contents(next_report()), "P1 d; n=1; ");
-    EXPECT_EQ(ask("EV p e x"), "");
-    EXPECT_EQ(ask("FL"), "I kivd-compactor: Generating Report...");
-    EXPECT_FALSE(exists("private/events"));
-}
-
 TEST_F(handle_request, without_data_collection_data_is_dropped_in_silence) {
     EXPECT_EQ(ask("DC none"), "");
     for (const char* packet : {"EV p n", "CS p", "CI p n 1", "SD p n v", "FL"}) {

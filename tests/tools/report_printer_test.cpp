@@ -120,18 +120,5 @@ TEST(report_summary, says_who_when_and_what) {
     expect_parts(text, {"app kind0", "app kind1 ", "app count5", "app count6"}, false);
 }
 
-TEST(report_summary, stands_hostile_times_and_sends_no_control_characters) {
-    const google::protobuf::LogSilencer silencer;
-    const std::string text =
-        summary_of(event_text("\\033[2J \\302\\2332J\\177\\r", INT64_MIN) +
-                   event_text("n", INT64_MAX) + static_text("n", "line\\nbreak"));
-    expect_parts(text, {"\x1b", "\x7f", "\r", "\xc2\x9b"}, false);
-    expect_parts(text,
-                 {"\\x1B[2J \\xC2\\x9B"
-                  "2J\\x7F\\x0D",
-                  "line\\x0Abreak", "-9223372036854775808 ms to 9223372036854775807 ms"},
-                 true);
-}
-
 }  // namespace
 }  // namespace kivd

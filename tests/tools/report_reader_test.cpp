@@ -98,30 +98,6 @@ TEST_F(report_reader, spoilt_bytes_end_the_reading_where_they_start) {
     }
 }
 
-TEST_F(report_reader, what_is_wrong_with_the_gzip_layer_is_told_too) {
-    const std::string good = sample();
-    const std::string packed = gzip(good);
-    std::string wrong_checksum = packed;
-    wrong_checksum[packed.size() - 8] ^= 1;
-    const struct {
-        std::string bytes;
-        const char* problem;
-    } cases[] = {
-        {packed + "garbage", "bytes that are not gzip data follow at byte "},
-        {packed + '\0', "bytes that are not gzip data follow at byte "},
-        {wrong_checksum, "the gzip data is damaged at byte "},
-        {packed + packed.substr(0, 12), "the gzip data is cut short at byte "},
-        // Members end to end are one gzip file, wherever the records are split.
-        {gzip(good.substr(0, 99)) + gzip("") + gzip(good.substr(99)), ""},
-    };
-    for (const auto& file_case : cases) {
-        const report_file file = read_report(write("kiv_1", file_case.bytes));
-        EXPECT_EQ(records_in(file.report), 5);
-        EXPECT_TRUE(says(file, file_case.problem)) << file.problem;
-        EXPECT_EQ(file.problem.empty(), file_case.problem[0] == '\0') << file.problem;
-    }
-}
-
 TEST_F(report_reader, a_file_without_records_is_told) {
     EXPECT_EQ(read_report(directory / "none").problem,
               "cannot be opened: No such file or directory");
