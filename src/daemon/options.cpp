@@ -4,23 +4,33 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 
 #include "config/limits.h"
+#include "daemon/error/daemon_error.h"
 #include "daemon/net/delays.h"
 #include "daemon/save_clock.h"
 #include "platform/android_log.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "security/debug_encrypt.h"
+#include "security/key_paths.h"
+#include "security/verify_config_command.h"
 #include "util/clock.h"
 #include "util/numbers.h"
+#include "util/paths.h"
 
 namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd";
+
+// Exit statuses of `--verify-config`.
+constexpr int verified_status = 42;
+constexpr int not_verified_status = 33;
 
 constexpr char usage[] =
     "Syntax: kivd [OPTIONS]\n"
@@ -38,7 +48,10 @@ constexpr char usage[] =
     "  -c, --cert-path        use certificates from this path. NO_ENCRYPTION to turn off "
     "encryption.\n";
 
-constexpr int socket_delays_option = 256;  // has no short letter
+// Options that have no short letter.
+constexpr int socket_delays_option = 256;
+constexpr int verify_config_option = 257;
+constexpr int encrypt_option = 258;
 
 constexpr option long_options[] = {
     {"verbose", no_argument, nullptr, 'v'},
@@ -52,6 +65,8 @@ constexpr option long_options[] = {
     {"enable-di", no_argument, nullptr, 'd'},
     {"enable-dc", no_argument, nullptr, 'C'},
     {"cert-path", required_argument, nullptr, 'c'},
+    {"verify-config", required_argument, nullptr, verify_config_option},
+    {"encrypt", required_argument, nullptr, encrypt_option},
     {"socket-delays", required_argument, nullptr, socket_delays_option},
     {nullptr, 0, nullptr, 0},
 };
@@ -63,10 +78,28 @@ void set_expire_age(const char* seconds) {
     values.expire_sdata_age = values.base_expire_sdata_age = age;
 }
 
-void check_certificate_path(const char* path) {
-    if (strcmp(path, "NO_ENCRYPTION") == 0 || access(path, F_OK) == 0) return;
-    __android_log_print(ANDROID_LOG_ERROR, tag, "Certificate path does not exist!");
-    exit(1);
+void set_certificate_path(const char* path) {
+    if (strcmp(path, "NO_ENCRYPTION") == 0) {
+        clear_report_key_path();
+        clear_config_key_path();
+        return;
+    }
+    if (access(path, F_OK) != 0) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Certificate path does not exist!");
+        exit(1);
+    }
+    set_report_key_dir(path);
+    set_config_key_dir(path);
+}
+
+// Where the files of the command-line operations are looked for; they go on where it fails.
+void enter_base_directory(const char* directory) {
+    if (chdir(directory) == 0) {
+        daemon_error_init(paths::working_dir);
+        return;
+    }
+    __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to chdir(%s), %s\n", directory,
+                        strerror(errno));
 }
 
 // "R" or "R:S", in milliseconds.
@@ -81,6 +114,8 @@ void set_socket_delays(const char* delays) {
 options parse_options(int argc, char** argv) {
     options given = {KIV_DEFAULT_DIRECTORY, true};
     bool help = false;
+    const char* verified_file = nullptr;
+    const char* encrypted_file = nullptr;
     int letter = 0;
     while ((letter = getopt_long(argc, argv, "vb:htDZs:dCe:c:", long_options, nullptr)) != -1) {
         switch (letter) {
@@ -111,7 +146,13 @@ options parse_options(int argc, char** argv) {
                 set_expire_age(optarg);
                 break;
             case 'c':
-                check_certificate_path(optarg);
+                set_certificate_path(optarg);
+                break;
+            case verify_config_option:
+                verified_file = optarg;
+                break;
+            case encrypt_option:
+                encrypted_file = optarg;
                 break;
             case socket_delays_option:
                 set_socket_delays(optarg);
@@ -123,6 +164,15 @@ options parse_options(int argc, char** argv) {
     if (help) {
         puts(usage);
         exit(2);
+    }
+    if (verified_file != nullptr) {
+        enter_base_directory(given.base_directory);
+        exit(verify_config_command(verified_file) ? verified_status : not_verified_status);
+    }
+    if (encrypted_file != nullptr) {
+        enter_base_directory(given.base_directory);
+        debug_encrypt(encrypted_file);
+        exit(0);
     }
     return given;
 }

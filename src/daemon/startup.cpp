@@ -13,7 +13,12 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "config/config_parts.h"
+#include "config/config_request.h"
+#include "config/filters.h"
+#include "config/intake.h"
 #include "config/limits.h"
+#include "config/run_actions.h"
 #include "daemon/error/child_process.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/event_loop.h"
@@ -28,8 +33,10 @@
 #include "report/record_file.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "security/key_paths.h"
 #include "store/counter_store.h"
 #include "store/static_store.h"
+#include "util/clock.h"
 #include "util/file_io.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -181,12 +188,18 @@ void load_everything() {
     (void)prune_dir();
     ensure_device_id();
     update_header_info();
+    write_config_request();
+    load_config_list();
+    if (!load_filters() && !is_test_mode()) install_first_configuration();
+    (void)take_new_configuration();
 }
 
 void release_all() {
     counters_free();
     sdata_free();
     free_header();
+    release_filters();
+    release_config_list();
 }
 
 void shut_down() {
@@ -208,6 +221,7 @@ int run_daemon(int argc, char** argv) {
     open_standard_descriptors();
     install_signal_handlers();
     init_settings();
+    set_default_key_paths();
     enter_working_directory(parse_options(argc, argv));
     check_disabled();
 
@@ -219,6 +233,7 @@ int run_daemon(int argc, char** argv) {
     if (event_loop_init() != 0) exit(1);
     create_client_sockets();
     mark_saved();
+    run_actions();
     __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the world.");
     event_loop_run();
 

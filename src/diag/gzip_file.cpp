@@ -69,7 +69,7 @@ int fu_gzip_file(const char* source, const char* destination, gzip_level level) 
         (void)log_and_raise(tag, "Failed to open input file: %s", strerror(errno));
         return 0;
     }
-    const unique_fd output(open(destination, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
+    const unique_fd output = create_file(destination);
     z_stream stream = {};
     const deflate_settings settings = settings_of(level);
     if (!output.ok() ||

@@ -14,7 +14,9 @@
 #include "report/header_sources.h"
 #include "report/output_dir.h"
 #include "report/record_file.h"
+#include "report/report_sealing.h"
 #include "report/state_file.h"
+#include "security/key_paths.h"
 #include "store/counter_store.h"
 #include "store/event_store.h"
 #include "store/static_store.h"
@@ -84,6 +86,7 @@ int compact_report() {
     if (fu_gzip_file(paths::flushed_data, paths::compacted_data, compression) == 0) {
         return log_and_raise(tag, "Failed to compact file");
     }
+    if (report_key_available() && seal_compacted_data() != 0) return -1;
     const report_path report(next_report_number(highest));
     if (rename(paths::compacted_data, report.text) != 0) {
         return log_and_raise(tag, "Failed to rename output file: %s", strerror(errno));

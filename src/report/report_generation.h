@@ -1,6 +1,7 @@
 // Making a report. The flush is short and runs in the caller: it moves the event file away, appends
 // the counters and static data that changed, and moves last-flush forward. The compactor, a child
-// process, compresses the result and leaves it in output/ as the next numbered report.
+// process, compresses the result, seals it when a report key is installed, and leaves it in output/
+// as the next numbered report.
 #pragma once
 
 namespace kivd {

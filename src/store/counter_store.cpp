@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstring>
 
+#include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/error/log_and_raise.h"
@@ -77,6 +78,7 @@ void counters_init() {
 }
 
 void counters_update(const char* package, const char* name, int32_t value, counter_mode mode) {
+    if (!filter_match(filter_kind::counters, package, name)) return;
     const probe_key key = {package, name};
     const int64_t now = now_ms();
     if (void* const found = list_find(*clist_p, &key)) {

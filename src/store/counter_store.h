@@ -15,6 +15,7 @@ enum class counter_mode : uint8_t { set, increment };
 void counters_init();
 
 // Sets the counter to `value` or adds it (the sum wraps); an unknown counter is created with it.
+// A counter that the filter refuses is left as it is.
 void counters_update(const char* package, const char* name, int32_t value, counter_mode mode);
 
 // Writes private/counters.txt when something changed since the last good save. Failures have been

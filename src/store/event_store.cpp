@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/log_and_raise.h"
 #include "report/header_record.h"
@@ -77,6 +78,7 @@ void events_open() {
 }
 
 event_file events_add(const char* package, const char* name, std::span<const char> payload) {
+    if (!filter_match(filter_kind::events, package, name)) return event_file::open;
     events_open();
     if (events_fd < 0) return event_file::open;
     append_event(package, name, payload);

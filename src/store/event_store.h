@@ -13,7 +13,8 @@ enum class event_file : bool {
     full,  // it has reached the report size limit: a report is due
 };
 
-// Stores one event. Failures have been logged and raised; the event is then lost.
+// Stores one event, if the filter keeps it. Failures have been logged and raised; the event is then
+// lost.
 [[nodiscard]] event_file events_add(const char* package, const char* name,
                                     std::span<const char> payload);
 

@@ -1,5 +1,6 @@
 #include "store/list_file.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -125,8 +126,8 @@ bool record_writer::finish() {
     return ok_;
 }
 
-bool split_record(const char* record, const char* end, record_fields& fields) {
-    fields = {};
+bool split_record(const char* record, const char* end, std::span<const char*> fields) {
+    std::ranges::fill(fields, nullptr);
     const char* next = record;
     for (size_t i = 0; i < fields.size(); ++i) {
         if (i > 0 && next >= end) return false;

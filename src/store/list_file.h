@@ -7,6 +7,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
+#include <span>
 #include <string_view>
 
 #include "store/sorted_list.h"
@@ -50,6 +51,7 @@ using record_fields = std::array<const char*, 5>;
 
 // Finds the fields of a record; those that begin at or behind the terminator are null. True when
 // all are there and the last one ends exactly at the terminator.
-[[nodiscard]] bool split_record(const char* record, const char* terminator, record_fields& fields);
+[[nodiscard]] bool split_record(const char* record, const char* terminator,
+                                std::span<const char*> fields);
 
 }  // namespace kivd

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/error/log_and_raise.h"
@@ -97,6 +98,7 @@ void sdata_init() {
 }
 
 void sdata_set(const char* package, const char* name, const char* value) {
+    if (!filter_match(filter_kind::static_data, package, name)) return;
     const probe_key key = {package, name};
     const int64_t now = now_ms();
     if (void* const found = list_find(*sdlist_p, &key)) {

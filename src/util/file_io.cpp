@@ -44,6 +44,27 @@ int64_t get_file_size(FILE* file) {
     return size;
 }
 
+std::optional<file_bytes> read_whole_fd(unique_fd fd) {
+    struct stat status = {};
+    if (fstat(fd.get(), &status) != 0) return std::nullopt;
+    const auto size = static_cast<size_t>(status.st_size);
+    unique_malloc<uint8_t> data(static_cast<uint8_t*>(malloc(size + 1)));
+    if (!data) return std::nullopt;
+    size_t done = 0;
+    while (done < size) {
+        const ssize_t n = pread(fd.get(), data.get() + done, size - done, static_cast<off_t>(done));
+        if (n < 0 && errno == EINTR) continue;
+        if (n == 0) errno = EIO;  // it has become shorter meanwhile
+        if (n <= 0) return std::nullopt;
+        done += static_cast<size_t>(n);
+    }
+    return file_bytes{std::move(data), size};
+}
+
+unique_fd create_file(const char* path) {
+    return unique_fd(open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
+}
+
 unique_file open_to_read(const char* path) {
     unique_fd fd(open(path, O_RDONLY | O_CLOEXEC));
     if (!fd.ok()) return nullptr;

@@ -1,4 +1,4 @@
-// Whole writes and sizes of files.
+// Whole writes and reads, and sizes of files.
 #pragma once
 
 #include <sys/uio.h>
@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
+#include <optional>
 #include <span>
 
 #include "util/unique_fd.h"
@@ -21,6 +22,21 @@ namespace kivd {
 
 // Size in bytes of an open file, -1 when it cannot be had. The stream is then at its start.
 [[nodiscard]] int64_t get_file_size(FILE* file);
+
+// What a file held, in a block of malloc of at least one byte.
+struct file_bytes {
+    unique_malloc<uint8_t> data;
+    size_t size;
+
+    [[nodiscard]] std::span<const uint8_t> view() const { return {data.get(), size}; }
+};
+
+// Reads a file from its start to its end and closes it. Nothing, with errno set, when it cannot be
+// read, is shorter than it said, or there is no memory for it.
+[[nodiscard]] std::optional<file_bytes> read_whole_fd(unique_fd fd);
+
+// Creates a file to write to, or empties the one that is there; not ok, with errno set, on failure.
+[[nodiscard]] unique_fd create_file(const char* path);
 
 // Opens a file to read; null with errno set. Unlike plain fopen it refuses a directory (EISDIR).
 [[nodiscard]] unique_file open_to_read(const char* path);

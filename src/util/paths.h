@@ -24,10 +24,25 @@ inline constexpr char header_info[] = "private/header_info.conf";
 
 inline constexpr char flushed_data[] = "private/flushed_data";
 inline constexpr char compacted_data[] = "private/flushed_data.compacted";
+inline constexpr char encrypted_data[] = "private/flushed_data.encrypted";
 
 inline constexpr char report_prefix[] = "kiv_";                  // and a number, in output_dir
 inline constexpr char config_request_name[] = "config_request";  // in output_dir
+inline constexpr char config_request[] = "output/config_request";
 inline constexpr char disable_marker[] = "output/kiv_disabled";
+
+inline constexpr char config_file[] = "input/config";
+inline constexpr char first_config_file[] = "/system/etc/kivd.conf";
+inline constexpr char new_config_signature[] = "private/new_config.sig";
+inline constexpr char new_config_data[] = "private/new_config.gz";
+inline constexpr char config_list[] = "private/config_list.txt";
+inline constexpr char config_part_format[] = "private/conf_%d.bin";  // with the part's id
+
+inline constexpr char counter_filter[] = "private/filters_cnt.txt";
+inline constexpr char static_data_filter[] = "private/filters_sd.txt";
+inline constexpr char event_filter[] = "private/filters.txt";
+
+inline constexpr char log_reader[] = "/system/bin/kiv-logreader";
 
 inline constexpr char random_uuid[] = "/proc/sys/kernel/random/uuid";
 

@@ -9,6 +9,8 @@
 #include <fstream>
 #include <sstream>
 
+#include "config/config_parts.h"
+#include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
 #include "report.pb.h"
@@ -27,6 +29,8 @@ void release_all() {
     counters_free();
     sdata_free();
     free_header();
+    release_filters();
+    release_config_list();
 }
 
 }  // namespace
@@ -61,6 +65,8 @@ void scratch_directory::restart() {
     config_load();
     ensure_device_id();
     update_header_info();
+    load_config_list();
+    (void)load_filters();
 }
 
 std::string scratch_directory::next_report() {

@@ -52,6 +52,17 @@ pid_t fork_child() {
     return pid;
 }
 
+void exec_program(const char* const* arguments) {
+    struct sigaction usual = {};
+    usual.sa_handler = SIG_DFL;
+    for (int signal = 1; signal < NSIG; ++signal) (void)sigaction(signal, &usual, nullptr);
+    sigset_t none;
+    sigemptyset(&none);
+    pthread_sigmask(SIG_SETMASK, &none, nullptr);
+    char* const no_environment[] = {nullptr};
+    (void)execve(*arguments, const_cast<char* const*>(arguments), no_environment);
+}
+
 void wait_for_child(pid_t pid) {
     while (waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
     }

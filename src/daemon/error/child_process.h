@@ -13,6 +13,11 @@ void set_inherited_descriptor(int fd);
 // descriptor but 0 to 2 and the inherited one; it has to end with _exit.
 [[nodiscard]] pid_t fork_child();
 
+// In a forked child: becomes the program `arguments` begins with, which starts with default signal
+// dispositions, an empty mask and environment, and descriptors 0 to 2. Returns only when that
+// failed, with errno set.
+void exec_program(const char* const* arguments);
+
 // Waits until the child `pid` has ended; the system reaps it.
 void wait_for_child(pid_t pid);
 

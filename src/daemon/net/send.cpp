@@ -2,16 +2,22 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/uio.h>
 
 #include <cerrno>
+#include <cstring>
 
+#include "daemon/error/log_and_raise.h"
+#include "daemon/net/delays.h"
 #include "daemon/net/wait.h"
 #include "util/clock.h"
 
 namespace kivd {
 namespace {
 
+constexpr char tag[] = "kivd";
 constexpr int64_t reply_ms = 3000;  // for a whole reply
+constexpr int64_t descriptor_ms = 1000;
 
 }  // namespace
 
@@ -32,6 +38,32 @@ ssize_t send_all(int fd, const char* bytes, size_t size) {
         }
     }
     return static_cast<ssize_t>(size);
+}
+
+int send_fd_message(int fd, int descriptor) {
+    wait_before_send();
+    char text[] = {'O', 'K'};
+    iovec data = {text, sizeof text};
+    alignas(cmsghdr) char control[CMSG_SPACE(sizeof descriptor)] = {};
+    msghdr message = {};
+    message.msg_iov = &data;
+    message.msg_iovlen = 1;
+    message.msg_control = control;
+    message.msg_controllen = sizeof control;
+    cmsghdr& header = *CMSG_FIRSTHDR(&message);
+    header.cmsg_level = SOL_SOCKET;
+    header.cmsg_type = SCM_RIGHTS;
+    header.cmsg_len = CMSG_LEN(sizeof descriptor);
+    memcpy(CMSG_DATA(&header), &descriptor, sizeof descriptor);
+
+    const int64_t deadline_ms = monotonic_ms() + descriptor_ms;
+    while (sendmsg(fd, &message, MSG_NOSIGNAL | MSG_DONTWAIT) < 0) {
+        if (errno == EINTR) continue;
+        if (errno == EAGAIN && wait_for_client(fd, POLLOUT, deadline_ms)) continue;
+        (void)log_and_raise(tag, "Failed to send fd-message to client %d", fd);
+        return 0;
+    }
+    return 1;
 }
 
 }  // namespace kivd

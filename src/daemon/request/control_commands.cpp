@@ -2,6 +2,7 @@
 
 #include <cstring>
 
+#include "config/intake.h"
 #include "daemon/error/log_and_raise.h"
 #include "daemon/save_clock.h"
 #include "report/identity.h"
@@ -36,6 +37,18 @@ size_t flush(request& /*r*/) {
 
 size_t force_save(request& /*r*/) {
     save_data();
+    return 0;
+}
+
+size_t announce_configuration(request& r) { return reply(r, take_new_configuration() ? "1" : "0"); }
+
+size_t write_configuration(request& r) {
+    constexpr size_t command_size = 3;  // with the delimiter behind it
+    if (r.packet.size() < command_size) {
+        (void)log_and_raise(tag, "Badly formatted packet (WC) - dropping.");
+        return 0;
+    }
+    write_configuration(r.packet.subspan(command_size));
     return 0;
 }
 

@@ -10,6 +10,8 @@ namespace kivd {
 
 size_t flush(request& r);                   // FL
 size_t force_save(request& r);              // FS
+size_t announce_configuration(request& r);  // NC
+size_t write_configuration(request& r);     // WC
 size_t read_device_id(request& r);          // GD
 size_t switch_data_collection(request& r);  // DC
 size_t remove_report(request& r);           // RM

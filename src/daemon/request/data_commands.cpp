@@ -1,11 +1,15 @@
 #include "daemon/request/data_commands.h"
 
+#include "config/config_parts.h"
+#include "config/filters.h"
 #include "daemon/error/log_and_raise.h"
+#include "daemon/net/send.h"
 #include "report/report_generation.h"
 #include "store/counter_store.h"
 #include "store/event_store.h"
 #include "store/static_store.h"
 #include "util/numbers.h"
+#include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
@@ -58,7 +62,18 @@ size_t is_alive(request& r) { return reply(r, "1"); }
 
 size_t is_probe_active(request& r) {
     probe_id probe = {};
-    return take_probe_id(r, "PA", probe) ? reply(r, "1") : 0;  // every probe is kept
+    if (!take_probe_id(r, "PA", probe)) return 0;
+    return reply(r, filter_match(filter_kind::events, probe.package, probe.name) ? "1" : "0");
+}
+
+size_t get_config_part(request& r) {
+    probe_id probe = {};
+    if (!take_probe_id(r, "GC", probe)) return 0;
+    if (r.fd < 0) return 0;  // no descriptor can be sent back to a datagram's sender
+    const unique_fd part = get_config_fd(probe.package, probe.name);
+    if (!part.ok()) return reply(r, "FAIL");
+    (void)send_fd_message(r.fd, part.get());
+    return 0;
 }
 
 }  // namespace kivd

@@ -14,5 +14,6 @@ size_t increment_counter(request& r);  // CI
 size_t set_static_data(request& r);    // SD
 size_t is_alive(request& r);           // IA
 size_t is_probe_active(request& r);    // PA
+size_t get_config_part(request& r);    // GC
 
 }  // namespace kivd

@@ -18,28 +18,32 @@ constexpr char tag[] = "kivd";
 
 struct command {
     std::string_view name;
-    size_t (*run)(request&);     // gives the length of the reply, 0 for none
-    bool only_while_collecting;  // ignored in silence while data collection is off
-    const char* refusal;         // logged when permission is lacking; null: open to all
+    size_t (*run)(request&);         // gives the length of the reply, 0 for none
+    bool only_while_collecting;      // ignored in silence while data collection is off
+    const char* refusal;             // logged when permission is lacking; null: open to all
+    std::string_view refusal_reply;  // what a refused caller gets
 };
 // clang-format off
 constexpr command commands[] = {
-    {"EV", add_event,              true,  nullptr},
-    {"CS", set_counter,            true,  nullptr},
-    {"CI", increment_counter,      true,  nullptr},
-    {"SD", set_static_data,        true,  nullptr},
-    {"IA", is_alive,               false, nullptr},
-    {"PA", is_probe_active,        false, nullptr},
-    {"FL", flush,                  true,  "flush (FL) request denied due to permission!"},
-    {"FS", force_save,             false, "forceSave (FS) request denied due to permission!"},
-    {"GD", read_device_id,         false, "getDeviceId (GD) request denied due to permission!"},
-    {"DC", switch_data_collection, false, "setDataCollectionEnable (DC) request denied due to permission!"},
-    {"RM", remove_report,          false, "removeReport (RM) request denied due to permission!"},
-    {"SN", accept_serial_number,   false, "setSerialNumber (SN) request denied due to permission!"},
-    {"IM", accept_imei,            false, "setImei (IM) request denied due to permission!"},
-    {"SG", add_group,              false, nullptr},
-    {"DG", delete_group,           false, nullptr},
-    {"RG", replace_group,          false, nullptr},
+    {"EV", add_event,              true,  nullptr, ""},
+    {"CS", set_counter,            true,  nullptr, ""},
+    {"CI", increment_counter,      true,  nullptr, ""},
+    {"SD", set_static_data,        true,  nullptr, ""},
+    {"IA", is_alive,               false, nullptr, ""},
+    {"PA", is_probe_active,        false, nullptr, ""},
+    {"GC", get_config_part,        false, nullptr, ""},
+    {"FL", flush,                  true,  "flush (FL) request denied due to permission!", ""},
+    {"FS", force_save,             false, "forceSave (FS) request denied due to permission!", ""},
+    {"NC", announce_configuration, false, "notifyNewConfiguration (NC) request denied due to permission!", "0"},
+    {"WC", write_configuration,    false, "writeConfiguration (WC) request denied due to permission!", ""},
+    {"GD", read_device_id,         false, "getDeviceId (GD) request denied due to permission!", ""},
+    {"DC", switch_data_collection, false, "setDataCollectionEnable (DC) request denied due to permission!", ""},
+    {"RM", remove_report,          false, "removeReport (RM) request denied due to permission!", ""},
+    {"SN", accept_serial_number,   false, "setSerialNumber (SN) request denied due to permission!", ""},
+    {"IM", accept_imei,            false, "setImei (IM) request denied due to permission!", ""},
+    {"SG", add_group,              false, nullptr, ""},
+    {"DG", delete_group,           false, nullptr, ""},
+    {"RG", replace_group,          false, nullptr, ""},
 };
 // clang-format on
 
@@ -61,7 +65,7 @@ size_t handle_request(int fd, std::span<char> packet, const msghdr* message) {
     }
     if (found->refusal != nullptr && !check_caller_permission(r)) {
         __android_log_print(ANDROID_LOG_WARN, tag, "%s", found->refusal);
-        return 0;
+        return reply(r, found->refusal_reply);
     }
     if (found->only_while_collecting && !is_data_collection_enabled()) return 0;
     return found->run(r);

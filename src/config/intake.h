@@ -1,0 +1,21 @@
+// Taking a new configuration: from input/config to the parts in force. Format of the file:
+// docs/configuration.md.
+#pragma once
+
+#include <span>
+
+namespace kivd {
+
+// Replaces input/config. Failures have been logged and raised.
+void write_configuration(std::span<const char> bytes);
+
+// Copies the system's first configuration to input/config unless there is one. Failures have been
+// logged.
+void install_first_configuration();
+
+// Takes input/config and has everything follow it: settings, report header, filters, actions. False
+// when there is none, or when it was refused, which has been logged and raised; what was in force
+// then stays so. input/ is empty afterwards.
+bool take_new_configuration();
+
+}  // namespace kivd

@@ -1,0 +1,14 @@
+// The log reader: a program of its own that the daemon starts as a child and of which it knows
+// nothing more than whether it runs. It outlives the daemon.
+#pragma once
+
+namespace kivd {
+
+// Failures have been logged and raised.
+void start_log_reader();
+
+// Stops the one that start_log_reader started, if it still runs, and waits until it has ended or
+// the daemon is to stop.
+void stop_log_reader();
+
+}  // namespace kivd

@@ -1,0 +1,33 @@
+#include "config/run_actions.h"
+
+#include "config/config_parts.h"
+#include "config/log_reader.h"
+#include "report/output_dir.h"
+#include "settings.pb-c.h"
+
+namespace kivd {
+namespace {
+
+constexpr char once_part[] = "RunActionsOnce";
+
+}  // namespace
+
+void run_actions() {
+    const auto actions =
+        unpack_own_part<kivd__run_actions__unpack, kivd__run_actions__free_unpacked>("RunActions");
+    if (!actions) return;
+    stop_log_reader();
+    if (actions->has_run_log_reader && actions->run_log_reader) start_log_reader();
+    // activate_lumora_diagnostics: there is no diagnostics store yet that it could switch
+}
+
+void run_actions_once() {
+    const auto actions =
+        unpack_own_part<kivd__run_actions_once__unpack, kivd__run_actions_once__free_unpacked>(
+            once_part);
+    if (!actions) return;
+    if (actions->has_remove_reports && actions->remove_reports) delete_reports(0);
+    retire_own_part(once_part);
+}
+
+}  // namespace kivd

@@ -1,0 +1,72 @@
+#include "report/report_sealing.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <span>
+
+#include "daemon/error/log_and_raise.h"
+#include "report/header_record.h"
+#include "report/record_format.h"
+#include "security/seal.h"
+#include "util/file_io.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-compactor";
+constexpr size_t crypto_fields_size = max_report_key_bits / 8 + 64;
+
+int write_header(int output) {
+    const std::span<const uint8_t> header = get_empty_report_header();
+    if (header.empty()) return log_and_raise(tag, "Failed to get empty report header.");
+    if (write_all(output, header.data(), header.size()) >= 0) return 0;
+    return log_and_raise(tag, "Failed to write crypto data, %s", strerror(errno));
+}
+
+int write_crypto_fields(int output, const seal& opened, uint32_t plain_size) {
+    std::array<uint8_t, crypto_fields_size> fields;
+    const size_t size = pack_crypto_fields(fields, opened.encrypted_key.data(), opened.key_bits,
+                                           opened.iv, sealed_size(plain_size));
+    if (write_all(output, fields.data(), size) >= 0) return 0;
+    return log_and_raise(tag, "Failed to write crypto data, %s", strerror(errno));
+}
+
+int write_sealed_data(seal& opened) {
+    const unique_fd input(open(paths::compacted_data, O_RDONLY | O_CLOEXEC));
+    struct stat status = {};
+    if (!input.ok() || fstat(input.get(), &status) != 0) {
+        return log_and_raise(tag, "Failed to open input encryption file: %s", strerror(errno));
+    }
+    const unique_fd output = create_file(paths::encrypted_data);
+    if (!output.ok()) {
+        return log_and_raise(tag, "Failed to open output encryption file: %s", strerror(errno));
+    }
+    const auto plain_size = static_cast<uint32_t>(status.st_size);
+    if (write_header(output.get()) != 0) return -1;
+    if (write_crypto_fields(output.get(), opened, plain_size) != 0) return -1;
+    return encrypt_file(input.get(), output.get(), opened) == 1 ? 0 : -1;
+}
+
+}  // namespace
+
+int seal_compacted_data() {
+    seal opened = {};
+    if (open_report_seal(opened) == 0) {
+        return log_and_raise(tag, "Failed to initialize encryption.");
+    }
+    if (write_sealed_data(opened) != 0) return -1;
+    if (rename(paths::encrypted_data, paths::compacted_data) == 0) return 0;
+    (void)log_and_raise(tag, "Failed to rename encrypted file: %s", strerror(errno));
+    (void)unlink(paths::encrypted_data);
+    return -1;
+}
+
+}  // namespace kivd

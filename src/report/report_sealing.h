@@ -1,0 +1,10 @@
+// Sealing a report: its gzip file becomes the ciphertext in a report of its own, which says with
+// which key it opens and shows nothing of the device. Format: docs/report-format.md.
+#pragma once
+
+namespace kivd {
+
+// Replaces the compacted data by its sealed form. 0, or -1 with the failure logged and raised.
+[[nodiscard]] int seal_compacted_data();
+
+}  // namespace kivd

@@ -1,0 +1,65 @@
+#include "security/key_paths.h"
+
+#include <openssl/err.h>
+#include <openssl/pem.h>
+#include <unistd.h>
+
+#include <array>
+#include <cstdio>
+
+#include "util/file_io.h"
+
+namespace kivd {
+namespace {
+
+constexpr char default_directory[] = "/system/etc/security/";
+constexpr char report_key_name[] = "kiv_report.pem";
+constexpr char config_key_name[] = "kiv_config.pem";
+
+using key_path = std::array<char, 4096>;
+
+constinit key_path report_key_path = {};
+constinit key_path config_key_path = {};
+
+void set_path(key_path& path, const char* directory, const char* name) {
+    snprintf(path.data(), path.size(), "%s%s", directory, name);
+}
+
+unique_pkey load_public_key(const key_path& path) {
+    const unique_file file = open_to_read(path.data());
+    if (!file) return nullptr;
+    // The empty pass phrase stands for the library's own callback, which would ask at the terminal.
+    char no_pass_phrase[] = "";
+    unique_pkey key(PEM_read_PUBKEY(file.get(), nullptr, nullptr, no_pass_phrase));
+    ERR_clear_error();
+    return key;
+}
+
+}  // namespace
+
+void set_default_key_paths() {
+    set_report_key_dir(default_directory);
+    set_config_key_dir(default_directory);
+}
+
+void set_report_key_dir(const char* directory) {
+    set_path(report_key_path, directory, report_key_name);
+}
+
+void set_config_key_dir(const char* directory) {
+    set_path(config_key_path, directory, config_key_name);
+}
+
+void clear_report_key_path() { report_key_path.front() = '\0'; }
+
+void clear_config_key_path() { config_key_path.front() = '\0'; }
+
+bool report_key_available() { return access(report_key_path.data(), R_OK) == 0; }
+
+bool config_key_available() { return access(config_key_path.data(), R_OK) == 0; }
+
+unique_pkey load_report_key() { return load_public_key(report_key_path); }
+
+unique_pkey load_config_key() { return load_public_key(config_key_path); }
+
+}  // namespace kivd

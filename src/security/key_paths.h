@@ -1,0 +1,36 @@
+// The two public keys of the device: where they are, and reading them. Each protection is on
+// exactly when its key file is readable. The files are read anew for each use, so that a replaced
+// one takes effect without a restart.
+#pragma once
+
+#include <openssl/evp.h>
+
+#include <memory>
+
+#include "util/unique_fd.h"
+
+namespace kivd {
+
+using unique_pkey = std::unique_ptr<EVP_PKEY, releaser<EVP_PKEY_free>>;
+
+// Both keys in the system's own directory for them.
+void set_default_key_paths();
+
+// The key is the file of its name in `directory`, which ends in "/": none is put in between. Paths
+// longer than 4095 characters are cut.
+void set_report_key_dir(const char* directory);
+void set_config_key_dir(const char* directory);
+
+// Without a path, reports are not sealed and configurations not verified.
+void clear_report_key_path();
+void clear_config_key_path();
+
+// Whether there is a key file that the process may read, whatever is in it.
+[[nodiscard]] bool report_key_available();
+[[nodiscard]] bool config_key_available();
+
+// The public key in the key file, in PEM; null when the file cannot be read or holds none.
+[[nodiscard]] unique_pkey load_report_key();
+[[nodiscard]] unique_pkey load_config_key();
+
+}  // namespace kivd

@@ -1,0 +1,83 @@
+#include "security/seal.h"
+
+#include <openssl/err.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+#include "daemon/error/log_and_raise.h"
+#include "security/key_paths.h"
+#include "util/file_io.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd/crypto";
+constexpr size_t chunk_size = 16384;
+
+// A modulus of a broken number of bytes would not fit into its length in a report, which is counted
+// in whole ones.
+bool is_report_key(const EVP_PKEY* key) {
+    if (key == nullptr || EVP_PKEY_is_a(key, "RSA") == 0) return false;
+    const int bits = EVP_PKEY_get_bits(key);
+    return bits > 0 && bits <= int{max_report_key_bits} && bits % 8 == 0;
+}
+
+bool write_sealed(int output, const uint8_t* bytes, int size) {
+    if (write_all(output, bytes, static_cast<size_t>(size)) >= 0) return true;
+    (void)log_and_raise(tag, "encrypt_file(): fwrite() failed, %s", strerror(errno));
+    return false;
+}
+
+}  // namespace
+
+int open_report_seal(seal& opened) {
+    const unique_pkey key = load_report_key();
+    if (!is_report_key(key.get())) {
+        (void)log_and_raise(tag, "Failed to open report key");
+        return 0;
+    }
+    seal fresh = {};
+    fresh.key_bits = static_cast<uint32_t>(EVP_PKEY_get_bits(key.get()));
+    fresh.cipher.reset(EVP_CIPHER_CTX_new());
+    uint8_t* keys[] = {fresh.encrypted_key.data()};
+    int key_size = 0;
+    EVP_PKEY* recipients[] = {key.get()};
+    if (!fresh.cipher || EVP_SealInit(fresh.cipher.get(), EVP_aes_128_cbc(), keys, &key_size,
+                                      fresh.iv.data(), recipients, 1) != 1) {
+        ERR_clear_error();
+        return 0;
+    }
+    opened = std::move(fresh);
+    return 1;
+}
+
+int encrypt_file(int input, int output, seal& opened) {
+    std::array<uint8_t, chunk_size> plain;
+    std::array<uint8_t, chunk_size + EVP_MAX_BLOCK_LENGTH> sealed;
+    int size = 0;
+    for (;;) {
+        const ssize_t n = read(input, plain.data(), plain.size());
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0) {
+            (void)log_and_raise(tag, "encrypt_file(): read() failed, %s", strerror(errno));
+            return 0;
+        }
+        if (n == 0) break;
+        if (EVP_EncryptUpdate(opened.cipher.get(), sealed.data(), &size, plain.data(),
+                              static_cast<int>(n)) != 1) {
+            (void)log_and_raise(tag, "EVP_SealUpdate failed");
+            return 0;
+        }
+        if (!write_sealed(output, sealed.data(), size)) return 0;
+    }
+    if (EVP_SealFinal(opened.cipher.get(), sealed.data(), &size) != 1) {
+        (void)log_and_raise(tag, "EVP_SealFinal failed");
+        return 0;
+    }
+    return write_sealed(output, sealed.data(), size) ? 1 : 0;
+}
+
+}  // namespace kivd

@@ -1,0 +1,42 @@
+// Envelope encryption: data is encrypted with AES-128-CBC (PKCS#7 padding) under a key and an IV
+// drawn for this once, and that key with the RSA report key (RSAES-PKCS1-v1_5).
+#pragma once
+
+#include <openssl/evp.h>
+
+#include <array>
+#include <cstdint>
+#include <memory>
+#include <span>
+
+#include "util/unique_fd.h"
+
+namespace kivd {
+
+using unique_cipher = std::unique_ptr<EVP_CIPHER_CTX, releaser<EVP_CIPHER_CTX_free>>;
+
+inline constexpr uint32_t max_report_key_bits = 4096;
+
+struct seal {
+    unique_cipher cipher;
+    std::array<uint8_t, max_report_key_bits / 8> encrypted_key;  // as long as the key's modulus
+    uint32_t key_bits;
+    std::array<uint8_t, EVP_MAX_IV_LENGTH> iv;
+
+    [[nodiscard]] std::span<const uint8_t> key() const {
+        return std::span(encrypted_key).first(key_bits / 8);
+    }
+};
+
+// Starts one encryption with the report key. Gives 1, or 0 with `opened` as it was: no RSA key of
+// up to 4096 bits could be had, which has been logged and raised, or the library failed.
+[[nodiscard]] int open_report_seal(seal& opened);
+
+// The size of the ciphertext of `size` bytes: padding adds 1 to 16.
+[[nodiscard]] constexpr uint32_t sealed_size(uint32_t size) { return (size & ~15U) + 16; }
+
+// Encrypts all that `input` still has into `output` and finishes the seal. 1 when sealed_size bytes
+// have been written, else 0; a failure has been logged and raised.
+[[nodiscard]] int encrypt_file(int input, int output, seal& opened);
+
+}  // namespace kivd

@@ -1,0 +1,10 @@
+// The option `--verify-config`.
+#pragma once
+
+namespace kivd {
+
+// Checks a file against the signature in the file of the same name with ".sig" behind it, prints
+// "Verified: OK" or "Verified: Failure", and gives whether it holds.
+[[nodiscard]] bool verify_config_command(const char* path);
+
+}  // namespace kivd
