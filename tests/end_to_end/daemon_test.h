@@ -61,6 +61,12 @@ inline void request(const std::vector<std::string>& requests) {
     EXPECT_EQ(ask(client.get(), "IA"), "1");
 }
 
+// How many errors were logged, but for the one that is of the machine: nothing is installed on it.
+inline size_t errors(const daemon_process& daemon) {
+    return daemon.count_in_log(" E ") -
+           daemon.count_in_log(" E kivd-conf: Failed to open /system/etc/kivd.conf.");
+}
+
 inline kiv::Report parse(const std::string& bytes) {
     kiv::Report report;
     EXPECT_TRUE(report.ParseFromString(bytes)) << bytes.size() << " bytes";

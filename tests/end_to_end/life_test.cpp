@@ -140,7 +140,7 @@ TEST_F(life, what_was_kept_survives_a_stop_and_a_kill) {
         EXPECT_EQ(next.counters_size() + next.statics_size(), 0);
 
         expect_clean_stop(daemon);
-        EXPECT_EQ(daemon.count_in_log(" E "), 0U) << daemon.log();
+        EXPECT_EQ(errors(daemon), 0U) << daemon.log();
         remove_everything_kept();
     }
 }
@@ -233,7 +233,7 @@ TEST_F(life, stops_at_any_moment_and_loses_nothing) {
         }
         daemon.send_signal(SIGTERM);
         ASSERT_EQ(daemon.wait_exit(5000), 0) << daemon.log();
-        ASSERT_EQ(daemon.count_in_log(" E "), 0U) << daemon.log();
+        ASSERT_EQ(errors(daemon), 0U) << daemon.log();
     }
 
     // What the daemon had not read when it stopped went with the socket; the rest is there, once.

@@ -1,0 +1,281 @@
+#include "config/intake.h"
+
+#include <map>
+
+#include "config/config_parts.h"
+#include "config/limits.h"
+#include "report.pb.h"
+#include "report/state_file.h"
+#include "security/key_paths.h"
+#include "settings.pb.h"
+#include "support/config_package.h"
+#include "support/daemon_process.h"
+#include "support/scratch_directory.h"
+
+namespace kivd {
+namespace {
+
+using refusals = std::vector<std::string>;
+constexpr char unpack_failure[] = "E kivd-conf: Failed to unpack configuration";
+constexpr char bad_length[] = "E kivd-conf: Corrupt file - bad field length";
+constexpr char read_failure[] = "E kivd-conf: Failed to read configuration";
+constexpr char parse_failure[] = "E kivd-conf: Failed to parse configuration";
+constexpr char verify_failure[] = "E kivd-conf: Failed to verify configuration";
+
+std::string extract_failure(const std::string& field) {
+    return "E kivd-conf: Failed to extract to private/new_config." + field;
+}
+
+class intake : public scratch_directory {
+ protected:
+    bool take(const std::string& file) {
+        (void)take_log();
+        write_file("input/config", file);
+        const bool taken = take_new_configuration();
+        EXPECT_TRUE(fs::is_empty("input"));
+        for (const char* name : {"private/new_config.gz", "private/new_config.sig"}) {
+            EXPECT_FALSE(exists(name)) << name;
+        }
+        return taken;
+    }
+    // All that a configuration leaves behind, and the checksum in memory.
+    std::map<std::string, std::string> in_force() {
+        std::map<std::string, std::string> files;
+        for (const auto& entry : fs::directory_iterator("private")) {
+            files[entry.path()] = read_file(entry.path());
+        }
+        files["checksum"] = get_config_checksum_text().get();
+        return files;
+    }
+};
+
+// What a client that asks for the part gets.
+std::string part(const char* package, const char* name) {
+    const auto bytes = read_whole_fd(get_config_fd(package, name));
+    return bytes ? std::string(bytes->data.get(), bytes->data.get() + bytes->size) : "none";
+}
+
+TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {
+    const std::string long_payload(5000, '\0');
+    ASSERT_TRUE(take(config_file({{"b", "y", "1"}, {"a", "x", long_payload}, {"b", "y", "2"}})));
+    EXPECT_EQ(part("b", "y"), "2");
+    EXPECT_EQ(part("a", "x"), long_payload);
+    EXPECT_EQ(read_file("private/config_list.txt"),
+              "a\0x\0002\0001\0\0\nb\0y\0001\0001\0\0\nkivd\0_last_id\0002\0000\0\0\n"s);
+    for (const int round : {1, 2}) {  // as taken, and as loaded
+        SCOPED_TRACE(round);
+        ASSERT_TRUE(take(config_file({{"c", "z", ""}, {"kivd", "_last_id", "no part"}})));
+        EXPECT_EQ(part("c", "z"), "");
+        for (const char* name : {"x", "y"})
+            EXPECT_EQ(part("a", name) + part("b", name), "nonenone");
+        EXPECT_FALSE(exists("private/conf_1.bin") || exists("private/conf_2.bin"));
+        EXPECT_TRUE(exists("private/conf_3.bin"));
+        restart();
+    }
+    ASSERT_TRUE(take(config_file({{"b", "y", "again"}, {"d", "new", "4"}})));
+    EXPECT_EQ(read_file("private/conf_1.bin") + read_file("private/conf_4.bin"), "again4");
+    EXPECT_FALSE(exists("private/conf_3.bin"));
+
+    ASSERT_TRUE(take(config_file(std::vector<config_part>())));  // nothing is a configuration too
+    EXPECT_EQ(part("b", "y"), "none");
+    ASSERT_TRUE(take(config_file(pack({{"a", "x", "as it is"}}))));  // need not be compressed
+    EXPECT_EQ(part("a", "x"), "as it is");
+}
+
+TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
+    for (const std::string& counter :
+         {""s, "kivd\0_last_id\0-5\0000\0\0\n"s, "kivd\0_last_id\0x\0001\0\0\n"s}) {
+        write_file("private/config_list.txt", "a\0x\0007\0001\0\0\nb\0y\0z\0\0\n"s + counter);
+        restart();
+        ASSERT_TRUE(take(config_file({{"a", "x", "old"}, {"c", "z", "new"}})));
+        EXPECT_EQ(read_file("private/conf_7.bin") + read_file("private/conf_8.bin"), "oldnew");
+        EXPECT_EQ(part("kivd", "_last_id"), "none");
+    }
+    write_file("private/config_list.txt", "kivd\0_last_id\0002147483647\0000\0\0\n"s);
+    restart();
+    ASSERT_TRUE(take(config_file({{"c", "z", "one too many"}})));
+    EXPECT_EQ(part("c", "z"), "none");
+}
+
+TEST_F(intake, the_request_names_the_device_and_the_configuration) {
+    const std::string file = config_file({{"a", "x", "1"}});
+    write_file("input/other", "");
+    ASSERT_TRUE(take(file));
+    write_file("config", file);
+    const std::string digits = openssl("dgst -sha1 -r config").substr(0, 40);
+    EXPECT_EQ(get_config_checksum_text().get(), digits);
+    EXPECT_NE(read_file("private/kivd.state").find("config-checksum: " + digits + "\n"),
+              std::string::npos);
+
+    kiv::config::ConfigRequest request;
+    ASSERT_TRUE(request.ParseFromString(read_file("output/config_request")));
+    EXPECT_EQ(request.header().product_id(), "P1");
+    EXPECT_EQ(request.header().config_checksum(), std::string(40, '0'));  // so far
+    const config_checksum current = get_config_checksum();
+    EXPECT_EQ(request.current_config(), std::string(current.begin(), current.end()));
+}
+
+TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
+    ASSERT_TRUE(take(config_file({{"a", "x", "kept"}})));
+    const auto before = in_force();
+    const std::string good = gzip(pack({{"a", "x", "new"}}));
+    std::string flipped = good;
+    flipped[flipped.size() - 6] ^= 1;  // in the checksum
+    std::string two_members = gzip("") + good.substr(0, good.size() - 1);
+
+    const std::pair<std::string, refusals> cases[] = {
+        {"", {unpack_failure}},
+        {"\x0a", {bad_length, unpack_failure}},
+        {"\x12", {bad_length, unpack_failure}},
+        {"\x22\x01x", {unpack_failure}},
+        {"\x0a\x01x", {unpack_failure}},
+        {"\x0a\x01xx", {unpack_failure}},
+        {"\x12\x80\x80\x80\x80\x80\x01", {bad_length, unpack_failure}},
+        {"\x12\x03xy", {extract_failure("gz"), unpack_failure}},
+        {"\x12\x04xy", {bad_length, unpack_failure}},
+        {"\x0a\x80\x80\x80\x80\x08xy", {extract_failure("sig"), unpack_failure}},
+        {"\x12\xff\xff\xff\xff\x0fxy", {extract_failure("gz"), unpack_failure}},
+        {std::string(204800, '\x12'), {unpack_failure}},
+        {config_file("\x1f\x8b\x08"), {read_failure}},
+        {config_file(good.substr(0, good.size() / 2)), {read_failure}},
+        {config_file(good.substr(0, good.size() - 1)), {read_failure}},
+        {config_file(two_members), {read_failure}},
+        {config_file(flipped), {read_failure}},
+        {config_file(gzip(std::string((8 << 20) + 1, '\0'))), {read_failure}},
+        {config_file(gzip(std::string(8 << 20, '\0'))), {parse_failure}},
+        {config_file("not a package"), {parse_failure}},
+        {config_file(gzip("\x0a\x03\x0a\x01p")), {parse_failure}},
+    };
+    for (const auto& [file, expected] : cases) {
+        SCOPED_TRACE(testing::Message() << file.size() << " bytes: " << file.substr(0, 8));
+        EXPECT_FALSE(take(file));
+        EXPECT_EQ(take_log(), expected);
+        EXPECT_EQ(in_force(), before);
+    }
+    EXPECT_FALSE(take_new_configuration());  // none is there
+    fs::create_directory("input/config");
+    EXPECT_FALSE(take_new_configuration());
+    EXPECT_EQ(take_log(), lines({"W kivd-conf: Failed to delete input/config."}));
+    fs::remove("input/config");
+
+    // The largest file there may be.
+    const std::string whole = config_file(good);
+    EXPECT_TRUE(take(whole + std::string(204799 - whole.size(), 'x')));
+    EXPECT_EQ(part("a", "x"), "new");
+}
+
+TEST_F(intake, a_signed_file_is_taken_whole_and_unchanged_or_not_at_all) {
+    make_keys("config");
+    make_keys("other");
+    set_config_key_dir("./");
+    const std::string data = gzip(pack({{"a", "x", "signed"}}));
+    const std::string file = config_file(data, sign(data, "config"));
+    const auto before = in_force();
+    for (size_t i = 0; i < file.size(); ++i) {
+        SCOPED_TRACE(i);
+        EXPECT_FALSE(take(file.substr(0, i)));
+        std::string changed = file;
+        changed[i] = static_cast<char>(changed[i] ^ (1 << i % 8));
+        EXPECT_FALSE(take(changed));
+        ASSERT_EQ(in_force(), before);
+    }
+    const std::string signatures[] = {std::string(1, '\0'), std::string(1025, 'x'),
+                                      sign(data, "other"), sign(data + ".", "config")};
+    for (const std::string& signature : signatures) {
+        EXPECT_FALSE(take(config_file(data, signature)));
+        EXPECT_EQ(take_log(), lines({verify_failure}));
+    }
+    // What an intake that was killed left behind is not this file's.
+    write_file("private/new_config.sig", sign(data, "config"));
+    EXPECT_FALSE(take(config_file(data)));
+    EXPECT_EQ(take_log(), lines({"E kivd/crypto: Failed to open signature file.", verify_failure}));
+    EXPECT_EQ(in_force(), before);
+
+    EXPECT_TRUE(take(file));
+    write_file("kiv_config.pem", "no key");
+    EXPECT_FALSE(take(file));
+    EXPECT_EQ(take_log(), lines({"E kivd/crypto: Failed to load public key.", verify_failure}));
+    clear_config_key_path();
+    EXPECT_TRUE(take(config_file(data, "unchecked")));
+}
+
+TEST_F(intake, what_cannot_be_stored_is_said_and_the_rest_goes_on) {
+    fs::create_directory("private/conf_1.bin");
+    ASSERT_TRUE(take(config_file({{"a", "x", "lost"}, {"b", "y", "kept"}})));
+    EXPECT_EQ(part("b", "y"), "kept");
+
+    // The new parts are there, but their consumers and the list still know the old ones.
+    fs::create_directory("private/config_list.txt_");
+    const std::string list = read_file("private/config_list.txt");
+    const auto settings = own_part<Settings>("Settings", "max_report_size: 1234");
+    EXPECT_FALSE(take(config_file({{"c", "z", "served"}, settings})));
+    EXPECT_EQ(take_log(),
+              lines({"E kivd-list: Failed to open list file for writing: Is a directory",
+                     parse_failure}));
+    EXPECT_EQ(part("c", "z") + part("b", "y"), "servednone");
+    EXPECT_TRUE(exists("private/conf_2.bin"));
+    EXPECT_EQ(read_file("private/config_list.txt"), list);
+    EXPECT_EQ(get_limits().max_report_size, default_max_report_size);
+
+    fs::remove("input");
+    write_configuration({});
+    EXPECT_EQ(take_log(), lines({"E kivd-conf: Failed to create configuration file: "
+                                 "No such file or directory"}));
+    fs::create_directory("input");
+    fs::create_symlink("/dev/full", "input/config");
+    write_configuration("x"s);
+    EXPECT_EQ(take_log(), lines({"E kivd-conf: Failed to write configuration file: "
+                                 "No space left on device"}));
+}
+
+TEST_F(intake, settings_come_and_go_with_their_part) {
+    get_limits().base_expire_counters_age = 77;
+    const struct {
+        const char* text;
+        uint32_t expected[4];  // report, output, counters, static data
+    } cases[] = {
+        {"max_report_size: 5000000 expire_sdata_age: 0", {5000000, 5242880, 77, 0}},
+        {"max_output_dir_size: 409600 expire_counters_age: 9", {409600, 409600, 9, 2592000}},
+        {"max_report_size: 6000000 expire_counters_age: 9", {409600, 5242880, 9, 2592000}},
+        {"max_report_size: 4294967295 max_output_dir_size: 4294967295",
+         {4294967295, 4294967295, 77, 2592000}},
+        {"permanently_disable: false", {409600, 5242880, 77, 2592000}},
+    };
+    const auto expect_limits = [](const uint32_t(&expected)[4]) {
+        const limits& values = get_limits();
+        EXPECT_EQ(values.max_report_size, expected[0]);
+        EXPECT_EQ(values.max_output_dir_size, expected[1]);
+        EXPECT_EQ(values.expire_counters_age, expected[2]);
+        EXPECT_EQ(values.expire_sdata_age, expected[3]);
+    };
+    for (const auto& each : cases) {
+        SCOPED_TRACE(each.text);
+        ASSERT_TRUE(take(config_file({own_part<Settings>("Settings", each.text)})));
+        const std::string expected_log =
+            each.expected[2] == 9 && each.expected[1] == 5242880
+                ? "E kivd-settings: Bad settings found in configuration file, report_max_size "
+                  "(6000000) > output_dir_max_size (5242880). Default values (409600)(5242880) "
+                  "will be used"
+                : "";
+        std::string log;
+        for (const std::string& line : take_log()) log += line;
+        EXPECT_NE(log.find(expected_log), std::string::npos) << log;
+        expect_limits(each.expected);
+        restart();  // remembered
+        get_limits().base_expire_counters_age = 77;
+        expect_limits(each.expected);
+    }
+    ASSERT_TRUE(take(config_file({{"kivd", "Settings", "\xff"}})));
+    expect_limits({409600, 5242880, 77, 2592000});
+}
+
+TEST_F(intake, a_one_off_action_is_done_once) {
+    for (const char* name : {"output/kiv_1", "output/kiv_disabled"}) write_file(name, "x");
+    const auto once = own_part<RunActionsOnce>("RunActionsOnce", "remove_reports: true");
+    ASSERT_TRUE(take(config_file({once})));
+    EXPECT_EQ(fs::directory_iterator("output")->path(), "output/config_request");
+    EXPECT_EQ(part("kivd", "RunActionsOnce"), "none");
+}
+
+}  // namespace
+}  // namespace kivd
