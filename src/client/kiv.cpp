@@ -20,6 +20,7 @@
 #include <limits>
 #include <new>
 #include <string_view>
+#include <utility>
 
 // The handle holds no lock, so that a fork at any moment leaves the child one it can use. The
 // producing socket is made once; connecting it again turns it to a new daemon in one step of the
@@ -39,11 +40,11 @@ using std::string_view;
 
 constexpr size_t request_size_max = 31176;
 constexpr char blanks[] = " \t\r\n";  // what the daemon splits a request at
-constexpr string_view done = "1";     // what it answers to "IA"
+constexpr string_view yes = "1";      // the answer to "IA", and to questions
+constexpr string_view no = "0";
 constexpr char producer_socket[] = "kiv_cl";
 constexpr char control_socket[] = "kiv_co";
 
-// Privileged requests are refused without an answer.
 enum class access { open, privileged };
 
 // One message, gathered where its at most six pieces lie. The casts are for sendmsg, which asks for
@@ -76,23 +77,24 @@ class request {
     size_t size_ = 0;
 };
 
-struct reply {
-    char text[KIV_DEVICE_ID_MAX];  // the longest there is
-    size_t size = 0;
-
-    [[nodiscard]] string_view view() const { return {text, size}; }
-};
-
-// Owns the descriptor of a connection.
-struct connection {
-    explicit connection(int new_fd) : fd(new_fd) {}
-    connection(const connection&) = delete;
-    connection& operator=(const connection&) = delete;
-    ~connection() {
+// Owns a descriptor, or none.
+struct owned_fd {
+    explicit owned_fd(int new_fd = -1) : fd(new_fd) {}
+    owned_fd(const owned_fd&) = delete;
+    owned_fd& operator=(const owned_fd&) = delete;
+    ~owned_fd() {
         if (fd >= 0) close(fd);
     }
 
-    const int fd;
+    int fd;
+};
+
+struct reply {
+    char text[KIV_DEVICE_ID_MAX];  // the longest there is
+    size_t size = 0;
+    owned_fd attached;
+
+    [[nodiscard]] string_view view() const { return {text, size}; }
 };
 
 int64_t now_ms() {
@@ -233,60 +235,105 @@ int send_before(int fd, const request& packet, int64_t deadline_ms) {
     }
 }
 
+// The descriptor that came with a message for whose control part there was room for one; or -1.
+int find_attached(msghdr& message) {
+    const cmsghdr* header = CMSG_FIRSTHDR(&message);
+    if (header == nullptr || header->cmsg_level != SOL_SOCKET || header->cmsg_type != SCM_RIGHTS ||
+        header->cmsg_len != CMSG_LEN(sizeof(int))) {
+        return -1;
+    }
+    int fd;
+    memcpy(&fd, CMSG_DATA(header), sizeof fd);
+    return fd;
+}
+
 // 1 when there was a reply, 0 when the daemon has closed the connection, or a negative errno value.
 int receive_before(int fd, reply& answer, int64_t deadline_ms) {
     for (;;) {
         const int result = await(fd, POLLIN, deadline_ms);
         if (result < 0) return result;
-        const ssize_t size = recv(fd, answer.text, sizeof answer.text, MSG_DONTWAIT | MSG_TRUNC);
+        iovec text = {answer.text, sizeof answer.text};
+        alignas(cmsghdr) char control_part[CMSG_SPACE(sizeof(int))];
+        msghdr message{};
+        message.msg_iov = &text;
+        message.msg_iovlen = 1;
+        message.msg_control = control_part;
+        message.msg_controllen = CMSG_LEN(sizeof(int));  // its padding would let a second one in
+        const ssize_t size = recvmsg(fd, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
         if (size < 0 && (errno == EINTR || errno == EAGAIN)) continue;
         if (size < 0) return -errno;
+        answer.attached.fd = find_attached(message);
         if (size == 0) return 0;
         answer.size = static_cast<size_t>(size);
-        return answer.size <= sizeof answer.text ? 1 : -EPROTO;
+        if ((message.msg_flags & MSG_TRUNC) != 0) return -EPROTO;
+        if ((message.msg_flags & MSG_CTRUNC) == 0) return 1;
+        // the kernel drops the descriptors that don't fit, and all of them when we have too many
+        return answer.attached.fd >= 0 ? -EPROTO : -EMFILE;
     }
 }
 
-// Has the daemon carry out `command` (null for none) and waits until it has. Most commands have no
-// answer, so "IA" follows: its answer says that what came before is handled. "GD" goes before a
-// privileged command and tells how the daemon sees the caller: answered with the device id, or not
-// answered. A device id might look like the answer to "IA", so a single answer only counts as a
-// refusal when nothing follows it; the daemon closes its end once it has read everything from a
-// caller that will send no more.
-int control(const kiv_handle& handle, access needed, const request* command,
-            char* device_id = nullptr) {
+// What comes back from the daemon.
+struct answers {
+    reply device_id;  // of privileged requests
+    reply last;
+};
+
+// Has the daemon carry out `requests` (null for none) and waits until it has. The last one is
+// answered whoever asks, with `refusal` when the caller has no permission. "GD" goes before
+// privileged requests and tells how the daemon sees the caller: answered with the device id, or not
+// answered. A device id might look like a refusal, so a single answer only counts as one when
+// nothing follows it; the daemon closes its end once it has read everything from a caller that will
+// send no more.
+int converse(const kiv_handle& handle, access needed,
+             std::initializer_list<const request*> requests, string_view refusal, answers& got) {
     const int64_t deadline_ms = now_ms() + handle.timeout_ms.load(std::memory_order_relaxed);
-    const connection daemon(connect_control(handle, deadline_ms));
+    const owned_fd daemon(connect_control(handle, deadline_ms));
     if (daemon.fd < 0) return daemon.fd;
 
     int result = 0;
     if (needed == access::privileged) result = send_before(daemon.fd, {"GD"}, deadline_ms);
-    if (result == 0 && command) result = send_before(daemon.fd, *command, deadline_ms);
-    if (result == 0) result = send_before(daemon.fd, {"IA"}, deadline_ms);
+    for (const request* packet : requests) {
+        if (result == 0 && packet) result = send_before(daemon.fd, *packet, deadline_ms);
+    }
     if (result < 0) return result;
     (void)shutdown(daemon.fd, SHUT_WR);
 
-    reply answers[2];
-    const size_t expected = needed == access::privileged ? 2 : 1;
-    size_t count = 0;
-    while (count < expected) {
-        result = receive_before(daemon.fd, answers[count], deadline_ms);
-        if (result < 0) return result;
-        if (result == 0) break;
-        ++count;
+    if (needed == access::privileged) {
+        result = receive_before(daemon.fd, got.device_id, deadline_ms);
+        if (result <= 0) return result < 0 ? result : -ECONNRESET;
     }
-    const bool is_handled = count > 0 && answers[count - 1].view() == done;
-    if (!is_handled) return count == expected ? -EPROTO : -ECONNRESET;
-    if (count < expected) return -EPERM;
+    result = receive_before(daemon.fd, got.last, deadline_ms);
+    if (result != 0) return std::min(result, 0);
+    const bool is_refused = needed == access::privileged && got.device_id.view() == refusal;
+    return is_refused ? -EPERM : -ECONNRESET;
+}
+
+// Requests without an answer: "IA" follows, whose answer says that what came before is handled.
+int control(const kiv_handle& handle, access needed, const request* command,
+            char* device_id = nullptr) {
+    const request is_alive{"IA"};
+    answers got;
+    const int result = converse(handle, needed, {command, &is_alive}, yes, got);
+    if (result < 0) return result;
+    if (got.last.view() != yes) return -EPROTO;
     if (device_id != nullptr) {
-        memcpy(device_id, answers[0].text, answers[0].size);
-        device_id[answers[0].size] = '\0';
+        memcpy(device_id, got.device_id.text, got.device_id.size);
+        device_id[got.device_id.size] = '\0';
     }
     return 0;
 }
 
 int control(const kiv_handle& handle, access needed, const request& command) {
     return control(handle, needed, &command);
+}
+
+// Requests of which the last is answered with yes or no: 1, 0, or a negative errno value.
+int ask(const kiv_handle& handle, access needed, std::initializer_list<const request*> requests) {
+    answers got;
+    const int result = converse(handle, needed, requests, no, got);
+    if (result < 0) return result;
+    if (got.last.view() == yes) return 1;
+    return got.last.view() == no ? 0 : -EPROTO;
 }
 
 }  // namespace
@@ -389,4 +436,36 @@ int kiv_delete_group_id(kiv_handle* handle, const char* id) {
 int kiv_replace_group_id(kiv_handle* handle, const char* new_id, const char* old_id) {
     if (!is_word(new_id) || !is_word(old_id)) return -EINVAL;
     return control(*handle, access::open, {"RG ", new_id, " ", old_id});
+}
+
+int kiv_is_probe_active(kiv_handle* handle, const char* package, const char* name) {
+    const int id_result = check_probe_id(package, name);
+    if (id_result < 0) return id_result;
+    const request question{"PA ", package, " ", name};
+    return ask(*handle, access::open, {&question});
+}
+
+int kiv_get_config(kiv_handle* handle, const char* package, const char* name) {
+    const int id_result = check_probe_id(package, name);
+    if (id_result < 0) return id_result;
+    const request question{"GC ", package, " ", name};
+    answers got;
+    const int result = converse(*handle, access::open, {&question}, "", got);
+    if (result < 0) return result == -ENOENT ? -ECONNREFUSED : result;
+    if (got.last.view() == "FAIL") return -ENOENT;
+    if (got.last.view() != "OK" || got.last.attached.fd < 0) return -EPROTO;
+    return std::exchange(got.last.attached.fd, -1);
+}
+
+int kiv_install_config(kiv_handle* handle, const void* bytes, size_t size) {
+    if (bytes == nullptr || size == 0) return -EINVAL;
+    if (size > KIV_CONFIG_MAX) return -EMSGSIZE;
+    const request config{"WC ", string_view(static_cast<const char*>(bytes), size)};
+    const request announcement{"NC"};
+    return ask(*handle, access::privileged, {&config, &announcement});
+}
+
+int kiv_announce_config(kiv_handle* handle) {
+    const request announcement{"NC"};
+    return ask(*handle, access::privileged, {&announcement});
 }
