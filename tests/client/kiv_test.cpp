@@ -16,6 +16,7 @@
 #include <utility>
 
 #include "fake_daemon.h"
+#include "support/scratch_directory.h"
 
 namespace kivd {
 namespace {
@@ -327,6 +328,13 @@ TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_a
     EXPECT_EQ(kiv_install_config(handle.get(), longest.data(), 31'173), 0);  // not taken
     EXPECT_EQ(server.take_requests()[1], "WC " + longest);
     EXPECT_EQ(kiv_announce_config(handle.get()), 0);
+    (void)server.take_requests();
+    EXPECT_EQ(kiv_install_config(handle.get(), "\x12\1", 3), 0);
+    EXPECT_EQ(server.take_requests()[1],
+              doc_example("requests.md", "hex", "write-configuration-request"));
+    EXPECT_EQ(kiv_get_config(handle.get(), "app", "Settings"), -ENOENT);
+    EXPECT_EQ(server.take_requests()[0],
+              doc_example("requests.md", "hex", "get-configuration-request"));
     EXPECT_EQ(kiv_set_group_id(handle.get(), longest.c_str()), 0);
     EXPECT_EQ(kiv_set_group_id(handle.get(), (longest + "g").c_str()), -EMSGSIZE);
 }
