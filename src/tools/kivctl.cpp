@@ -83,7 +83,8 @@ constexpr explanation explanations[] = {
     {EAGAIN, status_unreachable,
      "the queue of the daemon in {base} stayed full for {timeout} ms; it may be busy or stopped, "
      "and --timeout lets it take longer"},
-    {ECONNRESET, status_unreachable, "the daemon in {base} ended before it answered"},
+    {ECONNRESET, status_unreachable,
+     "the daemon in {base} gave no answer; it may have ended, or not know the request"},
     {EPROTO, status_refused, "the daemon in {base} gave an answer that makes no sense"},
     {EPERM, status_refused,
      "the daemon refused the request; it takes it from its own user, from root and from members "
