@@ -21,6 +21,8 @@ extern "C" {
 #define KIV_PAYLOAD_MAX 30720
 /* Length of a device id, in bytes; a buffer needs one more for the NUL. */
 #define KIV_DEVICE_ID_MAX 40
+/* Length of a configuration file that one request carries, in bytes. */
+#define KIV_CONFIG_MAX 31173
 
 /* A connection to one daemon. */
 typedef struct kiv_handle kiv_handle;
@@ -77,10 +79,12 @@ int kiv_set_static_data(kiv_handle* handle, const char* package, const char* nam
  *
  * -ETIMEDOUT               no answer in time; the request may still be carried out
  * -ECONNREFUSED, -ENOENT   no daemon
- * -ECONNRESET              the daemon ended before it answered
+ * -ECONNRESET              the daemon ended, or hung up, before it answered
  * -EPROTO                  an answer that makes no sense
- * -EINVAL                  a negative report number; an empty or null group id, or one with a blank
- * -EMSGSIZE                group ids beyond what the daemon takes
+ * -EINVAL                  a negative report number; an empty or null package, name or group id, or
+ *                          one with a blank; an empty or null configuration
+ * -EMSGSIZE                a package and name of more than KIV_PROBE_ID_MAX bytes, a configuration
+ *                          of more than KIV_CONFIG_MAX; group ids beyond what the daemon takes
  * -EPERM                   the daemon refused the caller: it has neither the daemon's user id nor
  *                          the permission for private requests
  */
@@ -101,6 +105,40 @@ int kiv_remove_reports(kiv_handle* handle, int32_t number);
 int kiv_set_group_id(kiv_handle* handle, const char* id);
 int kiv_delete_group_id(kiv_handle* handle, const char* id);
 int kiv_replace_group_id(kiv_handle* handle, const char* new_id, const char* old_id);
+
+/*
+ * 1 when an event of that package and name is wanted, 0 when it would be dropped; open to every
+ * caller. A new configuration may change the answer. Whether data is collected at all does not.
+ */
+int kiv_is_probe_active(kiv_handle* handle, const char* package, const char* name);
+
+/*
+ * A descriptor of the part with that package and name of the configuration in force, to read from
+ * its first byte. It is close-on-exec, and the caller's to close. Open to every caller.
+ *
+ * What it gives stays readable when the part leaves the configuration, but a configuration that
+ * brings the part again is written to the same file: read it soon.
+ *
+ * -ENOENT   the configuration in force has no such part; that no daemon is there is told by
+ *           -ECONNREFUSED alone
+ * -EMFILE   the process may have no more descriptors
+ */
+int kiv_get_config(kiv_handle* handle, const char* package, const char* name);
+
+/*
+ * Hands the daemon a configuration file, and returns when what follows from it is through: 1 when
+ * the daemon has taken it, 0 when it has not and goes on with the one before; its log says why.
+ * Taking one may need a report to be made first, so slow storage may call for more time than usual
+ * (kiv_set_timeout). A file that is too large for one request can be put into the daemon's
+ * directory as "input/config" and announced.
+ */
+int kiv_install_config(kiv_handle* handle, const void* bytes, size_t size);
+
+/*
+ * Has the daemon take the file "input/config" of its directory; the results are the same. With no
+ * such file there the result is 0, and the log says nothing.
+ */
+int kiv_announce_config(kiv_handle* handle);
 
 #ifdef __cplusplus
 }

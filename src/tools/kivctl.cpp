@@ -7,13 +7,16 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <exception>
 #include <limits>
 #include <memory>
-#include <stdexcept>
 #include <string>
 
 #include "kiv.h"
+#include "tools/kivctl_io.h"
+#include "util/unique_fd.h"
 
+namespace kivd {
 namespace {
 
 enum exit_status : int {
@@ -21,11 +24,6 @@ enum exit_status : int {
     status_refused = 1,  // or the data is bad
     status_usage = 2,
     status_unreachable = 3,  // or not in time
-};
-
-// A command that couldn't be carried out, in one sentence.
-struct failure : std::runtime_error {
-    using std::runtime_error::runtime_error;
 };
 
 // What the command line gave; each command uses a few.
@@ -56,7 +54,7 @@ struct command {
     const char* name;
     const char* description;
     argument arguments[4];                  // the last ones nameless
-    int (*run)(kiv_handle*, const given&);  // gives what libkiv gives
+    int (*run)(kiv_handle*, const given&);  // the exit status, or what libkiv gives when it fails
 };
 
 // How results of libkiv are told; {base} and {timeout} stand for the options.
@@ -65,6 +63,9 @@ struct explanation {
     exit_status status;
     const char* text;
 };
+
+// What the daemon takes from its directory; a request carries less.
+constexpr size_t config_file_size_max = 204'799;
 
 constexpr char no_daemon[] =
     "no daemon listens in {base}; check that kivd runs and that --base is the directory it was "
@@ -82,7 +83,8 @@ constexpr explanation explanations[] = {
     {EAGAIN, status_unreachable,
      "the queue of the daemon in {base} stayed full for {timeout} ms; it may be busy or stopped, "
      "and --timeout lets it take longer"},
-    {ECONNRESET, status_unreachable, "the daemon in {base} ended before it answered"},
+    {ECONNRESET, status_unreachable,
+     "the daemon in {base} gave no answer; it may have ended, or not know the request"},
     {EPROTO, status_refused, "the daemon in {base} gave an answer that makes no sense"},
     {EPERM, status_refused,
      "the daemon refused the request; it takes it from its own user, from root and from members "
@@ -136,35 +138,9 @@ std::string check_state(const std::string& text) {
     return text == "on" || text == "off" ? "" : "\"" + text + "\" is neither \"on\" nor \"off\"";
 }
 
-struct file_closer {
-    void operator()(FILE* file) const noexcept { (void)fclose(file); }
-};
-
-// The content of the file, or of standard input for "-".
-std::string read_payload(const std::string& path) {
-    const bool is_input = path == "-";
-    const std::string source = is_input ? "standard input" : path;
-    const std::unique_ptr<FILE, file_closer> opened(is_input ? nullptr : fopen(path.c_str(), "re"));
-    FILE* file = is_input ? stdin : opened.get();
-    if (file == nullptr) throw failure("cannot open " + source + ": " + strerror(errno));
-    std::string payload(KIV_PAYLOAD_MAX + 1, '\0');  // one more shows that there is more
-    payload.resize(fread(payload.data(), 1, payload.size(), file));
-    if (ferror(file) != 0) throw failure("cannot read " + source + ": " + strerror(errno));
-    if (payload.size() > KIV_PAYLOAD_MAX) {
-        throw failure(source + " is too large for a payload, which has at most " +
-                      std::to_string(KIV_PAYLOAD_MAX) + " bytes");
-    }
-    return payload;
-}
-
-void print_line(const char* text) {
-    if (puts(text) < 0 || fflush(stdout) != 0) {
-        throw failure(std::string("cannot write to standard output: ") + strerror(errno));
-    }
-}
-
 int add_event(kiv_handle* daemon, const given& g) {
-    const std::string payload = g.file.empty() ? g.payload : read_payload(g.file);
+    const std::string payload =
+        g.file.empty() ? g.payload : read_source(g.file, KIV_PAYLOAD_MAX, "a payload");
     return kiv_add_event(daemon, g.package.c_str(), g.name.c_str(), payload.data(), payload.size());
 }
 
@@ -186,6 +162,52 @@ int remove_report(kiv_handle* daemon, const given& g) {
     return kiv_remove_reports(daemon, static_cast<int32_t>(number));
 }
 
+int ask_whether_wanted(kiv_handle* daemon, const given& g) {
+    const int result = kiv_is_probe_active(daemon, g.package.c_str(), g.name.c_str());
+    if (result < 0) return result;
+    print_line(result == 1 ? "wanted" : "not wanted");
+    return result == 1 ? status_done : status_refused;
+}
+
+// `result` is that of handing over a configuration.
+int tell_whether_taken(int result, const char* when_not) {
+    if (result < 0) return result;
+    if (result == 0) throw failure(when_not);
+    print_line("taken");
+    return status_done;
+}
+
+int install_config(kiv_handle* daemon, const given& g) {
+    const std::string config = read_source(g.file, config_file_size_max, "a configuration");
+    if (config.empty()) throw failure(name_source(g.file) + " is empty");
+    if (config.size() > KIV_CONFIG_MAX) {
+        throw failure(name_source(g.file) + " has " + std::to_string(config.size()) +
+                      " bytes, but a request carries at most " + std::to_string(KIV_CONFIG_MAX) +
+                      "; put it into the daemon's directory as input/config, then run "
+                      "\"kivctl config announce\"");
+    }
+    return tell_whether_taken(kiv_install_config(daemon, config.data(), config.size()),
+                              "the daemon did not take the configuration; its log says why");
+}
+
+int announce_config(kiv_handle* daemon, const given&) {
+    return tell_whether_taken(kiv_announce_config(daemon),
+                              "the daemon did not take a configuration; its log says why, unless "
+                              "there is no input/config in its directory that it can read");
+}
+
+int print_config_part(kiv_handle* daemon, const given& g) {
+    const int fd = kiv_get_config(daemon, g.package.c_str(), g.name.c_str());
+    if (fd == -ENOENT) {
+        throw failure("the configuration in force has no part \"" + g.name +
+                      "\" of the package \"" + g.package + "\"");
+    }
+    if (fd < 0) return fd;
+    const unique_fd part(fd);
+    print_content(part.get());
+    return status_done;
+}
+
 // clang-format off
 constexpr argument package = {"PACKAGE", &given::package, "First half of the probe's id", true};
 constexpr argument name = {"NAME", &given::name, "Second half of the probe's id", true};
@@ -195,6 +217,7 @@ constexpr struct {
     const char* name;
     const char* description;
 } groups[] = {
+    {"config",  "Hand over a configuration, or look at the one in force"},
     {"counter", "Set a counter or add to it"},
     {"group",   "Change the group ids that every report carries"},
 };
@@ -225,6 +248,17 @@ constexpr command commands[] = {
     {nullptr, "save", "Save counters and static data now", {},
      [](kiv_handle* daemon, const given&) { return kiv_save(daemon); }},
     {nullptr, "device-id", "Print the device id", {}, show_device_id},
+    {nullptr, "wanted", "Ask whether an event is wanted; the exit status is 1 when it is not",
+     {package, name}, ask_whether_wanted},
+    {"config", "install", "Hand a configuration file to the daemon and have it taken", {
+         {"FILE", &given::file, "The file, or - for standard input", true}},
+     install_config},
+    {"config", "announce", "Have the file input/config of the daemon's directory taken", {},
+     announce_config},
+    {"config", "get", "Print a part of the configuration in force", {
+         {"PACKAGE", &given::package, "The part's package", true},
+         {"NAME", &given::name, "The part's name", true}},
+     print_config_part},
     {nullptr, "collection", "Switch data collection on or off", {
          {"STATE", &given::state, "on or off", true, check_state}},
      [](kiv_handle* daemon, const given& g) {
@@ -297,9 +331,9 @@ std::string replace(std::string text, const std::string& from, const std::string
     return text;
 }
 
-// Tells what went wrong when something did; gives the exit status.
+// Tells what went wrong when libkiv failed; gives the exit status.
 int conclude(int result, const options& chosen) {
-    if (result == 0) return status_done;
+    if (result >= 0) return result;
     const auto* found = std::ranges::find(explanations, -result, &explanation::error);
     if (found == std::end(explanations)) {
         fprintf(stderr, "kivctl: cannot talk to the daemon in %s: %s\n", chosen.base.c_str(),
@@ -348,12 +382,13 @@ int parse_and_run(int argc, char** argv) {
 }
 
 }  // namespace
+}  // namespace kivd
 
 int main(int argc, char** argv) {
     try {
-        return parse_and_run(argc, argv);
+        return kivd::parse_and_run(argc, argv);
     } catch (const std::exception& error) {
         fprintf(stderr, "kivctl: %s\n", error.what());
-        return status_refused;
+        return kivd::status_refused;
     }
 }

@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <functional>
 #include <mutex>
@@ -68,11 +69,40 @@ class bound_socket {
     int fd_;
 };
 
+// A message with descriptors attached, which stay the caller's.
+struct control_answer {
+    control_answer(std::string answered_text, std::vector<int> attached = {})
+        : text(std::move(answered_text)), descriptors(std::move(attached)) {}
+    control_answer(const char* answered_text) : text(answered_text) {}
+
+    std::string text;
+    std::vector<int> descriptors;
+};
+
+inline void send_answer(int fd, control_answer& answer) {
+    iovec part = {answer.text.data(), answer.text.size()};
+    alignas(cmsghdr) char control_part[CMSG_SPACE(8 * sizeof(int))] = {};
+    msghdr message{};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    const size_t size = answer.descriptors.size() * sizeof(int);
+    if (size > 0) {
+        message.msg_control = control_part;
+        message.msg_controllen = CMSG_SPACE(size);
+        cmsghdr* header = CMSG_FIRSTHDR(&message);
+        header->cmsg_level = SOL_SOCKET;
+        header->cmsg_type = SCM_RIGHTS;
+        header->cmsg_len = CMSG_LEN(size);
+        memcpy(CMSG_DATA(header), answer.descriptors.data(), size);
+    }
+    (void)sendmsg(fd, &message, MSG_NOSIGNAL);
+}
+
 // Answers on the control socket in a thread of its own. The answer to a request may be empty, for
 // none, or absent: then the daemon hangs up.
 class control_server {
  public:
-    using answer_function = std::function<std::optional<std::string>(const std::string&)>;
+    using answer_function = std::function<std::optional<control_answer>(const std::string&)>;
 
     control_server(const std::string& directory, answer_function answer)
         : socket_(SOCK_SEQPACKET, directory + "/kiv_co"), answer_(std::move(answer)) {
@@ -105,9 +135,9 @@ class control_server {
             const std::scoped_lock lock(mutex_);
             requests_.push_back(request);
         }
-        const auto answer = answer_(request);
+        auto answer = answer_(request);
         if (!answer) return false;
-        if (!answer->empty()) (void)send(fd, answer->data(), answer->size(), MSG_NOSIGNAL);
+        if (!answer->text.empty()) send_answer(fd, *answer);
         return true;
     }
 
@@ -119,14 +149,18 @@ class control_server {
 };
 
 // What a daemon answers to a caller that it lets do everything.
-inline control_server::answer_function allowing(std::string device_id) {
-    return [device_id](const std::string& request) -> std::optional<std::string> {
+inline control_server::answer_function allowing(std::string device_id,
+                                                std::string is_config_taken = "1") {
+    return [=](const std::string& request) -> std::optional<control_answer> {
         if (request == "GD") return device_id;
+        if (request == "NC") return is_config_taken;
+        if (request.starts_with("PA ")) return request == "PA p wanted" ? "1" : "0";
+        if (request.starts_with("GC ")) return "FAIL";
         return request == "IA" ? "1" : "";
     };
 }
 
 // What a daemon answers to a caller without permission.
-inline control_server::answer_function refusing() { return allowing(""); }
+inline control_server::answer_function refusing() { return allowing("", "0"); }
 
 }  // namespace kivd

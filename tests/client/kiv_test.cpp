@@ -1,11 +1,14 @@
 #include "kiv.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 
 #include <array>
 #include <atomic>
 #include <chrono>
+#include <fstream>
 #include <map>
 #include <memory>
 #include <semaphore>
@@ -13,6 +16,7 @@
 #include <utility>
 
 #include "fake_daemon.h"
+#include "support/scratch_directory.h"
 
 namespace kivd {
 namespace {
@@ -256,6 +260,7 @@ struct control_call {
     std::function<int(kiv_handle*)> call;
     std::vector<std::string> requests;
     bool is_privileged;
+    int result = 0;
 };
 const control_call control_calls[] = {
     {kiv_is_alive, {"IA"}, false},
@@ -278,15 +283,27 @@ const control_call control_calls[] = {
      },
      {"GD", "IA"},
      true},
+    {[](kiv_handle* h) { return kiv_is_probe_active(h, "p", "wanted"); },
+     {"PA p wanted"},
+     false,
+     1},
+    {[](kiv_handle* h) { return kiv_is_probe_active(h, "p", "n"); }, {"PA p n"}, false, 0},
+    {[](kiv_handle* h) { return kiv_get_config(h, "p", "n"); }, {"GC p n"}, false, -ENOENT},
+    {kiv_announce_config, {"GD", "NC"}, true, 1},
+    {[](kiv_handle* h) { return kiv_install_config(h, " \0\n", 3); },
+     {"GD", std::string("WC  \0\n", 6), "NC"},
+     true,
+     1},
 };
 
 TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_are_noticed) {
-    for (const bool is_allowed : {true, false}) {
-        // an id that looks like the answer to IA
-        control_server server(directory.path, is_allowed ? allowing("1") : refusing());
+    // ids that look like answers, and none for a refused caller
+    for (const std::string device_id : {"1", "0", ""}) {
+        const bool is_allowed = !device_id.empty();
+        control_server server(directory.path, is_allowed ? allowing(device_id) : refusing());
         for (const auto& c : control_calls) {
             SCOPED_TRACE(c.requests[c.requests.size() / 2] + (is_allowed ? "" : " refused"));
-            EXPECT_EQ(c.call(handle.get()), c.is_privileged && !is_allowed ? -EPERM : 0);
+            EXPECT_EQ(c.call(handle.get()), c.is_privileged && !is_allowed ? -EPERM : c.result);
             EXPECT_EQ(server.take_requests(), c.requests);
         }
     }
@@ -298,8 +315,26 @@ TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_a
         EXPECT_EQ(kiv_delete_group_id(handle.get(), bad), -EINVAL);
         EXPECT_EQ(kiv_replace_group_id(handle.get(), bad, "id"), -EINVAL);
         EXPECT_EQ(kiv_replace_group_id(handle.get(), "id", bad), -EINVAL);
+        EXPECT_EQ(kiv_is_probe_active(handle.get(), bad, "n"), -EINVAL);
+        EXPECT_EQ(kiv_get_config(handle.get(), "p", bad), -EINVAL);
     }
-    control_server server(directory.path, allowing("id"));
+    EXPECT_EQ(kiv_is_probe_active(handle.get(), longest.c_str(), "n"), -EMSGSIZE);
+    EXPECT_EQ(kiv_get_config(handle.get(), longest.c_str(), "n"), -EMSGSIZE);
+    EXPECT_EQ(kiv_install_config(handle.get(), "", 0), -EINVAL);
+    EXPECT_EQ(kiv_install_config(handle.get(), nullptr, 1), -EINVAL);
+    EXPECT_EQ(kiv_install_config(handle.get(), longest.data(), 31'174), -EMSGSIZE);
+
+    control_server server(directory.path, allowing("0", "0"));
+    EXPECT_EQ(kiv_install_config(handle.get(), longest.data(), 31'173), 0);  // not taken
+    EXPECT_EQ(server.take_requests()[1], "WC " + longest);
+    EXPECT_EQ(kiv_announce_config(handle.get()), 0);
+    (void)server.take_requests();
+    EXPECT_EQ(kiv_install_config(handle.get(), "\x12\1", 3), 0);
+    EXPECT_EQ(server.take_requests()[1],
+              doc_example("requests.md", "hex", "write-configuration-request"));
+    EXPECT_EQ(kiv_get_config(handle.get(), "app", "Settings"), -ENOENT);
+    EXPECT_EQ(server.take_requests()[0],
+              doc_example("requests.md", "hex", "get-configuration-request"));
     EXPECT_EQ(kiv_set_group_id(handle.get(), longest.c_str()), 0);
     EXPECT_EQ(kiv_set_group_id(handle.get(), (longest + "g").c_str()), -EMSGSIZE);
 }
@@ -312,6 +347,7 @@ TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {
     } cases[] = {
         {"id", "0", -EPROTO, -EPROTO},
         {"id", "11", -EPROTO, -EPROTO},
+        {std::string(KIV_DEVICE_ID_MAX + 1, 'i'), "1", 0, -EPROTO},
         {"id", std::nullopt, -ECONNRESET, -ECONNRESET},
         {std::nullopt, "1", 0, -ECONNRESET},
         {"", std::nullopt, -ECONNRESET, -ECONNRESET},
@@ -325,10 +361,93 @@ TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {
         EXPECT_EQ(kiv_is_alive(handle.get()), c.alive);
         EXPECT_EQ(kiv_flush(handle.get()), c.flushed);
     }
+    const struct {
+        answer to_all_but_gd;
+        int result;
+    } questions[] = {
+        {"2", -EPROTO},
+        {"10", -EPROTO},
+        {"OK", -EPROTO},
+        {"0" + std::string(KIV_DEVICE_ID_MAX, ' '), -EPROTO},
+        {std::nullopt, -ECONNRESET},  // hangs up on WC already
+    };
+    for (const auto& q : questions) {
+        SCOPED_TRACE(&q - questions);
+        const control_server server(directory.path, [&q](const std::string& request) -> answer {
+            if (request == "GD") return "id";
+            return request.starts_with("WC") && q.to_all_but_gd ? "" : q.to_all_but_gd;
+        });
+        EXPECT_EQ(kiv_is_probe_active(handle.get(), "p", "n"), q.result);
+        EXPECT_EQ(kiv_get_config(handle.get(), "p", "n"), q.result);
+        EXPECT_EQ(kiv_install_config(handle.get(), "x", 1), q.result);
+    }
     std::filesystem::remove(directory.path + "/kiv_co");
+    EXPECT_EQ(kiv_get_config(handle.get(), "p", "n"), -ECONNREFUSED);  // not: no such part
     EXPECT_EQ(kiv_is_alive(handle.get()), -ENOENT);
     { const bound_socket closed(SOCK_SEQPACKET, directory.path + "/kiv_co"); }
     EXPECT_EQ(kiv_flush(handle.get()), -ECONNREFUSED);
+}
+
+// How many descriptors of this process stand for the file.
+int count_open(const std::string& path) {
+    int count = 0;
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+        std::error_code gone;
+        if (std::filesystem::read_symlink(entry.path(), gone) == path) ++count;
+    }
+    return count;
+}
+
+TEST_F(libkiv, a_part_comes_as_one_descriptor_and_all_others_are_closed) {
+    const std::string path = directory.path + "/part";
+    std::ofstream(path) << "content";
+    const int part = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    const struct {
+        control_answer answer;
+        int result;  // 0 for a descriptor
+    } cases[] = {
+        {{"OK", {part}}, 0},
+        {{"OK", {part, part}}, -EPROTO},
+        {{"OK", {part, part, part, part, part}}, -EPROTO},
+        {{"O", {part}}, -EPROTO},
+        {{"OKAY", {part}}, -EPROTO},
+        {{std::string(KIV_DEVICE_ID_MAX + 1, 'O'), {part}}, -EPROTO},
+        {{"FAIL", {part}}, -ENOENT},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(&c - cases);
+        const control_server server(directory.path,
+                                    [&c](const std::string&) { return std::optional(c.answer); });
+        const int fd = kiv_get_config(handle.get(), "p", "n");
+        EXPECT_EQ(std::min(fd, 0), c.result);
+        if (fd >= 0) {
+            char content[16];
+            EXPECT_EQ(read(fd, content, sizeof content), 7);
+            EXPECT_EQ(fcntl(fd, F_GETFD), FD_CLOEXEC);
+            close(fd);
+        }
+        EXPECT_EQ(count_open(path), 1);
+
+        EXPECT_EQ(kiv_is_probe_active(handle.get(), "p", "n"), -EPROTO);
+        EXPECT_EQ(count_open(path), 1);
+    }
+    close(part);
+}
+
+TEST_F(libkiv, says_when_the_process_has_no_room_for_a_part) {
+    const int part = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    rlimit limit;
+    getrlimit(RLIMIT_NOFILE, &limit);
+    const control_server server(directory.path, [part, limit](const std::string&) {
+        const int lowest_free = dup(part);
+        close(lowest_free);
+        const rlimit full = {static_cast<rlim_t>(lowest_free), limit.rlim_max};
+        setrlimit(RLIMIT_NOFILE, &full);  // of the caller as well
+        return std::optional(control_answer("OK", {part}));
+    });
+    EXPECT_EQ(kiv_get_config(handle.get(), "p", "n"), -EMFILE);
+    setrlimit(RLIMIT_NOFILE, &limit);
+    close(part);
 }
 
 TEST_F(libkiv, a_silent_daemon_is_given_up_at_the_deadline) {
@@ -345,11 +464,13 @@ TEST_F(libkiv, a_silent_daemon_is_given_up_at_the_deadline) {
         SCOPED_TRACE("answers the device id and then hangs");
         std::binary_semaphore end(0);
         const control_server server(directory.path, [&end](const std::string& request) {
-            if (request == "IA") end.acquire();
+            if (request == "IA" || request == "NC") end.acquire();
             return std::optional<std::string>(request == "GD" ? "id" : "");
         });
-        expect_timeout(kiv_flush);
-        end.release();
+        for (auto* call : {kiv_flush, kiv_announce_config}) {
+            expect_timeout(call);
+            end.release();
+        }
     }
     const bound_socket control_socket(SOCK_SEQPACKET, directory.path + "/kiv_co");
     listen(control_socket.fd(), 0);

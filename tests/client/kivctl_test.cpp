@@ -1,6 +1,8 @@
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
+#include <atomic>
 #include <fstream>
 
 #include "fake_daemon.h"
@@ -93,11 +95,70 @@ TEST(kivctl, says_what_it_sends_and_what_went_wrong) {
     }
 }
 
+TEST(kivctl, hands_over_configurations_and_prints_their_parts) {
+    const socket_directory directory;
+    const bound_socket producer_socket(SOCK_DGRAM, directory.path + "/kiv_cl");
+    const std::string content("\0part\n", 6);
+    std::ofstream(directory.path + "/part") << content;
+    const int part = open((directory.path + "/part").c_str(), O_RDONLY | O_CLOEXEC);
+    std::atomic<bool> is_taken = true;
+    control_server server(directory.path, [&](const std::string& request) {
+        if (request == "GC p n") return std::optional(control_answer("OK", {part}));
+        return allowing("id", is_taken ? "1" : "0")(request);
+    });
+    const auto file = [&](size_t size) {
+        const std::string path = directory.path + "/" + std::to_string(size);
+        std::ofstream(path) << std::string(size, 'c');
+        return path;
+    };
+    const std::string install = "config install ", install_input = install + "- <";
+    const struct {
+        std::string arguments;
+        bool is_taken;
+        int status;
+        std::string output;  // part of it
+        std::string sent;
+    } cases[] = {
+        {install + file(31'173), true, 0, "taken\n", "GD WC " + std::string(31'173, 'c') + " NC "},
+        {install_input + file(1), true, 0, "taken\n", "GD WC c NC "},
+        {install + file(1), false, 1, "did not take the configuration", "GD WC c NC "},
+        {install + file(0), true, 1, "/0 is empty", ""},
+        {install + file(31'174), true, 1, "has 31174 bytes, but a request carries at most 31173",
+         ""},
+        {install + file(204'799), true, 1, "as input/config, then run", ""},
+        {install + file(204'800), true, 1, "which has at most 204799 bytes", ""},
+        {install + directory.path, true, 1, "cannot read " + directory.path, ""},
+        {install + "/none", true, 1, "cannot open /none", ""},
+        {"config announce", true, 0, "taken\n", "GD NC "},
+        {"config announce", false, 1, "no input/config in its directory", "GD NC "},
+        {"config get p n", true, 0, content, "GC p n "},
+        {"config get p n >/dev/full", true, 1, "No space left", "GC p n "},
+        {"config get q n", true, 1, "has no part \"n\" of the package \"q\"", "GC q n "},
+        {"wanted p wanted", true, 0, "wanted\n", "PA p wanted "},
+        {"wanted p n", true, 1, "not wanted\n", "PA p n "},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.arguments);
+        is_taken = c.is_taken;
+        lseek(part, 0, SEEK_SET);
+        const auto [status, output] = run_kivctl("--base " + directory.path + " " + c.arguments);
+        EXPECT_EQ(status, c.status) << output;
+        EXPECT_NE(output.find(c.output), std::string::npos) << output;
+        EXPECT_EQ(output.starts_with("kivctl: "), c.status != 0 && c.output != "not wanted\n");
+        std::string sent;
+        for (const auto& request : server.take_requests()) sent += request + " ";
+        EXPECT_EQ(sent, c.sent);
+    }
+    close(part);
+}
+
 TEST(kivctl, tells_a_refused_caller) {
     const socket_directory directory;
     const bound_socket producer_socket(SOCK_DGRAM, directory.path + "/kiv_cl");
     const control_server server(directory.path, refusing());
-    for (const char* command : {"flush", "device-id", "remove-report all"}) {
+    const auto commands = {"flush", "device-id", "remove-report all", "config announce",
+                           "config install /etc/passwd"};
+    for (const char* command : commands) {
         SCOPED_TRACE(command);
         const auto [status, output] = run_kivctl("--base " + directory.path + " " + command);
         EXPECT_EQ(status, 1);

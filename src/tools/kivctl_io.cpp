@@ -1,0 +1,54 @@
+#include "tools/kivctl_io.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+[[noreturn]] void fail(const std::string& what) { throw failure(what + ": " + strerror(errno)); }
+
+[[noreturn]] void fail_output() { fail("cannot write to standard output"); }
+
+}  // namespace
+
+std::string name_source(const std::string& path) { return path == "-" ? "standard input" : path; }
+
+std::string read_source(const std::string& path, size_t size_max, const char* kind) {
+    const bool is_input = path == "-";
+    const unique_file opened(is_input ? nullptr : fopen(path.c_str(), "re"));
+    FILE* file = is_input ? stdin : opened.get();
+    const std::string source = name_source(path);
+    if (file == nullptr) fail("cannot open " + source);
+    std::string content(size_max + 1, '\0');  // one more shows that there is more
+    content.resize(fread(content.data(), 1, content.size(), file));
+    if (ferror(file) != 0) fail("cannot read " + source);
+    if (content.size() > size_max) {
+        throw failure(source + " is too large for " + kind + ", which has at most " +
+                      std::to_string(size_max) + " bytes");
+    }
+    return content;
+}
+
+void print_line(const char* text) {
+    if (puts(text) < 0 || fflush(stdout) != 0) fail_output();
+}
+
+void print_content(int fd) {
+    char bytes[16'384];
+    ssize_t size;
+    while ((size = read(fd, bytes, sizeof bytes)) != 0) {
+        if (size < 0 && errno == EINTR) continue;
+        if (size < 0) fail("cannot read what the daemon handed over");
+        const auto count = static_cast<size_t>(size);
+        if (fwrite(bytes, 1, count, stdout) != count) fail_output();
+    }
+    if (fflush(stdout) != 0) fail_output();
+}
+
+}  // namespace kivd
