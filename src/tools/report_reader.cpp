@@ -4,9 +4,8 @@
 
 #include <algorithm>
 #include <cstdio>
-#include <string_view>
 
-#include "tools/report_bytes.h"
+#include "tools/unpacked_bytes.h"
 
 namespace kivd {
 namespace {
@@ -19,7 +18,7 @@ constexpr size_t longest_length_varint = 5;
 // The part of the file behind the last record taken.
 class data_window {
  public:
-    explicit data_window(report_bytes& bytes) : bytes_(bytes) {}
+    explicit data_window(unpacked_bytes& bytes) : bytes_(bytes) {}
 
     // Tries to have `size` bytes there and gives what there is: fewer at the end of the data.
     std::string_view ahead(size_t size) {
@@ -39,7 +38,7 @@ class data_window {
     [[nodiscard]] uint64_t offset() const { return offset_; }
 
  private:
-    report_bytes& bytes_;
+    unpacked_bytes& bytes_;
     std::string data_;
     size_t start_ = 0;
     uint64_t offset_ = 0;
@@ -122,7 +121,7 @@ bool decode(const record& whole, kiv::Report& piece) {
 }
 
 // Gives why reading stopped, empty at a good end.
-std::string read_records(data_window& window, report_bytes& bytes, const reading_limits& limits,
+std::string read_records(data_window& window, unpacked_bytes& bytes, const reading_limits& limits,
                          kiv::Report& report) {
     kiv::Report piece;
     size_t memory_size = 0;
@@ -147,26 +146,36 @@ std::string read_records(data_window& window, report_bytes& bytes, const reading
     return bytes.problem();
 }
 
-}  // namespace
-
-report_file read_report(const std::string& path, const reading_limits& limits) {
+report_file read_all(unpacked_bytes& bytes, const reading_limits& limits) {
     report_file file;
-    report_bytes bytes(path);
     data_window window(bytes);
     const std::string reason = read_records(window, bytes, limits, file.report);
     file.is_gzip = bytes.is_gzip();
-    file.file_size = bytes.file_offset();
+    file.file_size = bytes.offset();
     file.data_size = window.offset();
     if (reason.empty() && file.data_size > 0) return file;
     if (reason.empty()) {
         file.problem = file.is_gzip ? "the gzip data is empty" : "the file is empty";
-    } else if (bytes.file_offset() == 0) {
+    } else if (bytes.offset() == 0) {
         file.problem = reason;  // not even opened
     } else {
         file.problem = "stopped at byte " + std::to_string(file.data_size) +
                        (file.is_gzip ? " of the decompressed data: " : ": ") + reason;
     }
     return file;
+}
+
+}  // namespace
+
+report_file read_report(const std::string& path, const reading_limits& limits) {
+    unpacked_bytes bytes(path);
+    return read_all(bytes, limits);
+}
+
+report_file read_report_bytes(std::string_view content, const char* place,
+                              const reading_limits& limits) {
+    unpacked_bytes bytes(content, place);
+    return read_all(bytes, limits);
 }
 
 bool is_sealed(const kiv::Report& report) {
