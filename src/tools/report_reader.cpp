@@ -178,9 +178,4 @@ report_file read_report_bytes(std::string_view content, const char* place,
     return read_all(bytes, limits);
 }
 
-bool is_sealed(const kiv::Report& report) {
-    return report.has_encryption_key() || report.has_encryption_iv() ||
-           report.has_encrypted_compressed_data();
-}
-
 }  // namespace kivd

@@ -34,7 +34,4 @@ struct report_file {
 [[nodiscard]] report_file read_report_bytes(std::string_view content, const char* place,
                                             const reading_limits& limits = {});
 
-// Whether the report's content is encrypted for its collectors.
-[[nodiscard]] bool is_sealed(const kiv::Report& report);
-
 }  // namespace kivd
