@@ -2,9 +2,9 @@
 
 #include <google/protobuf/descriptor.h>
 
-#include <algorithm>
 #include <cstdio>
 
+#include "tools/length_varint.h"
 #include "tools/unpacked_bytes.h"
 
 namespace kivd {
@@ -13,7 +13,6 @@ namespace {
 using google::protobuf::FieldDescriptor;
 
 constexpr unsigned wire_type_length_delimited = 2;
-constexpr size_t longest_length_varint = 5;
 
 // The part of the file behind the last record taken.
 class data_window {
@@ -50,21 +49,6 @@ struct record {
     std::string problem;
     bool is_cut = false;  // the problem is that the data ends
 };
-
-struct length_varint {
-    size_t size;  // 0: not whole, or longer than any
-    uint64_t value;
-};
-
-length_varint read_length(std::string_view data) {
-    uint64_t value = 0;
-    for (size_t i = 0; i < std::min(data.size(), longest_length_varint); ++i) {
-        const auto byte = static_cast<uint8_t>(data[i]);
-        value |= static_cast<uint64_t>(byte & 0x7f) << (7 * i);
-        if (byte < 0x80) return {i + 1, value};
-    }
-    return {0, 0};
-}
 
 const FieldDescriptor* find_field(uint8_t key) {
     if ((key & 7) != wire_type_length_delimited) return nullptr;
