@@ -1,41 +1,112 @@
-// kivtool: looks into what kivd leaves on disk. Needs no daemon.
+// kivtool: looks into what kivd leaves on disk and makes what it is configured with. Needs no
+// daemon.
 #include <google/protobuf/stubs/logging.h>
 
 #include <CLI/CLI.hpp>
 #include <exception>
 #include <iostream>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "tools/config_build.h"
+#include "tools/config_show.h"
 #include "tools/report_command.h"
 
 namespace {
 constexpr int wrong_usage = 2;
+
+struct report_given {
+    std::vector<std::string> paths;
+    kivd::report_options options;
+    bool json = false;
+    bool summary = false;
+};
+
+CLI::App* add_report(CLI::App& app, report_given& given) {
+    CLI::App* report = app.add_subcommand(
+        "report", "Prints reports, and unfinished ones (private/events), as protobuf text");
+    report->add_flag("--json", given.json, "Print one JSON document for each file");
+    report->add_flag("--summary", given.summary, "Print a summary for people")->excludes("--json");
+    report->add_option("--key", given.options.key_path,
+                       "Private key (PEM) that opens sealed reports");
+    report->add_option("FILE", given.paths, "Files to read")->required();
+    return report;
 }
+
+int run_report(report_given& given) {
+    if (given.json) given.options.view = kivd::report_view::json;
+    if (given.summary) given.options.view = kivd::report_view::summary;
+    return kivd::run_report_command(given.paths, given.options, std::cout, std::cerr);
+}
+
+struct build_given {
+    std::vector<std::string> parts;
+    kivd::config_build_options options;
+};
+
+std::string check_part(const std::string& argument) {
+    return kivd::read_part_argument(argument) ? "" : argument + " is not PACKAGE:NAME=FILE";
+}
+
+CLI::App* add_build(CLI::App& config, build_given& given) {
+    CLI::App* build = config.add_subcommand("build", "Makes a configuration file");
+    build->add_option("-o,--output", given.options.output_path, "File to make")->required();
+    build->add_option("--sign", given.options.key_path, "Private key (PEM) to sign with");
+    build
+        ->add_option("PACKAGE:NAME=FILE", given.parts,
+                     "A part and the file with its payload; for FilterConfig, Settings, RunActions "
+                     "and RunActionsOnce of package kivd, the file is protobuf text")
+        ->required()
+        ->check(check_part);
+    return build;
+}
+
+int run_build(const build_given& given) {
+    std::vector<kivd::part_source> sources;
+    for (const std::string& part : given.parts) {
+        sources.push_back(*kivd::read_part_argument(part));
+    }
+    return kivd::run_config_build(sources, given.options, std::cerr);
+}
+
+struct show_given {
+    std::string path;
+    std::optional<std::string> key_path;
+};
+
+CLI::App* add_show(CLI::App& config, show_given& given) {
+    CLI::App* show = config.add_subcommand("show", "Prints what a configuration file holds");
+    show->add_option("--key", given.key_path, "Public key (PEM) to check the signature with");
+    show->add_option("FILE", given.path, "File to read")->required();
+    return show;
+}
+
+}  // namespace
 
 int main(int argc, char** argv) try {
     google::protobuf::SetLogHandler(nullptr);  // problems are told once, by us
 
-    CLI::App app("Looks into the files that kivd leaves.", "kivtool");
+    CLI::App app("Looks into the files that kivd leaves and makes those that it is given.",
+                 "kivtool");
     app.require_subcommand(1);
-
-    std::vector<std::string> paths;
-    bool json = false;
-    bool summary = false;
-    CLI::App* report = app.add_subcommand(
-        "report", "Prints reports, and unfinished ones (private/events), as protobuf text");
-    report->add_flag("--json", json, "Print one JSON document for each file");
-    report->add_flag("--summary", summary, "Print a summary for people")->excludes("--json");
-    report->add_option("FILE", paths, "Files to read")->required();
+    report_given reporting;
+    build_given building;
+    show_given showing;
+    const CLI::App* report = add_report(app, reporting);
+    CLI::App* config = app.add_subcommand("config", "Makes and shows configuration files");
+    config->require_subcommand(1);
+    const CLI::App* build = add_build(*config, building);
+    add_show(*config, showing);
 
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? 0 : wrong_usage;
     }
-    const auto other_view = summary ? kivd::report_view::summary : kivd::report_view::text;
-    const auto view = json ? kivd::report_view::json : other_view;
-    return kivd::run_report_command(paths, view, std::cout, std::cerr);
+    if (report->parsed()) return run_report(reporting);
+    if (build->parsed()) return run_build(building);
+    return kivd::run_config_show(showing.path, showing.key_path, std::cout, std::cerr);
 } catch (const std::exception& error) {
     std::cerr << "kivtool: " << error.what() << '\n';
     return 1;

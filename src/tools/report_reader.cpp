@@ -2,11 +2,10 @@
 
 #include <google/protobuf/descriptor.h>
 
-#include <algorithm>
 #include <cstdio>
-#include <string_view>
 
-#include "tools/report_bytes.h"
+#include "tools/length_varint.h"
+#include "tools/unpacked_bytes.h"
 
 namespace kivd {
 namespace {
@@ -14,12 +13,11 @@ namespace {
 using google::protobuf::FieldDescriptor;
 
 constexpr unsigned wire_type_length_delimited = 2;
-constexpr size_t longest_length_varint = 5;
 
 // The part of the file behind the last record taken.
 class data_window {
  public:
-    explicit data_window(report_bytes& bytes) : bytes_(bytes) {}
+    explicit data_window(unpacked_bytes& bytes) : bytes_(bytes) {}
 
     // Tries to have `size` bytes there and gives what there is: fewer at the end of the data.
     std::string_view ahead(size_t size) {
@@ -39,7 +37,7 @@ class data_window {
     [[nodiscard]] uint64_t offset() const { return offset_; }
 
  private:
-    report_bytes& bytes_;
+    unpacked_bytes& bytes_;
     std::string data_;
     size_t start_ = 0;
     uint64_t offset_ = 0;
@@ -51,21 +49,6 @@ struct record {
     std::string problem;
     bool is_cut = false;  // the problem is that the data ends
 };
-
-struct length_varint {
-    size_t size;  // 0: not whole, or longer than any
-    uint64_t value;
-};
-
-length_varint read_length(std::string_view data) {
-    uint64_t value = 0;
-    for (size_t i = 0; i < std::min(data.size(), longest_length_varint); ++i) {
-        const auto byte = static_cast<uint8_t>(data[i]);
-        value |= static_cast<uint64_t>(byte & 0x7f) << (7 * i);
-        if (byte < 0x80) return {i + 1, value};
-    }
-    return {0, 0};
-}
 
 const FieldDescriptor* find_field(uint8_t key) {
     if ((key & 7) != wire_type_length_delimited) return nullptr;
@@ -122,7 +105,7 @@ bool decode(const record& whole, kiv::Report& piece) {
 }
 
 // Gives why reading stopped, empty at a good end.
-std::string read_records(data_window& window, report_bytes& bytes, const reading_limits& limits,
+std::string read_records(data_window& window, unpacked_bytes& bytes, const reading_limits& limits,
                          kiv::Report& report) {
     kiv::Report piece;
     size_t memory_size = 0;
@@ -147,20 +130,17 @@ std::string read_records(data_window& window, report_bytes& bytes, const reading
     return bytes.problem();
 }
 
-}  // namespace
-
-report_file read_report(const std::string& path, const reading_limits& limits) {
+report_file read_all(unpacked_bytes& bytes, const reading_limits& limits) {
     report_file file;
-    report_bytes bytes(path);
     data_window window(bytes);
     const std::string reason = read_records(window, bytes, limits, file.report);
     file.is_gzip = bytes.is_gzip();
-    file.file_size = bytes.file_offset();
+    file.file_size = bytes.offset();
     file.data_size = window.offset();
     if (reason.empty() && file.data_size > 0) return file;
     if (reason.empty()) {
         file.problem = file.is_gzip ? "the gzip data is empty" : "the file is empty";
-    } else if (bytes.file_offset() == 0) {
+    } else if (bytes.offset() == 0) {
         file.problem = reason;  // not even opened
     } else {
         file.problem = "stopped at byte " + std::to_string(file.data_size) +
@@ -169,9 +149,17 @@ report_file read_report(const std::string& path, const reading_limits& limits) {
     return file;
 }
 
-bool is_sealed(const kiv::Report& report) {
-    return report.has_encryption_key() || report.has_encryption_iv() ||
-           report.has_encrypted_compressed_data();
+}  // namespace
+
+report_file read_report(const std::string& path, const reading_limits& limits) {
+    unpacked_bytes bytes(path);
+    return read_all(bytes, limits);
+}
+
+report_file read_report_bytes(std::string_view content, const char* place,
+                              const reading_limits& limits) {
+    unpacked_bytes bytes(content, place);
+    return read_all(bytes, limits);
 }
 
 }  // namespace kivd

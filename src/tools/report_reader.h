@@ -5,6 +5,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 
 #include "report.pb.h"
 
@@ -28,7 +29,9 @@ struct report_file {
 
 [[nodiscard]] report_file read_report(const std::string& path, const reading_limits& limits = {});
 
-// Whether the report's content is encrypted for its collectors.
-[[nodiscard]] bool is_sealed(const kiv::Report& report);
+// The same for the content of a file, less than 4 GiB. `place` is what problems call it, such as
+// "the sealed data".
+[[nodiscard]] report_file read_report_bytes(std::string_view content, const char* place,
+                                            const reading_limits& limits = {});
 
 }  // namespace kivd

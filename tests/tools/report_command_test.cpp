@@ -2,6 +2,7 @@
 
 #include <sstream>
 
+#include "outside_tools.h"
 #include "sample_reports.h"
 
 namespace kivd {
@@ -25,19 +26,19 @@ TEST_F(report_command, shows_every_file_it_can_and_tells_what_is_wrong_with_the_
         "kivtool: " + missing + ": cannot be opened: No such file or directory\n" +
         "kivtool: " + torn + ": stopped at byte " + std::to_string(records.size()) +
         ": the record there is cut short: it has 9 of its 17 bytes\n" + "kivtool: " + sealed +
-        ": the report is sealed, only its private report key can open it\n";
+        ": the report is sealed, give the private key that opens it with --key\n";
 
     for (const report_view view : views) {
         SCOPED_TRACE(static_cast<int>(view));
         std::ostringstream out, err;
-        EXPECT_EQ(run_report_command({missing, torn, sealed, good}, view, out, err), 1);
+        EXPECT_EQ(run_report_command({missing, torn, sealed, good}, {view}, out, err), 1);
         const std::string text = out.str();
         EXPECT_NE(text.find("shown"), text.rfind("shown")) << text;  // in both files
         EXPECT_EQ(text.find("torn"), std::string::npos) << text;
         EXPECT_EQ(err.str(), complaints);
 
         std::ostringstream good_err;
-        EXPECT_EQ(run_report_command({good}, view, out, good_err), 0) << good_err.str();
+        EXPECT_EQ(run_report_command({good}, {view}, out, good_err), 0) << good_err.str();
     }
 }
 
@@ -46,8 +47,135 @@ TEST_F(report_command, tells_when_its_output_is_lost) {
     for (const report_view view : views) {
         std::ofstream full("/dev/full");
         std::ostringstream err;
-        EXPECT_EQ(run_report_command({good}, view, full, err), 1);
+        EXPECT_EQ(run_report_command({good}, {view}, full, err), 1);
         EXPECT_EQ(err.str(), "kivtool: the output could not be written\n");
+    }
+}
+
+constexpr char empty_header[] =
+    "header { product_id: '' software_version: '' software_variant: '' device_id: '' }";
+
+// A sealed report, piece by piece, so that tests can spoil any of them.
+struct envelope {
+    std::string key, iv, secret;
+
+    [[nodiscard]] std::string bytes() const {
+        kiv::Report report = report_of(empty_header);
+        report.set_encryption_key(key);
+        report.set_encryption_iv(iv);
+        report.set_encrypted_compressed_data(secret);
+        return report.SerializeAsString();
+    }
+};
+
+class sealed_reports : public report_files {
+ protected:
+    sealed_reports() { make_key(directory, "key"); }
+
+    // Sealed by the openssl program for key.pub.pem.
+    envelope seal(const std::string& content, const std::string& aes_key = "a one-time key!!") {
+        write("aes", aes_key);
+        write("content", content);
+        const outcome sealed = run("cd " + directory.string() +
+                                   " && openssl pkeyutl -encrypt -pubin -inkey key.pub.pem"
+                                   "    -in aes -out aes.sealed"
+                                   " && openssl enc -aes-128-cbc -in content -out secret"
+                                   "    -K 61206f6e652d74696d65206b65792121"
+                                   "    -iv 30313233343536373839616263646566");
+        EXPECT_EQ(sealed.status, 0) << sealed.output;
+        return {read("aes.sealed"), "0123456789abcdef", read("secret")};
+    }
+
+    std::string read(const std::string& name) {
+        std::ostringstream bytes;
+        bytes << std::ifstream(directory / name, std::ios::binary).rdbuf();
+        return bytes.str();
+    }
+};
+
+TEST_F(sealed_reports, are_shown_as_plain_ones_are_with_the_key_that_opens_them) {
+    const std::string content = gzip(records_of(header_text + event_text("shown")));
+    const std::string plain = write("kiv_1", content);
+    std::vector<std::string> shown;
+    for (const report_view view : views) {
+        std::ostringstream out, err;
+        EXPECT_EQ(run_report_command({plain}, {view}, out, err), 0);
+        shown.push_back(out.str());
+    }
+    write("kiv_1", seal(content).bytes());
+    const report_options options = {report_view::text, directory / "key.pem"};
+    for (const report_view view : views) {
+        SCOPED_TRACE(static_cast<int>(view));
+        std::ostringstream out, err;
+        EXPECT_EQ(run_report_command({plain}, {view, options.key_path}, out, err), 0) << err.str();
+        EXPECT_EQ(out.str(), shown[static_cast<size_t>(view)]);
+    }
+
+    // What is torn or follows is told all the same.
+    const std::string torn = content.substr(0, content.size() - 1);
+    for (const std::string& bytes : {seal(content).bytes() + "?", seal(torn).bytes()}) {
+        write("kiv_1", bytes);
+        std::ostringstream out, err;
+        EXPECT_EQ(run_report_command({plain}, options, out, err), 1);
+        EXPECT_EQ(out.str(), shown[0]);
+        EXPECT_NE(err.str().find("stopped at byte"), std::string::npos) << err.str();
+    }
+}
+
+TEST_F(sealed_reports, that_do_not_open_are_told_and_the_next_is_shown) {
+    make_key(directory, "other");
+    make_key(directory, "ec", "EC -pkeyopt ec_paramgen_curve:P-256");
+    const std::string content = gzip(records_of(header_text + event_text("shown")), 0);
+    const envelope good = seal(content);
+    const auto spoilt = [&](std::string envelope::*piece, size_t at) {
+        envelope bad = good;
+        (bad.*piece)[at] = static_cast<char>((bad.*piece)[at] ^ 1);
+        return bad;
+    };
+    const auto with = [&](std::string envelope::*piece, std::string value) {
+        envelope bad = good;
+        bad.*piece = std::move(value);
+        return bad;
+    };
+    const std::string shut = "the report is sealed for another key, or damaged";
+    const std::string not_all = "what is needed to open it is not all there";
+    const struct {
+        const char* what;
+        envelope bad;
+        std::string problem;
+        const char* key = "key.pem";
+    } cases[] = {
+        {"other key", good, shut, "other.pem"},
+        {"no RSA key", good, shut, "ec.pem"},
+        {"one-time key", spoilt(&envelope::key, 100), shut},
+        {"one-time key too short", seal(content, "15 bytes, no 16"), shut},
+        {"IV", spoilt(&envelope::iv, 0), shut},
+        {"IV too short", with(&envelope::iv, "0123456789abcde"), not_all},
+        {"data too short", with(&envelope::secret, good.secret.substr(1)), shut},
+        {"data without its end", with(&envelope::secret, good.secret.substr(0, 32)), shut},
+        {"no data", with(&envelope::secret, ""), shut},
+        {"data", spoilt(&envelope::secret, 40), "stopped at byte"},
+        {"no gzip", seal(records_of(header_text)), shut},
+        {"twice", seal(gzip(good.bytes())), "the report is sealed twice"},
+    };
+    for (const auto& bad : cases) {
+        SCOPED_TRACE(bad.what);
+        const std::string first = write("kiv_1", bad.bad.bytes());
+        const std::string second = write("kiv_2", content);
+        std::ostringstream out, err;
+        EXPECT_EQ(
+            run_report_command({first, second}, {report_view::text, directory / bad.key}, out, err),
+            1);
+        EXPECT_TRUE(err.str().starts_with("kivtool: " + first + ": ")) << err.str();
+        EXPECT_NE(err.str().find(bad.problem), std::string::npos) << err.str();
+        EXPECT_NE(out.str().find("# " + second), std::string::npos) << out.str();
+    }
+
+    for (const char* key : {"none.pem", "key.pub.pem"}) {
+        std::ostringstream out, err;
+        const std::string path = directory / key;
+        EXPECT_EQ(run_report_command({"kiv_1"}, {report_view::text, path}, out, err), 1);
+        EXPECT_TRUE(err.str().starts_with("kivtool: " + path + ": ")) << err.str();
     }
 }
 

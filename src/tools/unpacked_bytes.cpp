@@ -1,4 +1,4 @@
-#include "tools/report_bytes.h"
+#include "tools/unpacked_bytes.h"
 
 #include <cerrno>
 #include <cstring>
@@ -10,34 +10,50 @@ namespace {
 constexpr int gzip_only = 16 + MAX_WBITS;
 constexpr Bytef gzip_magic[] = {0x1f, 0x8b};
 constexpr size_t piece_size = 65536;
-
-std::string number(uint64_t value) { return std::to_string(value); }
 }  // namespace
 
-report_bytes::report_bytes(const std::string& path) : file_(fopen(path.c_str(), "re")) {
+unpacked_bytes::unpacked_bytes(const std::string& path)
+    : place_("the file"), file_(fopen(path.c_str(), "re")) {
     if (!file_) {
         fail(std::string("cannot be opened: ") + strerror(errno));
         return;
     }
-    if (!fill()) return;
+    if (fill()) start();
+}
+
+unpacked_bytes::unpacked_bytes(std::string_view bytes, const char* place) : place_(place) {
+    // zlib's input pointer is not const, but nothing is ever written through it.
+    inflater_.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
+    inflater_.avail_in = static_cast<uInt>(bytes.size());
+    bytes_read_ = bytes.size();
+    start();
+}
+
+// Looks at the first bytes.
+void unpacked_bytes::start() {
     is_gzip_ = inflater_.avail_in >= sizeof gzip_magic &&
                memcmp(inflater_.next_in, gzip_magic, sizeof gzip_magic) == 0;
     if (is_gzip_ && inflateInit2(&inflater_, gzip_only) != Z_OK) throw std::bad_alloc();
     in_member_ = is_gzip_;
 }
 
-report_bytes::~report_bytes() {
+unpacked_bytes::~unpacked_bytes() {
     if (is_gzip_) inflateEnd(&inflater_);
 }
 
-bool report_bytes::fail(std::string problem) {
+bool unpacked_bytes::fail(std::string problem) {
     problem_ = std::move(problem);
     return false;
 }
 
-// Makes sure that there is input; false at the end of the file or with a problem.
-bool report_bytes::fill() {
+std::string unpacked_bytes::position() const {
+    return "byte " + std::to_string(offset()) + " of " + place_;
+}
+
+// Makes sure that there is input; false at the end of the source or with a problem.
+bool unpacked_bytes::fill() {
     if (inflater_.avail_in > 0) return true;
+    if (!file_) return false;
     const size_t size = fread(input_.data(), 1, input_.size(), file_.get());
     if (size == 0 && ferror(file_.get())) {
         return fail(std::string("cannot be read: ") + strerror(errno));
@@ -48,18 +64,18 @@ bool report_bytes::fill() {
     return size > 0;
 }
 
-bool report_bytes::start_member() {
+bool unpacked_bytes::start_member() {
     if (!fill()) return false;  // a good end
     if (*inflater_.next_in != gzip_magic[0]) {
-        return fail("bytes that are not gzip data follow at byte " + number(file_offset()) +
-                    " of the file");
+        has_foreign_tail_ = true;
+        return fail("bytes that are not gzip data follow at " + position());
     }
     if (inflateReset(&inflater_) != Z_OK) throw std::bad_alloc();
     in_member_ = true;
     return true;
 }
 
-bool report_bytes::inflate_some(std::string& to) {
+bool unpacked_bytes::inflate_some(std::string& to) {
     const size_t old_size = to.size();
     to.resize(old_size + piece_size);
     inflater_.next_out = reinterpret_cast<Bytef*>(to.data() + old_size);
@@ -69,11 +85,11 @@ bool report_bytes::inflate_some(std::string& to) {
     if (result == Z_STREAM_END) in_member_ = false;
     if (result == Z_STREAM_END || result == Z_OK || result == Z_BUF_ERROR) return true;
     if (result == Z_MEM_ERROR) throw std::bad_alloc();
-    return fail("the gzip data is damaged at byte " + number(file_offset()) + " of the file (" +
+    return fail("the gzip data is damaged at " + position() + " (" +
                 (inflater_.msg ? inflater_.msg : zError(result)) + ")");
 }
 
-bool report_bytes::read_some(std::string& to) {
+bool unpacked_bytes::read_some(std::string& to) {
     if (!problem_.empty()) return false;
     if (!is_gzip_) {
         if (!fill()) return false;
@@ -86,8 +102,7 @@ bool report_bytes::read_some(std::string& to) {
         if (!in_member_ && !start_member()) return false;
         if (!fill()) {
             if (!problem_.empty()) return false;
-            return fail("the gzip data is cut short at byte " + number(bytes_read_) +
-                        " of the file");
+            return fail("the gzip data is cut short at " + position());
         }
         if (!inflate_some(to)) return to.size() > old_size;
     }

@@ -1,0 +1,409 @@
+#include <random>
+#include <sstream>
+
+#include "config.pb.h"
+#include "outside_tools.h"
+#include "sample_reports.h"
+#include "support/daemon_process.h"
+#include "support/scratch_directory.h"
+#include "tools/config_build.h"
+#include "tools/config_show.h"
+
+namespace kivd {
+namespace {
+
+using namespace std::string_literals;
+
+constexpr size_t largest_file = 204799;
+constexpr size_t largest_package = 8 << 20;
+
+class configurations : public report_files {
+ protected:
+    struct shown {
+        int status;
+        std::string out, err;
+    };
+
+    // Builds `output` of parts given as on the command line, with files in the directory; gives
+    // what is wrong.
+    std::string build(const std::vector<std::string>& arguments, const std::string& key = "") {
+        std::vector<part_source> sources;
+        for (const std::string& argument : arguments) {
+            sources.push_back(read_part_argument(argument).value());
+            sources.back().path = directory / sources.back().path;
+        }
+        config_build_options options = {output};
+        if (!key.empty()) options.key_path = directory / key;
+        std::ostringstream err;
+        const int status = run_config_build(sources, options, err);
+        EXPECT_EQ(status, err.str().empty() ? 0 : 1) << err.str();
+        return err.str();
+    }
+
+    shown show(std::string_view bytes, const std::string& key = "") {
+        const std::string path = write("shown", bytes);
+        std::ostringstream out, err;
+        std::optional<std::string> key_path;
+        if (!key.empty()) key_path = directory / key;
+        const int status = run_config_show(path, key_path, out, err);
+        return {status, out.str(), err.str()};
+    }
+
+    const std::string output = directory / "config.bin";
+    const google::protobuf::LogSilencer silencer;
+};
+
+std::string packed_part(const std::string& package, const std::string& name,
+                        const std::string& payload) {
+    kiv::config::ConfigPackage all;
+    kiv::config::ConfigPart& part = *all.add_parts();
+    part.set_package(package);
+    part.set_name(name);
+    part.set_payload(payload);
+    return all.SerializeAsString();
+}
+
+std::string file_of(const std::string& compressed_data, const char* signature = nullptr) {
+    kiv::config::ConfigResponse file;
+    if (signature) file.set_signature(signature);
+    file.set_compressed_data(compressed_data);
+    return file.SerializeAsString();
+}
+
+std::string noise(size_t size) {
+    std::mt19937 random;  // the same each time
+    std::string bytes(size, '\0');
+    for (char& byte : bytes) byte = static_cast<char>(random());
+    return bytes;
+}
+
+TEST_F(configurations, are_what_the_programs_of_others_take_for_one) {
+    write("filters", "event_filter { type: INCLUDE item { package: 'shop' name: '*' } } # all");
+    write("once", "remove_reports: true");
+    write("raw", "\0\xff\n"s);
+    make_key(directory, "rsa");
+    make_key(directory, "ec", "EC -pkeyopt ec_paramgen_curve:P-256");
+    for (const std::string key : {"", "rsa", "ec"}) {
+        SCOPED_TRACE(key);
+        ASSERT_EQ(build({"kivd:FilterConfig=filters", "shop:a:b=raw", "kivd:RunActionsOnce=once"},
+                        key.empty() ? "" : key + ".pem"),
+                  "");
+        const std::string bytes = read_file(output);
+        EXPECT_EQ(bytes[0], key.empty() ? '\x12' : '\x0a');
+
+        kiv::config::ConfigResponse file;
+        ASSERT_TRUE(file.ParseFromString(bytes));
+        write("signature", file.signature());
+        write("package.gz", file.compressed_data());
+        const std::string in_directory = "cd " + directory.string() + " && ";
+        if (!key.empty()) {
+            EXPECT_EQ(run(in_directory + "openssl dgst -sha1 -verify " + key +
+                          ".pub.pem -signature signature package.gz")
+                          .output,
+                      "Verified OK\n");
+        }
+        EXPECT_EQ(
+            run(in_directory + "gzip -dc package.gz | protoc --decode=kiv.config.ConfigPackage"
+                               " -I " SOURCE_DIRECTORY "/proto config.proto")
+                .output,
+            "parts {\n  package: \"kivd\"\n  name: \"FilterConfig\"\n"
+            "  payload: \"\\n\\r\\010\\001\\022\\t\\n\\004shop\\022\\001*\"\n}\n"
+            "parts {\n  package: \"shop\"\n  name: \"a:b\"\n"
+            "  payload: \"\\000\\377\\n\"\n}\n"
+            "parts {\n  package: \"kivd\"\n  name: \"RunActionsOnce\"\n"
+            "  payload: \"\\010\\001\"\n}\n");
+
+        const shown seen = show(bytes);
+        EXPECT_EQ("checksum: " + run("sha1sum <" + output).output.substr(0, 40),
+                  seen.out.substr(0, 50));
+        EXPECT_NE(seen.out.find(key.empty() ? "signed: no\n" : "signed: yes"), std::string::npos);
+    }
+}
+
+TEST_F(configurations, of_the_documentation_are_built_and_shown) {
+    const struct {
+        const char *example, *part;
+    } texts[] = {
+        {"filters", "FilterConfig"},
+        {"settings", "Settings"},
+        {"run-actions", "RunActions"},
+        {"run-actions-once", "RunActionsOnce"},
+    };
+    for (const auto& text : texts) {
+        SCOPED_TRACE(text.part);
+        const std::string part = "kivd:"s + text.part + "=text";
+        write("text", doc_example("configuration.md", "text", text.example));
+        ASSERT_EQ(build({part}), "");
+        const std::string bytes = read_file(output);
+
+        const std::string out = show(bytes).out;
+        write("text", out.substr(out.find("\n    ")));  // what was shown can be built from
+        ASSERT_EQ(build({part}), "");
+        EXPECT_EQ(read_file(output), bytes) << out;
+    }
+
+    write("settings", "max_report_size: 200000 expire_counters_age: 86400");
+    write("menu", "soup");
+    ASSERT_EQ(build({"kivd:Settings=settings", "shop:menu=menu"}), "");
+    const std::string example = doc_example("configuration.md", "hex", "configuration");
+    const std::string package = doc_example("configuration.md", "hex", "package");
+    for (const std::string& bytes : {read_file(output), example}) {
+        EXPECT_EQ(gunzip_file(write("package.gz", bytes.substr(2))), package);
+    }
+    EXPECT_EQ(read_file(output).substr(2, 10), example.substr(2, 10));  // no time of making
+    const shown seen = show(example);
+    EXPECT_EQ(seen.status, 0) << seen.err;
+    EXPECT_EQ(seen.out,
+              "checksum: 300f63ad033400de88d96c031ffa910456e5c269\nsigned: no\nparts: 2\n"
+              "part: kivd Settings, 8 bytes\n"
+              "    max_report_size: 200000\n    expire_counters_age: 86400\n"
+              "part: shop menu, 4 bytes\n    text: soup\n");
+}
+
+TEST_F(configurations, with_a_fault_in_a_text_say_where_it_is) {
+    const struct {
+        const char *part, *text, *problem;
+    } cases[] = {
+        {"Settings", "max_report_size: 1\nmax_report: 1", "2:11: "},
+        {"Settings", "\n  max_report_size: '1'", "2:20: Expected integer"},
+        {"Settings", "max_report_size: 4294967296", "1:18: Integer out of range"},
+        {"Settings", "max_report_size: '\xff'", "got: '\\xFF'"},
+        {"RunActions", "remove_reports: true", "has no field named"},
+        {"RunActionsOnce", "run_log_reader: true", "has no field named"},
+        {"FilterConfig", "event_filter {\n type: BOTH }", "2:13: Unknown enumeration value"},
+        {"FilterConfig", "\n\n counter_filter { }", "3:2: kiv.config.Filter lacks \"type\""},
+        {"FilterConfig", "event_filter {\n type: INCLUDE", "2:15: "},
+        {"FilterConfig",
+         "event_filter { type: INCLUDE\n item { package: 'p' name: 'n' }\n  item { package: 'p' } "
+         "}",
+         "3:3: kiv.config.FilterItem lacks \"name\""},
+        {"FilterConfig",
+         "event_filter { type: INCLUDE\n item: [ { package: 'p' name: 'n' }, { name: 'n' } ] }",
+         "1:1: kiv.config.FilterItem lacks \"package\""},
+    };
+    for (const auto& bad : cases) {
+        SCOPED_TRACE(bad.text);
+        const std::string path = write("text", bad.text);
+        const std::string problem = build({"kivd:"s + bad.part + "=text"});
+        EXPECT_TRUE(problem.starts_with("kivtool: " + path + ":")) << problem;
+        EXPECT_NE(problem.find(bad.problem), std::string::npos) << problem;
+    }
+}
+
+TEST_F(configurations, that_the_daemon_would_not_take_are_not_built) {
+    write("a", "a");
+    write("large", std::string(largest_package + 1, 'l'));
+    make_key(directory, "key");
+    // More than two primes, since those are found sooner.
+    make_key(directory, "large_key",
+             "RSA -pkeyopt rsa_keygen_bits:8208 -pkeyopt rsa_keygen_primes:5");
+    make_key(directory, "ed", "ED25519");
+    const std::string long_package(500, 'p');
+    const struct {
+        std::vector<std::string> parts;
+        std::string problem;
+        std::string key;
+    } cases[] = {
+        {{"kivd:_last_id=a"}, "kivd:_last_id: is the daemon's own", ""},
+        {{"p:n=a", "p:m=a", "p:n=a"}, "p:n: is given twice", ""},
+        {{long_package + ":" + std::string(501, 'n') + "=a"}, "at most 1000 bytes", ""},
+        {{"p:n=none"}, "/none: cannot be opened: No such file or directory", ""},
+        {{"p:n=."}, "/.: cannot be read: Is a directory", ""},
+        {{"p:n=large"}, "/large: has more than 8388608 bytes", ""},
+        {{"p:n=a"}, "/none: cannot be opened", "none"},
+        {{"p:n=a"}, "/key.pub.pem: holds no private key", "key.pub.pem"},
+        {{"p:n=a"}, "/ed.pem: cannot sign", "ed.pem"},
+        {{"p:n=a"}, "/large_key.pem: makes signatures of 1026 bytes", "large_key.pem"},
+    };
+    write("config.bin", "as before");
+    for (const auto& bad : cases) {
+        SCOPED_TRACE(bad.problem);
+        const std::string problem = build(bad.parts, bad.key);
+        EXPECT_NE(problem.find(bad.problem), std::string::npos) << problem;
+        EXPECT_EQ(read_file(output), "as before");
+    }
+    EXPECT_EQ(build({long_package + ":" + std::string(500, 'n') + "=a"}), "");
+
+    // Both sides of each limit of the whole.
+    const auto file_size = [&](size_t payload_size) {
+        write("noise", noise(payload_size));
+        write("config.bin", "");
+        const std::string problem = build({"p:n=noise"});
+        const bool is_too_large = problem.find("has at most 204799 bytes") != std::string::npos;
+        EXPECT_EQ(problem.empty(), !is_too_large) << problem;
+        return read_file(output).size();
+    };
+    const size_t guess = largest_file - 1000;
+    const size_t largest_payload = guess + largest_file - file_size(guess);
+    EXPECT_EQ(file_size(largest_payload), largest_file);
+    EXPECT_EQ(show(read_file(output)).status, 0);
+    EXPECT_EQ(file_size(largest_payload + 1), 0u);
+
+    const size_t overhead = packed_part("p", "n", std::string(1 << 21, ' ')).size() - (1 << 21);
+    write("blanks", std::string(largest_package - overhead, ' '));
+    EXPECT_EQ(build({"p:n=blanks"}), "");
+    EXPECT_EQ(show(read_file(output)).status, 0);
+    write("blanks", std::string(largest_package - overhead + 1, ' '));
+    EXPECT_NE(build({"p:n=blanks"}).find("at most 8388608"), std::string::npos);
+}
+
+TEST_F(configurations, appear_whole_or_not_at_all) {
+    const std::string before = noise(3000);
+    const std::string path = write("config.bin", before);
+    write("part", noise(4000));
+    EXPECT_EXIT(
+        {
+            limit_file_size(3500);
+            exit(build({"p:n=part"}).find("cannot be written: File too large") ==
+                 std::string::npos);
+        },
+        testing::ExitedWithCode(0), "");
+    EXPECT_EQ(read_file(path), before);
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(directory), {}), 2);
+
+    std::filesystem::remove(path);
+    std::filesystem::create_directory(path);
+    EXPECT_NE(build({"p:n=part"}).find("is no regular file"), std::string::npos);
+}
+
+TEST_F(configurations, of_another_form_are_told) {
+    const std::string part = packed_part("p", "n", "payload");
+    const std::string good = file_of(gzip(part), "signed");
+    EXPECT_EQ(show(good).status, 0);
+    for (size_t size = 0; size < good.size(); ++size) {
+        SCOPED_TRACE(size);
+        EXPECT_EQ(show(good.substr(0, size)).status, 1);
+    }
+
+    const std::string bomb = packed_part("p", "n", std::string(largest_package, ' '));
+    const struct {
+        std::string bytes, problem;
+    } cases[] = {
+        {"", "the file is empty"},
+        {"text", "the byte at its start is 0x74"},
+        {"\x0a\x01s", "it ends behind the signature"},
+        {"\x0a\x01s\x0a\x01s", "the byte behind the signature is 0x0A"},
+        {"\x0a\xff\xff\xff\xff\xff\x01", "the length of the signature does not end"},
+        {"\x12\x80", "the length of the package does not end"},
+        {"\x12\x04xyz", "the package should have 4 bytes, but 3 follow"},
+        {"\x12\xff\xff\xff\xff\x0fxyz", "should have 4294967295 bytes"},
+        {std::string(largest_file + 1, '\x12'), "has more than 204799 bytes"},
+        {file_of(gzip(part).substr(0, 20)), "the gzip data is cut short at byte 20"},
+        {file_of(gzip(bomb)), "the package has more than 8388608 bytes"},
+        {file_of(gzip("text")), "the package cannot be decoded"},
+        {file_of(gzip("\x0a\x03\x0a\x01p")), "the package cannot be decoded"},
+    };
+    for (const auto& bad : cases) {
+        SCOPED_TRACE(bad.problem);
+        const shown seen = show(bad.bytes);
+        EXPECT_EQ(seen.status, 1);
+        EXPECT_NE(seen.err.find(bad.problem), std::string::npos) << seen.err;
+        EXPECT_EQ(std::ranges::count(seen.err, '\n'), 1) << seen.err;
+    }
+}
+
+TEST_F(configurations, are_shown_with_what_is_odd_about_them) {
+    const std::string filter_of_type_3 = "\x0a\x02\x08\x03";
+    const struct {
+        std::string bytes, out;
+        std::string problem = "";
+    } cases[] = {
+        {file_of(""), "parts: 0\n"},
+        {file_of(packed_part("p", "n", "")), "note: the package is not compressed\n"},
+        {file_of(gzip(packed_part("p", "n", ""))) + "xyz", "note: 3 bytes behind the package"},
+        {file_of(gzip(packed_part("p", "n", "")) + "?"),
+         "follow at byte 30 of the compressed package and are"},
+        {file_of(packed_part("\x1b", "\xff", "a\tb\n")),
+         "part: \\x1B \\xFF, 4 bytes\n    text: a\\x09b\\x0A\n"},
+        {file_of(packed_part("p", "n", std::string(201, 't'))), "part: p n, 201 bytes\n"},
+        {file_of(packed_part("kivd", "Settings", "\x40\x01")), "    8: 1\n"},
+        {file_of(packed_part("kivd", "Settings", "text")), "part: kivd Settings, 4 bytes\n",
+         "the part kivd Settings cannot be decoded as kivd.Settings"},
+        {file_of(packed_part("kivd", "FilterConfig", filter_of_type_3)), "      1: 3\n",
+         "the part kivd FilterConfig lacks event_filter.type"},
+    };
+    for (const auto& odd : cases) {
+        const shown seen = show(odd.bytes);
+        SCOPED_TRACE(seen.out + seen.err);
+        EXPECT_EQ(seen.status, odd.problem.empty() ? 0 : 1);
+        EXPECT_NE(seen.out.find(odd.out), std::string::npos);
+        EXPECT_NE(seen.err.find(odd.problem), std::string::npos);
+    }
+    // Neither too long texts nor bytes that are no text.
+    for (const std::string& payload : {std::string(201, 't'), "\x1b[31m"s, "\xff"s, "\0"s}) {
+        const shown seen = show(file_of(packed_part("p", "n", payload)));
+        EXPECT_EQ(seen.out.find("text:"), std::string::npos) << seen.out;
+    }
+}
+
+TEST_F(configurations, are_held_against_their_signature) {
+    make_key(directory, "key");
+    make_key(directory, "other");
+    write("part", "payload");
+    EXPECT_EQ(build({"p:n=part"}), "");
+    const std::string unsigned_one = read_file(output);
+    EXPECT_EQ(build({"p:n=part"}, "key.pem"), "");
+    const std::string good = read_file(output);
+    std::string changed = good;
+    changed[265] = static_cast<char>(changed[265] ^ 1);  // the time stamp of the gzip data
+    const std::string padded = "\x0a\x82\x02" + good.substr(3, 256) + "++" + good.substr(3 + 256);
+
+    const struct {
+        const char* what;
+        std::string bytes, key, verdict;
+    } cases[] = {
+        {"good", good, "key.pub.pem", "valid"},
+        {"other key", good, "other.pub.pem", "NOT valid"},
+        {"changed", changed, "key.pub.pem", "NOT valid"},
+        {"longer signature", padded, "key.pub.pem", "NOT valid"},
+        {"empty signature", file_of(unsigned_one.substr(2), ""), "key.pub.pem", "NOT valid"},
+        {"none", unsigned_one, "key.pub.pem", "none"},
+    };
+    for (const auto& held : cases) {
+        SCOPED_TRACE(held.what);
+        const shown seen = show(held.bytes, held.key);
+        EXPECT_NE(seen.out.find("\nsignature: " + held.verdict + "\n"), std::string::npos)
+            << seen.out;
+        EXPECT_EQ(seen.status, held.verdict == "valid" ? 0 : 1);
+        EXPECT_EQ(seen.err.empty(), held.verdict == "valid") << seen.err;
+        EXPECT_NE(seen.out.find("part: p n"), std::string::npos) << seen.out;
+    }
+    const shown no_key = show(good, "key.pem");
+    EXPECT_EQ(no_key.status, 1);
+    EXPECT_NE(no_key.err.find("/key.pem: holds no public key"), std::string::npos) << no_key.err;
+}
+
+TEST_F(configurations, are_made_and_shown_from_the_command_line) {
+    make_key(directory, "key");
+    write("part", "payload");
+    const struct {
+        std::string arguments;
+        int status;
+        std::string output;  // part of it
+    } cases[] = {
+        {"config build -o c.bin --sign key.pem p:n=part kivd:Settings=/dev/null", 0, ""},
+        {"config show --key key.pub.pem c.bin", 0, "signature: valid\nparts: 2\npart: p n, 7 byte"},
+        {"config show c.bin >/dev/full", 1, "the output could not be written"},
+        {"config build -o none/c.bin p:n=part", 1, "none/c.bin: cannot be written: No such file"},
+        {"config build -o c.bin", 2, "required"},
+        {"config build p:n=part", 2, "--output is required"},
+        {"config build -o c.bin p=part", 2, "p=part is not PACKAGE:NAME=FILE"},
+        {"config build -o c.bin p=:n", 2, "is not"},
+        {"config build -o c.bin :n=part", 2, "is not"},
+        {"config build -o c.bin p:=part", 2, "is not"},
+        {"config build -o c.bin p:n=", 2, "is not"},
+        {"config show", 2, "required"},
+        {"config", 2, "required"},
+        {"report --key key.pem c.bin", 1, "c.bin: "},
+    };
+    for (const auto& line : cases) {
+        SCOPED_TRACE(line.arguments);
+        const outcome told =
+            run("cd " + directory.string() + " && " KIVTOOL_PATH " " + line.arguments);
+        EXPECT_EQ(told.status, line.status);
+        EXPECT_NE(told.output.find(line.output), std::string::npos) << told.output;
+    }
+}
+
+}  // namespace
+}  // namespace kivd
