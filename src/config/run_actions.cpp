@@ -2,6 +2,7 @@
 
 #include "config/config_parts.h"
 #include "config/log_reader.h"
+#include "diag/diag_store.h"
 #include "report/output_dir.h"
 #include "settings.pb-c.h"
 
@@ -18,7 +19,7 @@ void run_actions() {
     if (!actions) return;
     stop_log_reader();
     if (actions->has_run_log_reader && actions->run_log_reader) start_log_reader();
-    // activate_lumora_diagnostics: there is no diagnostics store yet that it could switch
+    qz_set_active(actions->has_activate_lumora_diagnostics && actions->activate_lumora_diagnostics);
 }
 
 void run_actions_once() {

@@ -112,7 +112,7 @@ void set_socket_delays(const char* delays) {
 }  // namespace
 
 options parse_options(int argc, char** argv) {
-    options given = {KIV_DEFAULT_DIRECTORY, true};
+    options given = {KIV_DEFAULT_DIRECTORY, true, false};
     bool help = false;
     const char* verified_file = nullptr;
     const char* encrypted_file = nullptr;
@@ -138,6 +138,9 @@ options parse_options(int argc, char** argv) {
                 if (const int32_t seconds = parse_saturated(optarg); seconds >= 1) {
                     set_save_interval(seconds);
                 }
+                break;
+            case 'd':
+                given.debug_interface = true;
                 break;
             case 'C':
                 set_data_collection(true);

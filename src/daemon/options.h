@@ -6,6 +6,7 @@ namespace kivd {
 struct options {
     const char* base_directory;  // as given
     bool detach;
+    bool debug_interface;
 };
 
 // Reads the command line into the modules that it concerns and gives the rest. Ends the process

@@ -19,13 +19,16 @@
 #include "config/intake.h"
 #include "config/limits.h"
 #include "config/run_actions.h"
+#include "daemon/debug/debug_interface.h"
 #include "daemon/error/child_process.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/event_loop.h"
+#include "daemon/kernel/kernel_bridge.h"
 #include "daemon/net/client_sockets.h"
 #include "daemon/options.h"
 #include "daemon/save_clock.h"
 #include "daemon/stop.h"
+#include "diag/diag_store.h"
 #include "platform/android_log.h"
 #include "report/header_record.h"
 #include "report/identity.h"
@@ -203,11 +206,13 @@ void release_all() {
 }
 
 void shut_down() {
+    join_kernel_bridge();
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting down...");
     counters_save();
     sdata_save();
     config_save();
-    wait_for_compactor();  // a restart must not meet a report half written
+    wait_for_compactor();  // a restart must not meet a file half written
+    qz_wait_for_compressor();
     // The lock file goes last: as soon as it is gone a new daemon may make sockets of its own.
     remove_client_sockets();
     (void)unlink(paths::lock_file);
@@ -222,7 +227,8 @@ int run_daemon(int argc, char** argv) {
     install_signal_handlers();
     init_settings();
     set_default_key_paths();
-    enter_working_directory(parse_options(argc, argv));
+    const options given = parse_options(argc, argv);
+    enter_working_directory(given);
     check_disabled();
 
     __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
@@ -232,8 +238,13 @@ int run_daemon(int argc, char** argv) {
 
     if (event_loop_init() != 0) exit(1);
     create_client_sockets();
+    if (given.debug_interface) {
+        __android_log_print(ANDROID_LOG_INFO, tag, "kivddi (kivd debug interface) Enabled.");
+        di_start();
+    }
     mark_saved();
     run_actions();
+    if (!start_kernel_bridge()) give_up("Failed to create kivkb thread, bailing.\n");
     __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the world.");
     event_loop_run();
 

@@ -9,12 +9,12 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
 #include <ctime>
+#include <mutex>
 
 namespace kivd {
 namespace {
@@ -22,9 +22,10 @@ namespace {
 constexpr size_t line_size = 2048;   // longer messages are cut
 constexpr int stalled_wait_ms = 20;  // what a receiver that stopped reading may cost, once
 
-constinit std::atomic<bool> to_system = false;
-constinit std::atomic<int> system_log_fd = -1;
-constinit std::atomic<unsigned> lines_lost = 0;
+constinit std::mutex mutex;  // guards everything below, and the time zone that dates are made with
+constinit bool to_system = false;
+constinit int system_log_fd = -1;
+constinit unsigned lines_lost = 0;
 
 int connect_system_log() {
     const int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
@@ -38,15 +39,11 @@ int connect_system_log() {
 // A logger that was restarted needs a new connection, so a failed send is tried on one, once.
 bool send_to_system(const char* line, size_t size) {
     for (int attempt = 0; attempt < 2; ++attempt) {
-        int fd = system_log_fd.load();
-        if (fd < 0) {
-            fd = connect_system_log();
-            if (fd < 0) return false;
-            system_log_fd = fd;
-        }
-        if (send(fd, line, size, MSG_NOSIGNAL | MSG_DONTWAIT) >= 0) return true;
+        if (system_log_fd < 0) system_log_fd = connect_system_log();
+        if (system_log_fd < 0) return false;
+        if (send(system_log_fd, line, size, MSG_NOSIGNAL | MSG_DONTWAIT) >= 0) return true;
         if (errno == EAGAIN) return false;
-        (void)close(fd);
+        (void)close(system_log_fd);
         system_log_fd = -1;
     }
     return false;
@@ -95,10 +92,9 @@ priority_names names_of(int priority) {
 
 bool log_line(int priority, const char* tag, const char* text) {
     const priority_names names = names_of(priority);
-    const bool system = to_system;
     char line[line_size];
-    const int head = system ? format_system_head(line, sizeof line, names.severity, tag)
-                            : format_stderr_head(line, sizeof line, names.letter, tag);
+    const int head = to_system ? format_system_head(line, sizeof line, names.severity, tag)
+                               : format_stderr_head(line, sizeof line, names.letter, tag);
     if (head < 0) return false;
     const size_t start = std::min(static_cast<size_t>(head), sizeof line / 2);
     size_t length = std::min(strlen(text), sizeof line - start - 1);
@@ -109,7 +105,7 @@ bool log_line(int priority, const char* tag, const char* text) {
         return byte < ' ' || byte == 0x7F ? ' ' : c;
     });
     length += start;
-    if (system) return send_to_system(line, length);
+    if (to_system) return send_to_system(line, length);
     line[length++] = '\n';
     return write_to_stderr(line, length);
 }
@@ -119,6 +115,10 @@ bool log_line(int priority, const char* tag, const char* text) {
 void log_to_system() { to_system = true; }
 
 void log_forget_descriptor() { system_log_fd = -1; }
+
+void log_lock() { mutex.lock(); }
+
+void log_unlock() { mutex.unlock(); }
 
 }  // namespace kivd
 
@@ -132,11 +132,12 @@ int __android_log_print(int priority, const char* tag, const char* format, ...) 
     vsnprintf(text, sizeof text, format, arguments);
     va_end(arguments);
 
+    const std::lock_guard lock(mutex);
     const unsigned lost = lines_lost;
     char notice[64];
     snprintf(notice, sizeof notice, "%u log lines were lost here", lost);
     const bool caught_up = lost == 0 || log_line(ANDROID_LOG_WARN, "kivd", notice);
-    if (caught_up) lines_lost -= lost;
+    if (caught_up) lines_lost = 0;
     const bool written = caught_up && log_line(priority, tag, text);
     if (!written) ++lines_lost;
     errno = saved_errno;

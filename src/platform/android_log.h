@@ -22,6 +22,10 @@ namespace kivd {
 // From now on the system log (/dev/log) instead of standard error.
 void log_to_system();
 
+// Held across a fork, so that the child can log.
+void log_lock();
+void log_unlock();
+
 // In a forked child that has closed its copy of the log's descriptor.
 void log_forget_descriptor();
 

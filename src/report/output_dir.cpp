@@ -15,6 +15,7 @@
 #include "config/limits.h"
 #include "daemon/error/log_and_raise.h"
 #include "daemon/stop.h"
+#include "diag/diag_store.h"
 #include "platform/android_log.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -99,7 +100,8 @@ bool is_free_space_enough() {
         (void)log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
         return false;
     }
-    const uint64_t needed = 2 * (get_limits().max_report_size + compaction_overhead);
+    const uint64_t needed =
+        2 * (get_limits().max_report_size + compaction_overhead) + qz_space_reserve();
     const uint64_t available = static_cast<uint64_t>(status.f_bsize) * status.f_bavail;
     return needed <= available && (status.f_files == 0 || status.f_ffree >= min_free_inodes);
 }

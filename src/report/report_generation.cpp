@@ -95,11 +95,7 @@ int compact_report() {
     return 0;
 }
 
-void wait_for_compactor() {
-    if (compactor_pid < 0) return;
-    wait_for_child(compactor_pid);
-    compactor_pid = -1;
-}
+void wait_for_compactor() { wait_for_child(compactor_pid); }
 
 void set_output_compression(bool enabled) {
     compression = enabled ? gzip_level::best : gzip_level::stored;

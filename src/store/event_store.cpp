@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <array>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -11,10 +10,8 @@
 #include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/log_and_raise.h"
+#include "report/event_record.h"
 #include "report/header_record.h"
-#include "report/record_format.h"
-#include "util/clock.h"
-#include "util/file_io.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -45,25 +42,6 @@ void start_file() {
     (void)unlink(paths::events);
 }
 
-void append_event(const char* package, const char* name, std::span<const char> payload) {
-    static constinit std::array<uint8_t, 356> head = {};
-    const size_t head_size = pack_event_record(head, package, name, now_ms(), payload.size());
-    if (head_size == 0) {
-        (void)log_and_raise(tag, "Failed to serialize header.");
-        return;
-    }
-    std::array pieces = {iovec{head.data(), head_size},
-                         iovec{const_cast<char*>(payload.data()), payload.size()}};
-    const ssize_t written = write_all(events_fd, std::span(pieces).first(payload.empty() ? 1 : 2));
-    if (written >= 0) {
-        events_size += static_cast<uint64_t>(written);
-        return;
-    }
-    (void)log_and_raise(tag, "Failed to write event %s::%s with %d bytes payload. Error: %s",
-                        package, name, static_cast<int>(payload.size()), strerror(errno));
-    measure_size();
-}
-
 }  // namespace
 
 void events_open() {
@@ -81,7 +59,9 @@ event_file events_add(const char* package, const char* name, std::span<const cha
     if (!filter_match(filter_kind::events, package, name)) return event_file::open;
     events_open();
     if (events_fd < 0) return event_file::open;
-    append_event(package, name, payload);
+    const ssize_t written = write_event_record(events_fd, package, name, payload, tag);
+    if (written < 0) measure_size();
+    if (written > 0) events_size += static_cast<uint64_t>(written);
     return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
 }
 

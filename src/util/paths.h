@@ -44,6 +44,8 @@ inline constexpr char event_filter[] = "private/filters.txt";
 
 inline constexpr char log_reader[] = "/system/bin/kiv-logreader";
 
+inline constexpr char diag_dir[] = "private/qz/";
+
 inline constexpr char random_uuid[] = "/proc/sys/kernel/random/uuid";
 
 }  // namespace kivd::paths

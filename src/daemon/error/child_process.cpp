@@ -41,11 +41,13 @@ pid_t fork_child() {
     sigfillset(&all);
     pthread_sigmask(SIG_SETMASK, &all, &before);
     daemon_error_lock();
+    log_lock();
 
     const pid_t pid = fork();
     const int fork_errno = errno;
     if (pid == 0) drop_descriptors();
 
+    log_unlock();
     daemon_error_unlock();
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
     errno = fork_errno;
@@ -63,9 +65,10 @@ void exec_program(const char* const* arguments) {
     (void)execve(*arguments, const_cast<char* const*>(arguments), no_environment);
 }
 
-void wait_for_child(pid_t pid) {
-    while (waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
+void wait_for_child(pid_t& pid) {
+    while (pid >= 0 && waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
     }
+    pid = -1;
 }
 
 }  // namespace kivd

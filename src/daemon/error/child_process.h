@@ -18,7 +18,7 @@ void set_inherited_descriptor(int fd);
 // failed, with errno set.
 void exec_program(const char* const* arguments);
 
-// Waits until the child `pid` has ended; the system reaps it.
-void wait_for_child(pid_t pid);
+// Waits until the child `pid` has ended, if there is one, and forgets it (-1). The system reaps it.
+void wait_for_child(pid_t& pid);
 
 }  // namespace kivd

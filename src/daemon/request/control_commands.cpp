@@ -1,10 +1,14 @@
 #include "daemon/request/control_commands.h"
 
+#include <algorithm>
+#include <cstdio>
 #include <cstring>
 
 #include "config/intake.h"
 #include "daemon/error/log_and_raise.h"
 #include "daemon/save_clock.h"
+#include "diag/diag_store.h"
+#include "diag/file_export.h"
 #include "report/identity.h"
 #include "report/output_dir.h"
 #include "report/report_generation.h"
@@ -60,7 +64,9 @@ size_t read_device_id(request& r) {
 
 size_t switch_data_collection(request& r) {
     return with_argument(r, "Enable/disable data collection without value.", [](const char* value) {
-        set_data_collection(parse_saturated(value) != 0);
+        const int32_t number = parse_saturated(value);
+        set_data_collection(number != 0);
+        qz_set_active(number);
         config_save();
     });
 }
@@ -68,6 +74,26 @@ size_t switch_data_collection(request& r) {
 size_t remove_report(request& r) {
     return with_argument(r, "Remove report without number.",
                          [](const char* number) { delete_reports(parse_saturated(number)); });
+}
+
+// The reply is cut to what goes into the request with a NUL behind it, less one byte.
+size_t next_file(request& r) {
+    const char* const set = next_token(r);
+    const char* const number = next_token(r);
+    char digits[16];
+    snprintf(digits, std::min(r.packet.size() - 1, sizeof digits), "%d",
+             fu_file_iterator_next(set, number));
+    return reply(r, digits);
+}
+
+size_t get_file(request& r) {
+    const char* const set = next_token(r);
+    const char* const number = next_token(r);
+    if (set == nullptr || number == nullptr) {
+        (void)log_and_raise(tag, "Badly formatted packet (FG) - dropping.");
+        return reply(r, "FAIL");
+    }
+    return reply_with_descriptor(r, fu_file_get(set, number));
 }
 
 size_t accept_serial_number(request& r) {

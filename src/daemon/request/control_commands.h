@@ -15,6 +15,8 @@ size_t write_configuration(request& r);     // WC
 size_t read_device_id(request& r);          // GD
 size_t switch_data_collection(request& r);  // DC
 size_t remove_report(request& r);           // RM
+size_t next_file(request& r);               // FN
+size_t get_file(request& r);                // FG
 size_t accept_serial_number(request& r);    // SN
 size_t accept_imei(request& r);             // IM
 size_t add_group(request& r);               // SG

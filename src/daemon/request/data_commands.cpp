@@ -3,7 +3,7 @@
 #include "config/config_parts.h"
 #include "config/filters.h"
 #include "daemon/error/log_and_raise.h"
-#include "daemon/net/send.h"
+#include "diag/diag_store.h"
 #include "report/report_generation.h"
 #include "store/counter_store.h"
 #include "store/event_store.h"
@@ -36,6 +36,7 @@ size_t add_event(request& r) {
                             probe.name, payload.size());
         return 0;
     }
+    qz_add_event(probe.package, probe.name, payload);
     if (events_add(probe.package, probe.name, payload) == event_file::full) (void)generate_report();
     return 0;
 }
@@ -63,17 +64,15 @@ size_t is_alive(request& r) { return reply(r, "1"); }
 size_t is_probe_active(request& r) {
     probe_id probe = {};
     if (!take_probe_id(r, "PA", probe)) return 0;
-    return reply(r, filter_match(filter_kind::events, probe.package, probe.name) ? "1" : "0");
+    const bool wanted = filter_match(filter_kind::events, probe.package, probe.name) ||
+                        qz_wants_probe(probe.package, probe.name);
+    return reply(r, wanted ? "1" : "0");
 }
 
 size_t get_config_part(request& r) {
     probe_id probe = {};
     if (!take_probe_id(r, "GC", probe)) return 0;
-    if (r.fd < 0) return 0;  // no descriptor can be sent back to a datagram's sender
-    const unique_fd part = get_config_fd(probe.package, probe.name);
-    if (!part.ok()) return reply(r, "FAIL");
-    (void)send_fd_message(r.fd, part.get());
-    return 0;
+    return reply_with_descriptor(r, get_config_fd(probe.package, probe.name));
 }
 
 }  // namespace kivd

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <string_view>
 
+#include "daemon/debug/debug_interface.h"
 #include "daemon/error/log_and_raise.h"
 #include "daemon/request/caller.h"
 #include "daemon/request/control_commands.h"
@@ -39,6 +40,8 @@ constexpr command commands[] = {
     {"GD", read_device_id,         false, "getDeviceId (GD) request denied due to permission!", ""},
     {"DC", switch_data_collection, false, "setDataCollectionEnable (DC) request denied due to permission!", ""},
     {"RM", remove_report,          false, "removeReport (RM) request denied due to permission!", ""},
+    {"FN", next_file,              false, "fileIteratorNext (FN) request denied due to permission!", "-1"},
+    {"FG", get_file,               false, "fileGet (FG) request denied due to permission!", "FAIL"},
     {"SN", accept_serial_number,   false, "setSerialNumber (SN) request denied due to permission!", ""},
     {"IM", accept_imei,            false, "setImei (IM) request denied due to permission!", ""},
     {"SG", add_group,              false, nullptr, ""},
@@ -50,6 +53,7 @@ constexpr command commands[] = {
 }  // namespace
 
 size_t handle_request(int fd, std::span<char> packet, const msghdr* message) {
+    di_mirror_request(packet);
     request r = make_request(fd, packet, message);
     const char* const name = next_token(r);
     if (name == nullptr) {

@@ -3,6 +3,7 @@
 #include <cstring>
 
 #include "daemon/error/log_and_raise.h"
+#include "daemon/net/send.h"
 
 namespace kivd {
 namespace {
@@ -41,6 +42,13 @@ std::span<const char> raw_rest(const request& r) {
 const char* text_rest(const request& r) { return r.rest; }
 
 size_t reply(request& r, std::string_view text) { return text.copy(r.packet.data(), text.size()); }
+
+size_t reply_with_descriptor(request& r, const unique_fd& descriptor) {
+    if (r.fd < 0) return 0;
+    if (!descriptor.ok()) return reply(r, "FAIL");
+    (void)send_fd_message(r.fd, descriptor.get());
+    return 0;
+}
 
 bool take_probe_id(request& r, const char* command, probe_id& probe) {
     probe.package = next_token(r);

@@ -8,6 +8,8 @@
 #include <span>
 #include <string_view>
 
+#include "util/unique_fd.h"
+
 namespace kivd {
 
 struct request {
@@ -31,6 +33,10 @@ struct request {
 
 // Writes a reply over the packet; gives its length.
 size_t reply(request& r, std::string_view text);
+
+// Replies with a descriptor, or with "FAIL" when it is none. Nothing for a datagram, to whose
+// sender none can be sent.
+size_t reply_with_descriptor(request& r, const unique_fd& descriptor);
 
 // A probe's id: package and name.
 struct probe_id {

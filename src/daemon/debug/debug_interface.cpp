@@ -1,0 +1,84 @@
+#include "daemon/debug/debug_interface.h"
+
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+
+#include "daemon/event_loop.h"
+#include "platform/android_log.h"
+#include "report/record_format.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-kivddi";
+constexpr uint16_t port = 2305;
+constexpr int listen_backlog = 5;
+constexpr size_t frame_size = 31196;  // of the largest request packet
+
+void di_accept(event_handler& handler);
+void di_client_readable(event_handler& handler);
+
+constinit event_handler listener = {di_accept, -1};
+constinit event_handler client = {di_client_readable, -1};
+
+void close_client() {
+    if (client.fd < 0) return;
+    event_loop_remove(client);
+    (void)close(client.fd);
+    client.fd = -1;
+}
+
+// A new client takes the place of the one before.
+void di_accept(event_handler& handler) {
+    const int fd = accept4(handler.fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+    close_client();
+    client.fd = fd;
+    if (fd >= 0 && event_loop_add(client) != 0) close_client();
+}
+
+void di_client_readable(event_handler& handler) {
+    char unwanted[10];
+    if (recv(handler.fd, unwanted, sizeof unwanted, MSG_DONTWAIT) == 0) close_client();
+}
+
+[[noreturn]] void give_up(const char* what) {
+    __android_log_print(ANDROID_LOG_ERROR, tag, "%s %s", what, strerror(errno));
+    exit(1);
+}
+
+}  // namespace
+
+void di_start() {
+    listener.fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (listener.fd < 0) give_up("Failed to create di-socket:");
+    sockaddr_in address = {};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(port);
+    if (bind(listener.fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        give_up("Cannot bind to di-socket - port already used?");
+    }
+    if (listen(listener.fd, listen_backlog) != 0) give_up("Failed to listen to di-socket:");
+    (void)event_loop_add(listener);
+}
+
+void di_mirror_request(std::span<const char> packet) {
+    if (client.fd < 0) return;
+    static constinit std::array<uint8_t, frame_size> frame = {};
+    const size_t size = pack_debug_frame(frame, reinterpret_cast<const uint8_t*>(packet.data()),
+                                         static_cast<uint32_t>(packet.size()));
+    const ssize_t sent = send(client.fd, frame.data(), size, MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (sent < 0) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Fail to send to socket: %s", strerror(errno));
+        return;
+    }
+    // Without the rest of a frame it could not find the next one.
+    if (static_cast<size_t>(sent) < size) close_client();
+}
+
+}  // namespace kivd

@@ -1,0 +1,16 @@
+// The debug interface: a TCP listener whose one client gets a copy of every request that the daemon
+// handles. It reads nothing and never keeps the daemon waiting. Frames: docs/requests.md.
+#pragma once
+
+#include <cstdint>
+#include <span>
+
+namespace kivd {
+
+// Listens on port 2305 of every interface. Ends the process when that fails.
+void di_start();
+
+// Sends the packet to the client, if there is one.
+void di_mirror_request(std::span<const char> packet);
+
+}  // namespace kivd

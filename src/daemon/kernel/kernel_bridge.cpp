@@ -1,0 +1,218 @@
+#include "daemon/kernel/kernel_bridge.h"
+
+#include <linux/netlink.h>
+#include <poll.h>
+#include <pthread.h>
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <optional>
+#include <span>
+#include <string_view>
+
+#include "daemon/error/log_and_raise.h"
+#include "daemon/kernel/process_kill.h"
+#include "daemon/stop.h"
+#include "platform/android_log.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivkb";
+constexpr size_t max_record_size = 30720;
+constexpr suseconds_t send_timeout_us = 50000;  // then it looks whether the daemon is to stop
+
+constinit pthread_t thread = {};
+constinit bool thread_started = false;
+
+// Logs "WHAT [errno/text]"; gives the errno.
+int fail(const char* what, const char* end = "") {
+    const int error = errno;
+    __android_log_print(ANDROID_LOG_ERROR, tag, "%s [%d/%s]%s", what, error, strerror(error), end);
+    return error;
+}
+
+// Waits until `fd` is readable; false when the daemon is to stop.
+bool wait_for_message(int fd) {
+    pollfd awaited[] = {{fd, POLLIN, 0}, {stop_event_fd(), POLLIN, 0}};
+    while (!is_stop_requested()) {
+        if (poll(awaited, 2, -1) > 0 && awaited[0].revents != 0) return true;
+    }
+    return false;
+}
+
+// The size of the message that waits, without taking it; -1 on failure.
+ssize_t peek_size(int netlink) {
+    ssize_t size = 0;
+    do {
+        size = recv(netlink, nullptr, 0, MSG_PEEK | MSG_TRUNC | MSG_DONTWAIT);
+    } while (size < 0 && errno == EINTR);
+    return size;
+}
+
+// Waits for room in the daemon's queue until the daemon is to stop. Gives what sendto gives.
+ssize_t send_request(const daemon_socket& daemon, std::string_view text) {
+    const auto* const address = reinterpret_cast<const sockaddr*>(&daemon.address);
+    for (;;) {
+        const ssize_t sent = sendto(daemon.fd.get(), text.data(), text.size(), MSG_NOSIGNAL,
+                                    address, sizeof daemon.address);
+        if (sent >= 0 || (errno != EAGAIN && errno != EINTR) || is_stop_requested()) return sent;
+    }
+}
+
+// The next token from `position` on, and behind it; tokens stand between blanks.
+std::string_view next_token(std::string_view text, size_t& position) {
+    const size_t start = std::min(text.find_first_not_of(' ', position), text.size());
+    const size_t end = std::min(text.find(' ', start), text.size());
+    position = end;
+    return text.substr(start, end - start);
+}
+
+// "EV package name RECORD": the record is replaced by its translation.
+void pass_event(const daemon_socket& daemon, std::span<char> message, size_t position) {
+    const std::string_view text(message.data(), message.size());
+    const std::string_view package = next_token(text, position);
+    const std::string_view name = next_token(text, position);
+    if (package.empty() || name.empty()) {
+        (void)log_and_raise(tag, "Badly formatted event - dropping.");
+        return;
+    }
+    const size_t start = std::min(position + 1, text.size());
+    const std::span<char> record = message.subspan(start);
+    if (record.size() > max_record_size) {
+        (void)log_and_raise(tag, "Too large event - dropping.");
+        return;
+    }
+    unique_malloc<uint8_t> packed;
+    const int32_t size = translate_event(package, name, record, packed);
+    if (size == 0) {
+        (void)log_and_raise(tag, "Failed to pack %zu bytes.", record.size());
+        return;
+    }
+    if (size < 0 || static_cast<size_t>(size) >= record.size()) {
+        (void)log_and_raise(tag, "Packed size greater than unpacked size, bailing...");
+        return;
+    }
+    memcpy(record.data(), packed.get(), static_cast<size_t>(size));
+    (void)send_request(daemon, text.substr(0, start + static_cast<size_t>(size)));
+}
+
+void pass_counter(const daemon_socket& daemon, std::string_view text) {
+    const ssize_t sent = send_request(daemon, text);
+    if (sent == static_cast<ssize_t>(text.size())) return;
+    (void)log_and_raise(tag, "Failed to pass counter data to kivd (%d/%d).",
+                        static_cast<int>(text.size()), static_cast<int>(sent));
+}
+
+// Nothing but events that are translated and counters goes on: every local user can send to this
+// netlink port, and to the daemon the bridge is itself.
+void pass_on(const daemon_socket& daemon, std::span<char> message) {
+    const std::string_view text(message.data(), message.size());
+    size_t position = 0;
+    const std::string_view command = next_token(text, position);
+    if (command.empty()) {
+        (void)log_and_raise(tag, "Failed to parse input.");
+    } else if (command == "EV") {
+        pass_event(daemon, message, position);
+    } else if (command == "CI" || command == "CS") {
+        pass_counter(daemon, text);
+    }
+}
+
+void* run_thread(void* /*argument*/) {
+    kivkb_main();
+    return nullptr;
+}
+
+}  // namespace
+
+int open_daemon_socket(daemon_socket& daemon) {
+    daemon.address = {};
+    daemon.address.sun_family = AF_UNIX;
+    snprintf(daemon.address.sun_path, sizeof daemon.address.sun_path, "%s%s", KIV_DEFAULT_DIRECTORY,
+             paths::datagram_socket);
+    daemon.fd.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    if (!daemon.fd.ok()) return fail("Failed to create unix socket");
+    const timeval timeout = {0, send_timeout_us};
+    (void)setsockopt(daemon.fd.get(), SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
+    return 0;
+}
+
+int open_netlink_socket(unique_fd& netlink) {
+    netlink.reset(socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_USERSOCK));
+    if (!netlink.ok()) return fail("Failed to create netlink socket");
+    sockaddr_nl own = {};
+    own.nl_family = AF_NETLINK;
+    own.nl_pid = static_cast<uint32_t>(getpid());
+    if (bind(netlink.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0) return 0;
+    const int error = fail("Failed to assign netlink socket name", ".");
+    netlink.reset();
+    return error;
+}
+
+int send_pid_to_kernel(int netlink) {
+    char digits[6];  // longer ids are cut, as the kernel expects
+    snprintf(digits, sizeof digits, "%d", getpid());
+    sockaddr_nl kernel = {};
+    kernel.nl_family = AF_NETLINK;
+    if (sendto(netlink, digits, strlen(digits) + 1, 0, reinterpret_cast<const sockaddr*>(&kernel),
+               sizeof kernel) >= 0) {
+        __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the kernel!");
+        return 0;
+    }
+    return errno == ECONNREFUSED ? ECONNREFUSED : fail("Failed to send pid to kernel");
+}
+
+int receive_kernel_message(int netlink, daemon_socket& daemon) {
+    if (!wait_for_message(netlink)) return 0;
+    const ssize_t peeked = peek_size(netlink);
+    if (peeked < 0) return 0;  // messages were lost before this one
+    const auto size = static_cast<size_t>(peeked);
+    const unique_malloc<char> buffer(static_cast<char*>(malloc(size + 1)));
+    if (!buffer) {
+        (void)log_and_raise(tag, "Unable to create buffer.\n");
+        return -ENOMEM;
+    }
+    const ssize_t received = recv(netlink, buffer.get(), size + 1, MSG_DONTWAIT);
+    if (received <= 0) return 0;
+    const std::span<char> message(buffer.get(), static_cast<size_t>(received));
+    pass_on(daemon, message.subspan(std::min(sizeof(nlmsghdr), message.size())));
+    return 0;
+}
+
+void kivkb_main() {
+    daemon_socket daemon;
+    unique_fd netlink;
+    if (open_daemon_socket(daemon) != 0 || open_netlink_socket(netlink) != 0 ||
+        send_pid_to_kernel(netlink.get()) != 0) {
+        return;
+    }
+    while (!is_stop_requested()) (void)receive_kernel_message(netlink.get(), daemon);
+    __android_log_print(ANDROID_LOG_INFO, tag, "Shutting Down...");
+}
+
+bool start_kernel_bridge() {
+    sigset_t all;
+    sigset_t before;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &before);  // a stop signal has to wake the loop
+    thread_started = pthread_create(&thread, nullptr, run_thread, nullptr) == 0;
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    if (thread_started) (void)pthread_setname_np(thread, "kivkb");
+    return thread_started;
+}
+
+void join_kernel_bridge() {
+    if (thread_started) (void)pthread_join(thread, nullptr);
+    thread_started = false;
+}
+
+}  // namespace kivd

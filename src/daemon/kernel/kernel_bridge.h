@@ -1,0 +1,37 @@
+// The kernel bridge: a thread that receives what the kernel reports over netlink and sends it on,
+// as ordinary requests, to the socket on which the daemon listens by default. It touches no store.
+#pragma once
+
+#include <sys/un.h>
+
+#include <cstdint>
+
+#include "util/unique_fd.h"
+
+namespace kivd {
+
+// Where the requests go.
+struct daemon_socket {
+    sockaddr_un address;
+    unique_fd fd;
+};
+
+// The steps of the set-up; each gives 0 or an error number, which has been logged but for the
+// refusal (ECONNREFUSED) of a kernel in which nothing listens.
+[[nodiscard]] int open_daemon_socket(daemon_socket& daemon);
+[[nodiscard]] int open_netlink_socket(unique_fd& netlink);
+[[nodiscard]] int send_pid_to_kernel(int netlink);
+
+// Receives one message, waiting for it until the daemon is to stop, and sends on what it says. 0,
+// or -ENOMEM when there is no memory for it. What is wrong with it has been logged and raised.
+int receive_kernel_message(int netlink, daemon_socket& daemon);
+
+// The body of the thread: ends when the set-up fails or the daemon is to stop.
+void kivkb_main();
+
+// Starts the thread, which takes no signals. False when there is none.
+[[nodiscard]] bool start_kernel_bridge();
+// Waits until it has ended; the daemon is to stop.
+void join_kernel_bridge();
+
+}  // namespace kivd

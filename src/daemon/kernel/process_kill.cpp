@@ -1,0 +1,73 @@
+#include "daemon/kernel/process_kill.h"
+
+#include <cstdlib>
+#include <cstring>
+
+#include "daemon/error/log_and_raise.h"
+#include "kernel.pb-c.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivkb";
+constexpr char function_name[] = "translate_event";
+
+// As the kernel writes it, in the machine's byte order.
+struct raw_process_kill {
+    int32_t pid;
+    int32_t rss;
+    int32_t oom_score_adj;
+    char comm[32];  // text up to the first NUL
+    int32_t reason;
+    int32_t nr_free_pages;
+    int32_t nr_file_pages;
+    int32_t nr_file_mapped;
+    int32_t nr_free_pages_lo;
+};
+static_assert(sizeof(raw_process_kill) == 64);
+
+struct named_process_kill {
+    raw_process_kill raw;
+    char comm[sizeof raw_process_kill::comm + 1];
+};
+
+void fill(Kernel__ProcessKill& message, named_process_kill& kill) {
+    const auto set = [](protobuf_c_boolean& present, int32_t& field, int32_t value) {
+        present = 1;
+        field = value;
+    };
+    const raw_process_kill& raw = kill.raw;
+    set(message.has_pid, message.pid, raw.pid);
+    set(message.has_rss, message.rss, raw.rss);
+    set(message.has_oom_score_adj, message.oom_score_adj, raw.oom_score_adj);
+    set(message.has_reason, message.reason, raw.reason);
+    set(message.has_nr_free_pages, message.nr_free_pages, raw.nr_free_pages);
+    set(message.has_nr_file_pages, message.nr_file_pages, raw.nr_file_pages);
+    set(message.has_nr_file_mapped, message.nr_file_mapped, raw.nr_file_mapped);
+    set(message.has_nr_free_pages_lo, message.nr_free_pages_lo, raw.nr_free_pages_lo);
+    memcpy(kill.comm, raw.comm, sizeof raw.comm);
+    message.comm = kill.comm;
+}
+
+}  // namespace
+
+int32_t translate_event(std::string_view package, std::string_view name,
+                        std::span<const char> record, unique_malloc<uint8_t>& packed) {
+    if (package != "kernel" || name != "ProcessKill") {
+        return log_and_raise(tag, "%s [%.*s/%.*s] not supported by translated", function_name,
+                             static_cast<int>(package.size()), package.data(),
+                             static_cast<int>(name.size()), name.data());
+    }
+    named_process_kill kill = {};
+    if (record.size() < sizeof kill.raw) {
+        return log_and_raise(tag, "%s got a record of %zu bytes", function_name, record.size());
+    }
+    memcpy(&kill.raw, record.data(), sizeof kill.raw);
+    Kernel__ProcessKill message = KERNEL__PROCESS_KILL__INIT;
+    fill(message, kill);
+    packed.reset(static_cast<uint8_t*>(malloc(kernel__process_kill__get_packed_size(&message))));
+    if (!packed) return log_and_raise(tag, "%s failed to allocate buffer", function_name);
+    return static_cast<int32_t>(kernel__process_kill__pack(&message, packed.get()));
+}
+
+}  // namespace kivd

@@ -1,0 +1,45 @@
+// The files of the diagnostics store, private/qz/: number N is qz_N while it is written and qy_N
+// once it has been compressed.
+#pragma once
+
+#include <cstdint>
+
+#include "util/unique_fd.h"
+
+namespace kivd {
+
+inline constexpr int32_t no_diag_file = 2147483647;  // as the lowest number
+
+// The numbers that are there, whatever the files hold.
+struct diag_numbers {
+    int32_t highest = 0;  // 1 when there is none
+    int32_t lowest = 0;   // no_diag_file when there is none
+};
+
+struct diag_path {
+    // `letter` is 'z' or 'y'.
+    diag_path(char letter, int32_t number);
+    char text[32];
+};
+
+// False, with errno set and `numbers` unchanged, when the directory cannot be read. Foreign entries
+// have been logged.
+[[nodiscard]] bool scan_diag_files(diag_numbers& numbers);
+
+// Deletes the files numbered `from` to `to`, or every entry of the directory. What could not be
+// deleted has been logged and raised.
+void delete_diag_files(int32_t from, int32_t to);
+void delete_all_diag_entries();
+
+// Deletes the plain file of that number, as above.
+void delete_plain_diag_file(int32_t number);
+
+// The file of that number to read, compressed if it is so; not ok when there is none.
+[[nodiscard]] unique_fd qz_file_open(int32_t number);
+
+// The number of the file behind `number`: the lowest there is when that comes before it. -1 when
+// there is none. Numbers between the lowest and the highest count as files, whether or not they are
+// there.
+[[nodiscard]] int32_t qz_file_next(int32_t number);
+
+}  // namespace kivd

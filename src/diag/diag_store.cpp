@@ -1,0 +1,165 @@
+#include "diag/diag_store.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <cstring>
+#include <iterator>
+#include <string_view>
+
+#include "daemon/error/child_process.h"
+#include "daemon/error/log_and_raise.h"
+#include "diag/diag_files.h"
+#include "diag/gzip_file.h"
+#include "diag/log_message.h"
+#include "platform/android_log.h"
+#include "report/event_record.h"
+#include "report/record_file.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-qz";
+constexpr off_t max_file_size = 204800;      // bytes; the event that goes beyond is still kept
+constexpr int32_t full_files = 3;            // that stay beside the one being written
+constexpr uint32_t reserved_space = 327680;  // bytes
+
+struct selection {
+    std::string_view package_end;
+    std::string_view name;
+    bool (*check)(std::span<const char> payload);  // null: every payload will do
+};
+constexpr selection selections[] = {
+    {"devicemonitor.powerstat", "ShutDown", nullptr},
+    {"devicemonitor.powerstat", "BootComplete", nullptr},
+    {"kiv.system_logging", "LogMessage", qz_log_message_check},
+};
+
+constinit int32_t qz_active = 0;
+constinit pid_t compressor_pid = -1;
+
+// Null when the store does not want such events.
+const selection* find_selection(std::string_view package, std::string_view name) {
+    const auto* const found = std::ranges::find_if(selections, [package, name](const auto& each) {
+        return package.ends_with(each.package_end) && name == each.name;
+    });
+    return found != std::end(selections) ? found : nullptr;
+}
+
+bool qz_select(const char* package, const char* name, std::span<const char> payload) {
+    const selection* const found = find_selection(package, name);
+    if (found == nullptr) return false;
+    return found->check == nullptr || payload.empty() || found->check(payload);
+}
+
+unique_fd open_current(int32_t number) {
+    const diag_path path('z', number);
+    unique_fd fd(open(path.text, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0700));
+    if (!fd.ok()) {
+        (void)log_and_raise(tag, "Failed to open %s, <%s>", path.text, strerror(errno));
+    }
+    return fd;
+}
+
+void start_compressor(int32_t number) {
+    if (compressor_pid >= 0) {
+        __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report. Waiting...");
+        wait_for_child(compressor_pid);
+    }
+    __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report...");
+    compressor_pid = fork_child();
+    if (compressor_pid < 0) (void)log_and_raise(tag, "Failed to fork compactor thread.");
+    if (compressor_pid != 0) return;
+
+    const diag_path plain('z', number);
+    const diag_path compressed('y', number);
+    if (fu_gzip_file(plain.text, compressed.text, gzip_level::best) != 0) {
+        delete_plain_diag_file(number);
+    }
+    __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report. Done...");
+    _exit(0);
+}
+
+// Lets the files go that are too old by now; gives the number of the next one.
+int32_t make_room(const diag_numbers& numbers) {
+    if (numbers.highest == INT32_MAX) {
+        wait_for_child(compressor_pid);  // or its file would come back
+        delete_diag_files(INT32_MIN, INT32_MAX);
+        return 1;
+    }
+    if (numbers.highest > full_files) {
+        delete_diag_files(numbers.lowest, numbers.highest - full_files);
+    }
+    return numbers.highest + 1;
+}
+
+// The file that takes the next event.
+unique_fd qz_get_write_fd() {
+    diag_numbers numbers;
+    if (!scan_diag_files(numbers)) {
+        (void)log_and_raise(tag, "qz_file_statdir() failed: %s", strerror(errno));
+        return unique_fd();
+    }
+    unique_fd current = open_current(numbers.highest);
+    if (!current.ok() || lseek(current.get(), 0, SEEK_END) < max_file_size) return current;
+
+    __android_log_print(ANDROID_LOG_INFO, tag, "Max file size reached, opening new file");
+    current.reset();
+    start_compressor(numbers.highest);
+    return open_current(make_room(numbers));
+}
+
+void switch_off() {
+    delete_all_diag_entries();
+    if (rmdir(paths::diag_dir) == 0 || errno == ENOENT) return;
+    (void)log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s",
+                        strerror(errno));
+}
+
+// A record that a crash has torn must not have others behind it.
+void qz_rescue_event_file() {
+    diag_numbers numbers;
+    if (!scan_diag_files(numbers)) {
+        (void)log_and_raise(tag, "qz_rescue_event_file: qz_file_statdir() failed: %s",
+                            strerror(errno));
+        return;
+    }
+    rescue_event_file(diag_path('z', numbers.highest).text, record_header::absent);
+}
+
+void switch_on() {
+    if (mkdir(paths::diag_dir, 0700) != 0 && errno != EEXIST) {
+        (void)log_and_raise(tag, "Failed to create Lumora Diagnostics output directory: %s",
+                            strerror(errno));
+    }
+    qz_rescue_event_file();
+}
+
+}  // namespace
+
+void qz_set_active(int32_t value) {
+    qz_active = value;
+    value != 0 ? switch_on() : switch_off();
+}
+
+void qz_add_event(const char* package, const char* name, std::span<const char> payload) {
+    if (qz_active == 0 || !qz_select(package, name, payload)) return;
+    const unique_fd file = qz_get_write_fd();
+    if (file.ok()) (void)write_event_record(file.get(), package, name, payload, tag);
+}
+
+bool qz_wants_probe(const char* package, const char* name) {
+    return qz_active == 1 && find_selection(package, name) != nullptr;
+}
+
+uint32_t qz_space_reserve() { return qz_active != 0 ? reserved_space : 0; }
+
+void qz_wait_for_compressor() { wait_for_child(compressor_pid); }
+
+}  // namespace kivd

@@ -1,0 +1,31 @@
+#include "diag/file_export.h"
+
+#include "daemon/error/log_and_raise.h"
+#include "diag/diag_files.h"
+#include "util/numbers.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-fu";
+constexpr int32_t diag_file_set = 750;
+
+}  // namespace
+
+int32_t fu_file_iterator_next(const char* set, const char* number) {
+    if (set == nullptr || number == nullptr) {
+        return log_and_raise(tag, "File iterator next, null parameters found.");
+    }
+    return parse_saturated(set) == diag_file_set ? qz_file_next(parse_saturated(number)) : -1;
+}
+
+unique_fd fu_file_get(const char* set, const char* number) {
+    if (set == nullptr || number == nullptr) {
+        (void)log_and_raise(tag, "File get, null parameters found.");
+        return unique_fd();
+    }
+    if (parse_saturated(set) != diag_file_set) return unique_fd();
+    return qz_file_open(parse_saturated(number));
+}
+
+}  // namespace kivd

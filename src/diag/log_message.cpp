@@ -1,0 +1,116 @@
+#include "diag/log_message.h"
+
+#include <algorithm>
+#include <cstring>
+#include <iterator>
+#include <optional>
+#include <string_view>
+
+#include "daemon/error/log_and_raise.h"
+#include "system_logging.pb-c.h"
+#include "util/protobuf_message.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-qz";
+constexpr int max_depth = 64;
+
+struct kept_tag {
+    std::string_view name;
+    const char* wanted_text;  // has to be in the message; null: nothing has to
+};
+constexpr kept_tag kept_tags[] = {
+    {"am_anr", nullptr},
+    {"am_crash", nullptr},
+    {"RILJ", "< LAST_CALL_FAIL_CAUSE"},
+};
+
+enum wire_type : uint32_t { varint = 0, fixed64 = 1, length_delimited = 2, fixed32 = 5 };
+
+// The messages that hold others: LogMessage a List, List its Fields, Field a List again.
+struct message_kind {
+    uint32_t nested_field;
+    const message_kind* nested;
+};
+extern const message_kind list_kind;
+constexpr message_kind log_message_kind = {9, &list_kind};
+constexpr message_kind field_kind = {4, &list_kind};
+constexpr message_kind list_kind = {1, &field_kind};
+
+using bytes = std::span<const uint8_t>;
+
+std::optional<uint64_t> take_varint(bytes& rest, size_t max_size) {
+    uint64_t value = 0;
+    for (size_t i = 0; i < std::min(rest.size(), max_size); ++i) {
+        value |= uint64_t{rest[i] & 0x7FU} << (7 * i);
+        if ((rest[i] & 0x80U) != 0) continue;
+        rest = rest.subspan(i + 1);
+        return value;
+    }
+    return std::nullopt;
+}
+
+std::optional<bytes> take_bytes(bytes& rest, size_t size) {
+    if (size > rest.size()) return std::nullopt;
+    const bytes taken = rest.first(size);
+    rest = rest.subspan(size);
+    return taken;
+}
+
+// The content of one field whose key has been taken.
+std::optional<bytes> take_content(bytes& rest, uint32_t type) {
+    switch (type) {
+        case varint:
+            return take_varint(rest, 10) ? std::optional<bytes>(bytes()) : std::nullopt;
+        case fixed64:
+            return take_bytes(rest, 8);
+        case fixed32:
+            return take_bytes(rest, 4);
+        case length_delimited:
+            if (const auto size = take_varint(rest, 5)) {
+                return take_bytes(rest, static_cast<uint32_t>(*size));
+            }
+            return std::nullopt;
+        default:
+            return std::nullopt;
+    }
+}
+
+// Whether the message is made of fields all through and not nested too deep. The decoder calls
+// itself for each level, however many there are: a small payload could overflow the stack.
+bool is_decodable(bytes message, const message_kind& kind, int depth) {
+    if (depth > max_depth) return false;
+    while (!message.empty()) {
+        const auto key = take_varint(message, 5);
+        if (!key) return false;
+        const auto type = static_cast<uint32_t>(*key & 7U);
+        const auto content = take_content(message, type);
+        if (!content) return false;
+        const bool nested = type == length_delimited && (*key >> 3U) == kind.nested_field;
+        if (nested && !is_decodable(*content, *kind.nested, depth + 1)) return false;
+    }
+    return true;
+}
+
+}  // namespace
+
+bool qz_log_message_check(std::span<const char> payload) {
+    const bytes encoded(reinterpret_cast<const uint8_t*>(payload.data()), payload.size());
+    const auto message =
+        is_decodable(encoded, log_message_kind, 0)
+            ? unpack_message<kiv__system_logging__log_message__unpack,
+                             kiv__system_logging__log_message__free_unpacked>(encoded)
+            : nullptr;
+    if (!message || message->tag == nullptr) {
+        (void)log_and_raise(tag, "Failed to unpack protobuf LogMessage");
+        return false;
+    }
+    const auto* const kept =
+        std::ranges::find(kept_tags, std::string_view(message->tag), &kept_tag::name);
+    if (kept == std::end(kept_tags)) return false;
+    if (kept->wanted_text == nullptr) return true;
+    return message->msg != nullptr && strstr(message->msg, kept->wanted_text) != nullptr;
+}
+
+}  // namespace kivd
