@@ -116,6 +116,7 @@ unique_fd qz_get_write_fd() {
 }
 
 void switch_off() {
+    qz_wait_for_compressor();  // it would leave another file
     delete_all_diag_entries();
     if (rmdir(paths::diag_dir) == 0 || errno == ENOENT) return;
     (void)log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s",
