@@ -7,7 +7,7 @@
 #include <atomic>
 #include <thread>
 
-#include "daemon/error/daemon_error.h"
+#include "daemon/error/log_and_raise.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {
@@ -21,13 +21,13 @@ TEST_F(child_process, raises_errors_whatever_other_threads_do_and_holds_the_lock
     set_inherited_descriptor(lock.get());
     std::atomic<bool> done = false;
     std::thread thread([&done] {
-        while (!done) raise_daemon_error("from the thread");
+        for (; !done; (void)take_log()) (void)log_and_raise("test", "from the thread");
     });
     for (int i = 0; i < 300 && !HasFailure(); ++i) {
         const pid_t child = fork_child();
         if (child == 0) {
             alarm(20);  // not for ever
-            raise_daemon_error("from the child");
+            (void)log_and_raise("test", "from the child");
             _exit(fcntl(lock.get(), F_GETFD) >= 0 && fcntl(other.get(), F_GETFD) < 0 ? 7 : 1);
         }
         int status = 0;

@@ -1,0 +1,104 @@
+// The debug interface on its one TCP port.
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "daemon_test.h"
+
+namespace kivd {
+namespace {
+
+using namespace std::string_literals;
+using enum socket_kind;
+
+const sockaddr_in port = {AF_INET, htons(2305), {htonl(INADDR_LOOPBACK)}, {}};
+
+class debug_interface : public daemon_test {
+ protected:
+    // One test at a time has the port, whichever build it is of; and a client that closed its end
+    // later than a daemon keeps it for a minute.
+    void SetUp() override {
+        EXPECT_EQ(flock(port_lock_.get(), LOCK_EX), 0);
+        const auto is_free = [] {
+            const unique_fd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+            return bind(fd.get(), reinterpret_cast<const sockaddr*>(&port), sizeof port) == 0;
+        };
+        if (!wait_until(is_free, 70000)) GTEST_SKIP() << "port 2305 is in use";
+    }
+    // Its end leaves the port free at once.
+    static unique_fd connect_debugger() {
+        unique_fd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        const linger reset = {1, 0};
+        EXPECT_EQ(setsockopt(fd.get(), SOL_SOCKET, SO_LINGER, &reset, sizeof reset), 0);
+        EXPECT_EQ(connect(fd.get(), reinterpret_cast<const sockaddr*>(&port), sizeof port), 0);
+        return fd;
+    }
+
+ private:
+    const unique_fd port_lock_{
+        open("/tmp/kivd-port-2305.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0666)};
+};
+
+std::string frame(const std::string& packet) {
+    const auto size = static_cast<char>(packet.size());
+    return "\0\0\0"s + static_cast<char>(size + 2) + "\x0a" + size + packet;
+}
+
+// Until there are as many bytes, or the daemon hangs up.
+std::string receive(int fd, size_t size) {
+    std::string all;
+    while (all.size() < size) {
+        const std::string more = receive_text(fd);
+        if (more.empty()) break;
+        all += more;
+    }
+    return all;
+}
+
+TEST_F(debug_interface, shows_every_request_to_its_latest_client) {
+    const daemon_process daemon = start({{"-C", "-d"}});
+    EXPECT_EQ(daemon.count_in_log("I kivd: kivddi (kivd debug interface) Enabled."), 1U);
+    const unique_fd first = connect_debugger();
+    request({"EV p e x"});  // by now it has been accepted
+    const unique_fd second = connect_debugger();
+    (void)receive(first.get(), SIZE_MAX);
+    char byte = 0;
+    EXPECT_EQ(recv(first.get(), &byte, 1, MSG_DONTWAIT), 0);  // hung up
+
+    const unique_fd client = connect_client(stream);
+    EXPECT_EQ(ask(client.get(), "HD 2 IA"), "1");
+    EXPECT_TRUE(send_text(connect_client(datagram).get(), "EV p \xff \0y"s));
+    const std::string expected = frame("IA") + frame("EV p \xff \0y"s);
+    EXPECT_EQ(receive(second.get(), expected.size()), expected);
+    EXPECT_TRUE(send_text(second.get(), "RM 0 and more than ten bytes"));  // not a request
+    EXPECT_EQ(ask(client.get(), "HD 2 XX") + ask(client.get(), "HD 2 IA"), "1");
+    EXPECT_EQ(receive(second.get(), 16), frame("XX") + frame("IA"));
+}
+
+TEST_F(debug_interface, a_client_that_stops_reading_costs_the_daemon_nothing) {
+    daemon_process daemon = start({{"-C", "-d"}});
+    const unique_fd idle = connect_debugger();
+    request({});
+    const size_t descriptors = daemon.descriptors();
+    const std::vector<std::string> flood(2000, "EV p large " + std::string(30000, 'x'));
+    request(flood);  // more than any buffer between them takes
+    EXPECT_TRUE(daemon.wait_log("E kivd-kivddi: Fail to send to socket: ") ||
+                daemon.descriptors() < descriptors);
+    EXPECT_EQ(daemon.stop(), 0);
+    EXPECT_EQ(everything_kept().events_size(), 2000);
+}
+
+TEST_F(debug_interface, a_taken_port_prevents_the_start) {
+    const daemon_process daemon = start({{"-d"}});
+    std::filesystem::create_directory("other");
+    daemon_process other = daemon_process(
+        KIVD_PATH, {{"-D", "-d", "-b", directory + "/other", "-c", "NO_ENCRYPTION"}});
+    EXPECT_EQ(other.wait_exit(), 1);
+    EXPECT_EQ(other.count_in_log("E kivd-kivddi: Cannot bind to di-socket - port already used? "),
+              1U);
+}
+
+}  // namespace
+}  // namespace kivd
