@@ -37,7 +37,7 @@ bool take_key(config_bytes& bytes, uint8_t key) {
 
 // A varint of 32 bits; higher ones are lost.
 std::optional<uint32_t> take_length(config_bytes& bytes) {
-    const size_t limit = std::min({bytes.rest.size(), bytes.file_size - 1, max_varint_size});
+    const size_t limit = std::min(bytes.rest.size(), max_varint_size);
     uint32_t length = 0;
     for (size_t i = 0; i < limit; ++i) {
         length |= (bytes.rest[i] & 0x7FU) << (7 * i);

@@ -116,10 +116,10 @@ config_item* add_item(const probe_key& key) {
     if (id < 1) return nullptr;
     void* added = make_item(key, id, 1);
     if (added == nullptr) return nullptr;
-    if (list_add(*config_list_p, added) == 0) {
-        (void)log_and_raise(tag, "Failed to add new config item: list_add.");
-    }
-    return static_cast<config_item*>(added);  // null when the list has destroyed it
+    if (list_add(*config_list_p, added) == 1) return static_cast<config_item*>(added);
+    (void)log_and_raise(tag, "Failed to add new config item: list_add.");
+    free(added);
+    return nullptr;
 }
 
 void write_part(int32_t id, std::span<const uint8_t> payload) {
@@ -160,7 +160,7 @@ void retire_config_parts() {
 void store_config_part(const char* package, const char* name, std::span<const uint8_t> payload) {
     const probe_key key = {package, name};
     if (is_last_id(key)) {
-        (void)log_and_raise(tag, "Skipped configuration part with the reserved name %s.", name);
+        __android_log_print(ANDROID_LOG_WARN, tag, "Skipped part with the reserved name %s.", name);
         return;
     }
     config_item* item = find_item(key);

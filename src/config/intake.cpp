@@ -83,9 +83,7 @@ void put_in_force(const config_checksum& checksum) {
 bool take_config_file(std::span<const uint8_t> file) {
     config_checksum checksum;
     if (!checksum_of(file, checksum)) return false;
-    if (file.empty() || !extract_config_fields(file)) {
-        return refuse("Failed to unpack configuration");
-    }
+    if (!extract_config_fields(file)) return refuse("Failed to unpack configuration");
     if (config_key_available() &&
         !verify_file(paths::new_config_data, paths::new_config_signature)) {
         return refuse("Failed to verify configuration");

@@ -4,6 +4,7 @@
 #include "config/log_reader.h"
 #include "diag/diag_store.h"
 #include "report/output_dir.h"
+#include "report/report_generation.h"
 #include "settings.pb-c.h"
 
 namespace kivd {
@@ -27,7 +28,10 @@ void run_actions_once() {
         unpack_own_part<kivd__run_actions_once__unpack, kivd__run_actions_once__free_unpacked>(
             once_part);
     if (!actions) return;
-    if (actions->has_remove_reports && actions->remove_reports) delete_reports(0);
+    if (actions->has_remove_reports && actions->remove_reports) {
+        wait_for_compactor();  // its report is one of them
+        delete_reports(0);
+    }
     retire_own_part(once_part);
 }
 

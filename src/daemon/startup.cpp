@@ -224,10 +224,10 @@ void shut_down() {
 
 int run_daemon(int argc, char** argv) {
     open_standard_descriptors();
-    install_signal_handlers();
     init_settings();
     set_default_key_paths();
     const options given = parse_options(argc, argv);
+    install_signal_handlers();
     enter_working_directory(given);
     check_disabled();
 

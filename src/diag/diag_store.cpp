@@ -73,7 +73,7 @@ void start_compressor(int32_t number) {
         wait_for_child(compressor_pid);
     }
     __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report...");
-    compressor_pid = fork_child();
+    compressor_pid = fork_child(child_kind::worker);
     if (compressor_pid < 0) (void)log_and_raise(tag, "Failed to fork compactor thread.");
     if (compressor_pid != 0) return;
 

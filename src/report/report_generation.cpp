@@ -50,7 +50,7 @@ int flush_stores() {
 }
 
 void start_compactor() {
-    const pid_t pid = fork_child();
+    const pid_t pid = fork_child(child_kind::worker);
     if (pid < 0) {
         (void)log_and_raise(tag, "Failed to fork compactor thread.");
         return;

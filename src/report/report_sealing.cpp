@@ -24,18 +24,15 @@ namespace {
 constexpr char tag[] = "kivd-compactor";
 constexpr size_t crypto_fields_size = max_report_key_bits / 8 + 64;
 
-int write_header(int output) {
+// All that stands before the ciphertext.
+int write_envelope(int output, const seal& opened, uint32_t plain_size) {
     const std::span<const uint8_t> header = get_empty_report_header();
     if (header.empty()) return log_and_raise(tag, "Failed to get empty report header.");
-    if (write_all(output, header.data(), header.size()) >= 0) return 0;
-    return log_and_raise(tag, "Failed to write crypto data, %s", strerror(errno));
-}
-
-int write_crypto_fields(int output, const seal& opened, uint32_t plain_size) {
     std::array<uint8_t, crypto_fields_size> fields;
     const size_t size = pack_crypto_fields(fields, opened.encrypted_key.data(), opened.key_bits,
                                            opened.iv, sealed_size(plain_size));
-    if (write_all(output, fields.data(), size) >= 0) return 0;
+    iovec pieces[] = {{const_cast<uint8_t*>(header.data()), header.size()}, {fields.data(), size}};
+    if (write_all(output, pieces) >= 0) return 0;
     return log_and_raise(tag, "Failed to write crypto data, %s", strerror(errno));
 }
 
@@ -50,8 +47,7 @@ int write_sealed_data(seal& opened) {
         return log_and_raise(tag, "Failed to open output encryption file: %s", strerror(errno));
     }
     const auto plain_size = static_cast<uint32_t>(status.st_size);
-    if (write_header(output.get()) != 0) return -1;
-    if (write_crypto_fields(output.get(), opened, plain_size) != 0) return -1;
+    if (write_envelope(output.get(), opened, plain_size) != 0) return -1;
     return encrypt_file(input.get(), output.get(), opened) == 1 ? 0 : -1;
 }
 

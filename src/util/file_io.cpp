@@ -66,7 +66,7 @@ unique_fd create_file(const char* path) {
 }
 
 unique_file open_to_read(const char* path) {
-    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC));
+    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!fd.ok()) return nullptr;
     struct stat status = {};
     if (fstat(fd.get(), &status) == 0 && S_ISDIR(status.st_mode)) {

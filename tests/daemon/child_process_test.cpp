@@ -24,7 +24,7 @@ TEST_F(child_process, raises_errors_whatever_other_threads_do_and_holds_the_lock
         for (; !done; (void)take_log()) (void)log_and_raise("test", "from the thread");
     });
     for (int i = 0; i < 300 && !HasFailure(); ++i) {
-        const pid_t child = fork_child();
+        const pid_t child = fork_child(child_kind::worker);
         if (child == 0) {
             alarm(20);  // not for ever
             (void)log_and_raise("test", "from the child");

@@ -138,7 +138,7 @@ TEST_F(kernel_bridge, holds_up_neither_forks_nor_the_stop) {
         }
     });
     for (int i = 0; i < 200 && !HasFailure(); ++i) {
-        pid_t child = fork_child();
+        pid_t child = fork_child(child_kind::worker);
         if (child == 0) {
             alarm(20);  // not for ever
             (void)log_and_raise("test", "from the child");

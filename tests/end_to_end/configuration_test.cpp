@@ -214,12 +214,12 @@ TEST_F(configuration, what_the_system_brings_is_installed_and_run) {
                "echo $$ >pid.new; mv pid.new pid; exec sleep 1000\n");
     std::filesystem::permissions("/system/bin/kiv-logreader", std::filesystem::perms(0755));
     std::vector<int> readers;
+    const auto runs = [](int pid) { return kill(pid, 0) == 0; };
     const auto wait_reader = [&] {
-        EXPECT_TRUE(wait_until([] { return exists("pid"); }));
+        EXPECT_TRUE(wait_until([&] { return exists("pid") && runs(std::stoi(read_file("pid"))); }));
         readers.push_back(std::stoi(read_file("pid")));
         std::filesystem::remove("pid");
     };
-    const auto runs = [](int pid) { return kill(pid, 0) == 0; };
     // The filter file is there, so nothing is installed anew; the actions are those in force.
     write_file("/system/etc/kivd.conf", "");
     for (const bool test_mode : {false, true}) {
@@ -229,6 +229,14 @@ TEST_F(configuration, what_the_system_brings_is_installed_and_run) {
                                          " 0 SigBlk: 0000000000000000 SigIgn: 0000000000000000\n");
         EXPECT_EQ(daemon.stop(), 0);
         EXPECT_TRUE(runs(readers.back()));  // it outlives the daemon, and keeps no lock
+    }
+    // Taken at the start, it starts a reader that the start's own run of the actions stops again.
+    for (int round = 0; round < 10; ++round) {
+        write_file("input/config", config_file({run}));
+        EXPECT_EQ(start().stop(), 0);
+        wait_reader();
+        EXPECT_EQ(kill(readers.back(), SIGKILL), 0);
+        readers.pop_back();
     }
     daemon = start();
     wait_reader();

@@ -24,6 +24,8 @@ const struct {
     {"FS", "W kivd: forceSave (FS) request denied due to permission!"},
     {"WC p", "W kivd: writeConfiguration (WC) request denied due to permission!"},
     {"NC", "W kivd: notifyNewConfiguration (NC) request denied due to permission!"},
+    {"FN 750 0", "W kivd: fileIteratorNext (FN) request denied due to permission!"},
+    {"FG 750 1", "W kivd: fileGet (FG) request denied due to permission!"},
     {"GD", "W kivd: getDeviceId (GD) request denied due to permission!"},
     {"DC 0", "W kivd: setDataCollectionEnable (DC) request denied due to permission!"},
     {"RM 0", "W kivd: removeReport (RM) request denied due to permission!"},
@@ -83,7 +85,7 @@ TEST_F(permission, strangers_are_refused_every_privileged_request_on_every_socke
 
     size_t sockets = 0;
     for (const socket_kind kind : {datagram, packets, stream}) {
-        EXPECT_EQ(ask_as(stranger, kind, requests), kind == datagram ? "" : "01");
+        EXPECT_EQ(ask_as(stranger, kind, requests), kind == datagram ? "" : "0-1FAIL1");
         ++sockets;
         for (const auto& each : privileged) {
             ASSERT_TRUE(wait_until([&] { return daemon.count_in_log(each.refusal) == sockets; }))

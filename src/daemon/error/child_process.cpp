@@ -34,7 +34,7 @@ void drop_descriptors() {
 
 void set_inherited_descriptor(int fd) { inherited_fd = fd; }
 
-pid_t fork_child() {
+pid_t fork_child(child_kind kind) {
     // No handler may run in the child while it still shares the parent's wake-up event.
     sigset_t all;
     sigset_t before;
@@ -49,7 +49,8 @@ pid_t fork_child() {
 
     log_unlock();
     daemon_error_unlock();
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    // One that is to become another program would lose what its handler took now.
+    if (pid != 0 || kind == child_kind::worker) pthread_sigmask(SIG_SETMASK, &before, nullptr);
     errno = fork_errno;
     return pid;
 }

@@ -3,17 +3,24 @@
 
 #include <sys/types.h>
 
+#include <cstdint>
+
 namespace kivd {
 
 // The descriptor that children hold open beside 0 to 2: the daemon's lock, so that no new daemon
 // meets the work of an old one's child half done.
 void set_inherited_descriptor(int fd);
 
-// fork(). The child may log and raise errors, keeps the flag-only stop handler, and has lost every
-// descriptor but 0 to 2 and the inherited one; it has to end with _exit.
-[[nodiscard]] pid_t fork_child();
+enum class child_kind : uint8_t {
+    worker,   // keeps the flag-only stop handler, so that it ends its work
+    program,  // calls exec_program; no signal reaches it before that has succeeded
+};
 
-// In a forked child: becomes the program `arguments` begins with, which starts with default signal
+// fork(). The child may log and raise errors, and has lost every descriptor but 0 to 2 and the
+// inherited one; it has to end with _exit.
+[[nodiscard]] pid_t fork_child(child_kind kind);
+
+// In such a child: becomes the program `arguments` begins with, which starts with default signal
 // dispositions, an empty mask and environment, and descriptors 0 to 2. Returns only when that
 // failed, with errno set.
 void exec_program(const char* const* arguments);
