@@ -88,8 +88,13 @@ void set_certificate_path(const char* path) {
         __android_log_print(ANDROID_LOG_ERROR, tag, "Certificate path does not exist!");
         exit(1);
     }
-    set_report_key_dir(path);
-    set_config_key_dir(path);
+    // Made absolute, since it is read from another directory than it was checked in.
+    char directory[4096] = "";
+    if (*path != '/' && getcwd(directory, sizeof directory) == nullptr) *directory = '\0';
+    const size_t size = strlen(directory);
+    snprintf(directory + size, sizeof directory - size, "%s%s", size > 0 ? "/" : "", path);
+    set_report_key_dir(directory);
+    set_config_key_dir(directory);
 }
 
 // Where the files of the command-line operations are looked for; they go on where it fails.

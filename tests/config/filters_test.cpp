@@ -63,6 +63,9 @@ TEST_F(filters, lists_and_wildcards_say_what_is_kept_after_a_restart_too) {
     }
     EXPECT_EQ(read_file("private/filters.txt"), "__type\0exclude\0\0\n"s);
     EXPECT_FALSE(filter_match(filter_kind::events, "__type", "exclude"));
+
+    take_filter(doc_example("configuration.md", "text", "filters"));
+    EXPECT_EQ(read_file("private/filters.txt"), doc_example("files.md", "hex", "filters-file"));
 }
 
 TEST_F(filters, what_cannot_be_built_accepts_everything) {

@@ -98,9 +98,13 @@ TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
 }
 
 TEST_F(intake, the_request_names_the_device_and_the_configuration) {
-    const std::string file = config_file({{"a", "x", "1"}});
+    const std::string file = doc_example("configuration.md", "hex", "configuration");
     write_file("input/other", "");
     ASSERT_TRUE(take(file));
+    EXPECT_EQ(read_file("private/config_list.txt"),
+              doc_example("files.md", "hex", "config-list-file"));
+    EXPECT_TRUE(read_file("output/config_request")
+                    .ends_with(doc_example("report-format.md", "hex", "config-request-end")));
     write_file("config", file);
     const std::string digits = openssl("dgst -sha1 -r config").substr(0, 40);
     EXPECT_EQ(get_config_checksum_text().get(), digits);

@@ -267,6 +267,9 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
     write_file("file.sig", sign("some data", "config"));
     EXPECT_EQ(run({"--verify-config", "file", "--encrypt", "file"}), "42 Verified: OK\n");
     EXPECT_FALSE(exists("file.enc"));
+    std::filesystem::create_directory("elsewhere");
+    EXPECT_EQ(run({"-b", "elsewhere", "-c", "keys/", "--verify-config", "../file"}),
+              "42 Verified: OK\n");
     write_file("file", "other data");
     EXPECT_EQ(run({"--verify-config=file"}), "33 Verified: Failure\n");
     const std::string unkeyed = run({"-c", "NO_ENCRYPTION", "--verify-config=file"});
