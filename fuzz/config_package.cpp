@@ -26,8 +26,9 @@ bool equals(const char* text, const char* other) { return strcmp(text, other) ==
 // or a record too long is not read back, the type is told by a marker among the items, and there
 // are two types.
 bool survives_restart(const filter_message& filter) {
-    if (filter.type != KIV__CONFIG__FILTER__TYPE__INCLUDE &&
-        filter.type != KIV__CONFIG__FILTER__TYPE__EXCLUDE) {
+    int32_t type = 0;
+    memcpy(&type, &filter.type, sizeof type);  // may be none of its enumeration
+    if (type != KIV__CONFIG__FILTER__TYPE__INCLUDE && type != KIV__CONFIG__FILTER__TYPE__EXCLUDE) {
         return false;
     }
     return std::all_of(filter.item, filter.item + filter.n_item, [](const auto* item) {
