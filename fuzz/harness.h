@@ -46,7 +46,7 @@ class started_modules {
     started_modules& operator=(const started_modules&) = delete;
 
  private:
-    int lowest_free_;  // descriptor
+    int open_descriptors_;
 };
 
 }  // namespace kivd
