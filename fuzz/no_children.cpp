@@ -9,7 +9,7 @@ namespace kivd {
 
 void set_inherited_descriptor(int /*fd*/) {}
 
-pid_t fork_child() {
+pid_t fork_child(child_kind /*kind*/) {
     errno = EAGAIN;
     return -1;
 }
