@@ -7,6 +7,7 @@
 
 #include "bench/load.h"
 #include "bench/measure.h"
+#include "bench/plain_file.h"
 #include "bench/sections.h"
 #include "diag/gzip_file.h"
 #include "report/record_format.h"
@@ -51,13 +52,6 @@ std::string make_report() {
     return report;
 }
 
-void write_file(const std::string& path, const void* bytes, size_t size) {
-    FILE* const file = fopen(path.c_str(), "wbe");
-    if (file == nullptr) give_up("%s: %s", path.c_str(), strerror(errno));
-    if (fwrite(bytes, 1, size, file) != size) give_up("%s: cannot be written", path.c_str());
-    (void)fclose(file);
-}
-
 void read_file(const std::string& path, std::vector<Bytef>& into) {
     FILE* const file = fopen(path.c_str(), "rbe");
     if (file == nullptr) give_up("%s: %s", path.c_str(), strerror(errno));
@@ -87,7 +81,7 @@ size_t compress_at_once(const std::string& source, const std::string& destinatio
     if (deflate(&stream, Z_FINISH) != Z_STREAM_END) give_up("deflate failed");
     const size_t packed_size = stream.total_out;
     (void)deflateEnd(&stream);
-    write_file(destination, use.packed.data(), packed_size);
+    write_file(destination, {reinterpret_cast<const char*>(use.packed.data()), packed_size});
     return packed_size;
 }
 
@@ -98,7 +92,7 @@ void measure_level(const setup& s, const char* name, gzip_level level, int zlib_
     const std::string ours = directory.path() + "/ours.gz";
     const std::string theirs = directory.path() + "/theirs.gz";
     const std::string report = make_report();
-    write_file(source, report.data(), report.size());
+    write_file(source, report);
 
     std::vector<double> our_ms;
     std::vector<double> their_ms;

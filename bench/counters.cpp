@@ -1,6 +1,5 @@
 // What one counter increment costs among few and among many counters, and what a counter costs in
 // memory.
-#include <sys/mman.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -88,16 +87,11 @@ double time_in_process(unsigned counters, unsigned increments) {
 
 double in_process_round(const setup& s, unsigned counters) {
     const unsigned increments = amount(s, 400'000, 100'000);
-    void* const shared =
-        mmap(nullptr, sizeof(double), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
-    if (shared == MAP_FAILED) give_up("mmap: out of memory");
-    child_process process = fork_child([&] {
+    double result = 0;
+    run_in_child({&result, 1}, [&](std::span<double> figures) {
         if (chdir(s.scratch.c_str()) == -1) give_up("chdir failed");
-        *static_cast<double*>(shared) = time_in_process(counters, increments);
+        figures[0] = time_in_process(counters, increments);
     });
-    process.join();
-    const double result = *static_cast<double*>(shared);
-    (void)munmap(shared, sizeof(double));
     return result;
 }
 

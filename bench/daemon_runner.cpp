@@ -1,6 +1,5 @@
 #include "bench/daemon_runner.h"
 
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/inotify.h>
 #include <unistd.h>
@@ -19,11 +18,11 @@ namespace {
 constexpr int watch_interval_ms = 20;
 
 // Replaces the process by the daemon.
-void run_daemon(const setup& s, const std::string& directory, compression compress) {
-    const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
-    for (int fd = 0; fd <= 2; ++fd) (void)dup2(null, fd);
-    std::vector<const char*> words = {s.kivd.c_str(),   "-D", "-C", "-c", "NO_ENCRYPTION", "-b",
-                                      directory.c_str()};
+void run_daemon(const setup& s, const std::string& directory, compression compress,
+                const std::string& key_directory) {
+    send_output_nowhere();
+    std::vector<const char*> words = {
+        s.kivd.c_str(), "-D", "-C", "-c", key_directory.c_str(), "-b", directory.c_str()};
     if (compress == compression::off) words.push_back("-Z");
     words.push_back(nullptr);
     (void)execv(s.kivd.c_str(), const_cast<char* const*>(words.data()));
@@ -32,10 +31,11 @@ void run_daemon(const setup& s, const std::string& directory, compression compre
 
 }  // namespace
 
-running_daemon start_daemon(const setup& s, const std::string& directory, compression compress) {
+running_daemon start_daemon(const setup& s, const std::string& directory, compression compress,
+                            const std::string& key_directory) {
     running_daemon daemon;
     daemon.started_ns = now_ns();
-    daemon.process = fork_child([&] { run_daemon(s, directory, compress); });
+    daemon.process = fork_child([&] { run_daemon(s, directory, compress, key_directory); });
     return daemon;
 }
 

@@ -29,10 +29,13 @@ struct running_daemon {
     int64_t started_ns = 0;  // on the clock of now_ns
 };
 
-// Starts the daemon on `directory`, not detached, collecting, without encryption; what it logs is
-// lost. It need not be up yet when this returns.
+// Starts the daemon on `directory`, not detached, collecting, with the keys of a directory given
+// with its final "/", or without any; what it logs is lost. It need not be up yet when this
+// returns.
+inline constexpr char no_keys[] = "NO_ENCRYPTION";
 [[nodiscard]] running_daemon start_daemon(const setup& s, const std::string& directory,
-                                          compression compress);
+                                          compression compress,
+                                          const std::string& key_directory = no_keys);
 
 // Increments each of the counters 0 to `count` - 1 once.
 void touch_counters(const std::string& directory, unsigned count);

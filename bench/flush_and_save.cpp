@@ -4,11 +4,10 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
-#include <iterator>
 
 #include "bench/load.h"
 #include "bench/measure.h"
+#include "bench/plain_file.h"
 #include "bench/sections.h"
 
 namespace kivd::bench {
@@ -78,13 +77,8 @@ struct record {
     long long value;
 };
 
-std::string read_whole_file(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-}
-
 std::vector<record> read_records(const std::string& path) {
-    const std::string bytes = read_whole_file(path);
+    const std::string bytes = read_file(path);
     std::vector<record> records;
     size_t at = 0;
     const auto field = [&] {
@@ -157,7 +151,7 @@ void measure_save(const setup& s) {
         start = now_ns();
         save_plainly(records, plain);
         const int64_t plain_ns = now_ns() - start;
-        if (records.size() != saved_counters || read_whole_file(saved) != read_whole_file(plain))
+        if (records.size() != saved_counters || read_file(saved) != read_file(plain))
             give_up("the saved counters are not the expected ones");
         if (i == 0) continue;  // a file that replaces none
         daemon_ms.push_back(static_cast<double>(daemon_ns) / 1e6);

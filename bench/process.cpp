@@ -1,8 +1,10 @@
 #include "bench/process.h"
 
+#include <fcntl.h>
 #include <linux/perf_event.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/mman.h>
 #include <sys/prctl.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -119,6 +121,38 @@ child_process fork_child(const std::function<void()>& body) {
     (void)signal(SIGINT, SIG_IGN);  // the terminal's ^C is for the parent, which ends us
     if (getppid() == parent) body();
     _exit(0);
+}
+
+void send_output_nowhere() {
+    const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
+    for (int fd = 0; fd <= 2; ++fd) (void)dup2(null, fd);
+}
+
+void run_in_child(std::span<double> figures, const std::function<void(std::span<double>)>& body) {
+    const size_t size = figures.size_bytes();
+    void* const shared =
+        mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+    if (shared == MAP_FAILED) give_up("mmap: %s", strerror(errno));
+    child_process process = fork_child([&] {
+        body({static_cast<double*>(shared), figures.size()});
+    });
+    process.join();
+    memcpy(figures.data(), shared, size);
+    (void)munmap(shared, size);
+}
+
+int64_t run_program(const std::vector<std::string>& words) {
+    std::vector<char*> arguments;
+    for (const std::string& word : words) arguments.push_back(const_cast<char*>(word.c_str()));
+    arguments.push_back(nullptr);
+    const int64_t start = now_ns();
+    child_process process = fork_child([&] {
+        send_output_nowhere();
+        (void)execvp(arguments[0], arguments.data());
+        _exit(127);
+    });
+    process.join();
+    return now_ns() - start;
 }
 
 scratch_directory::scratch_directory(const std::string& parent) {

@@ -6,7 +6,9 @@
 
 #include <cstdint>
 #include <functional>
+#include <span>
 #include <string>
+#include <vector>
 
 #include "util/unique_fd.h"
 
@@ -36,6 +38,17 @@ class child_process {
 
 // Runs `body` in a child that dies with this process, and ends it when `body` returns.
 [[nodiscard]] child_process fork_child(const std::function<void()>& body);
+
+// In a child that is to become another program: what that prints is lost.
+void send_output_nowhere();
+
+// Runs `body` in such a child, which fills in the figures, and waits for its end. What the child
+// does to the state of the process, a directory or a library, is gone with it.
+void run_in_child(std::span<double> figures, const std::function<void(std::span<double>)>& body);
+
+// Runs a program, found as the shell would, to its end and gives the time from its start to there,
+// in ns. What it prints is lost; gives the run up when it fails.
+int64_t run_program(const std::vector<std::string>& words);
 
 // A directory of its own below `parent`, removed with all that is in it.
 class scratch_directory {

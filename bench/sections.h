@@ -12,6 +12,9 @@ void measure_counters(const setup& s);
 void measure_flush(const setup& s);
 void measure_save(const setup& s);
 void measure_compaction(const setup& s);
+void measure_filters(const setup& s);
+void measure_intake(const setup& s);
+void measure_sealing(const setup& s);
 void measure_latency(const setup& s);
 void measure_footprint(const setup& s);
 

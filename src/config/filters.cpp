@@ -176,15 +176,24 @@ bool add_exclude_marker(sorted_list& list) {
     return false;
 }
 
+// As it came. An enumeration may not be read as one when it holds a number that is none of it.
+int32_t type_of(const filter_message& message) {
+    int32_t type = 0;
+    static_assert(sizeof message.type == sizeof type);
+    memcpy(&type, &message.type, sizeof type);
+    return type;
+}
+
 void apply_filter(filter& applied, const filter_message* wanted) {
     if (wanted == nullptr) return reset_filter(applied);
+    const int32_t type = type_of(*wanted);
     unique_list list(create_filter_list());
     if (!list || !add_items(*list, *wanted) ||
-        (wanted->type == exclude_type && !add_exclude_marker(*list)) ||
+        (type == exclude_type && !add_exclude_marker(*list)) ||
         list_save(*list, applied.path, write_record, nullptr) == 0) {
         return reset_filter(applied);
     }
-    install_filter(applied, std::move(list), wanted->type);
+    install_filter(applied, std::move(list), type);
 }
 
 filter& get_filter(filter_kind kind) { return filters[static_cast<size_t>(kind)]; }
