@@ -20,6 +20,7 @@
 #include "config/filters.h"
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
+#include "diag/diag_store.h"
 #include "report/header_record.h"
 #include "report/state_file.h"
 #include "store/counter_store.h"
@@ -85,6 +86,7 @@ void require(bool holds, const char* what_went_wrong) {
 }
 
 void clear_files() {
+    qz_set_active(0);  // a directory of its own
     for (const char* directory : directories) clear_directory(directory);
 }
 

@@ -1,6 +1,5 @@
 #include "config/config_parts.h"
 
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -144,7 +143,7 @@ void release_config_list() { list_destroy(config_list_p); }
 unique_fd get_config_fd(const char* package, const char* name) {
     const config_item* const item = find_item({package, name});
     if (item == nullptr || item->in_use == 0) return unique_fd();
-    return unique_fd(open(part_path(item->id).text, O_RDONLY | O_CLOEXEC));
+    return open_regular(part_path(item->id).text);
 }
 
 std::optional<file_bytes> read_own_part(const char* name) {

@@ -1,6 +1,5 @@
 #include "config/intake.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <openssl/evp.h>
 #include <sys/stat.h>
@@ -27,6 +26,7 @@
 #include "report/state_file.h"
 #include "security/key_paths.h"
 #include "security/signature.h"
+#include "util/directory.h"
 #include "util/file_io.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -37,16 +37,12 @@ namespace {
 constexpr char tag[] = "kivd-conf";
 
 void clean_input_dir() {
-    const unique_dir directory(opendir(paths::input_dir));
-    if (!directory) return;
-    while (const dirent* const entry = readdir(directory.get())) {
-        const std::string_view name = entry->d_name;
-        if (name == "." || name == "..") continue;
+    (void)for_each_entry(paths::input_dir, [](std::string_view name) {
         char path[sizeof paths::input_dir + NAME_MAX];
-        snprintf(path, sizeof path, "%s%s", paths::input_dir, entry->d_name);
-        if (unlink(path) == 0) continue;
+        snprintf(path, sizeof path, "%s%s", paths::input_dir, name.data());
+        if (unlink(path) == 0) return;
         __android_log_print(ANDROID_LOG_WARN, tag, "Failed to delete %s.", path);
-    }
+    });
 }
 
 bool refuse(const char* reason) {

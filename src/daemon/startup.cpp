@@ -2,13 +2,11 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
-#include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -22,6 +20,7 @@
 #include "daemon/debug/debug_interface.h"
 #include "daemon/error/child_process.h"
 #include "daemon/error/daemon_error.h"
+#include "daemon/error/give_up.h"
 #include "daemon/event_loop.h"
 #include "daemon/kernel/kernel_bridge.h"
 #include "daemon/net/client_sockets.h"
@@ -68,23 +67,14 @@ void detach() {
     log_to_system();
 }
 
-[[gnu::format(printf, 1, 2), noreturn]] void give_up(const char* format, ...) {
-    char text[error_text_size];
-    va_list arguments;
-    va_start(arguments, format);
-    vsnprintf(text, sizeof text, format, arguments);
-    va_end(arguments);
-    __android_log_print(ANDROID_LOG_ERROR, tag, "%s", text);
-    exit(1);
-}
-
 unique_fd lock_file() {
     unique_fd fd(open(paths::lock_file, O_RDWR | O_CREAT | O_CLOEXEC, 0644));
     if (!fd.ok()) {
-        give_up("Failed to open lock file %s, and errno is %s", paths::lock_file, strerror(errno));
+        give_up(tag, "Failed to open lock file %s, and errno is %s", paths::lock_file,
+                strerror(errno));
     }
     if (flock(fd.get(), LOCK_EX | LOCK_NB) != 0) {
-        give_up("Another kivd is already running, and errno is %s", strerror(errno));
+        give_up(tag, "Another kivd is already running, and errno is %s", strerror(errno));
     }
     return fd;
 }
@@ -147,7 +137,7 @@ void install_signal_handlers() {
 
 void create_directory(const char* path, mode_t mode, const char* name) {
     if (mkdir(path, mode) == 0 || errno == EEXIST) return;
-    give_up("Failed to create %s directory: %s", name, strerror(errno));
+    give_up(tag, "Failed to create %s directory: %s", name, strerror(errno));
 }
 
 void create_directories() {
@@ -156,14 +146,6 @@ void create_directories() {
     create_directory(paths::output_dir, 0755, "output");
     create_directory(paths::input_dir, 0755, "input");
     umask(022);
-}
-
-// One client a descriptor: there are as many as the system allows.
-void raise_descriptor_limit() {
-    rlimit limit = {};
-    if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-    limit.rlim_cur = limit.rlim_max;
-    (void)setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 // Puts the process into its place: detached, in its directory, the only one there.
@@ -175,10 +157,11 @@ void enter_working_directory(const options& given) {
         fflush(stdout);
     }
     if (chdir(given.base_directory) != 0) {
-        give_up("Could not chdir(%s), and errno is %s", given.base_directory, strerror(errno));
+        give_up(tag, "Could not chdir(%s), and errno is %s", given.base_directory, strerror(errno));
     }
     take_lock();
-    stop_init();
+    raise_descriptor_limit();
+    if (!stop_init()) give_up(tag, "Failed to create stop event: %s", strerror(errno));
 }
 
 void load_everything() {
@@ -232,7 +215,6 @@ int run_daemon(int argc, char** argv) {
     check_disabled();
 
     __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
-    raise_descriptor_limit();
     create_directories();
     load_everything();
 
@@ -244,7 +226,7 @@ int run_daemon(int argc, char** argv) {
     }
     mark_saved();
     run_actions();
-    if (!start_kernel_bridge()) give_up("Failed to create kivkb thread, bailing.\n");
+    if (!start_kernel_bridge()) give_up(tag, "Failed to create kivkb thread, bailing.\n");
     __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the world.");
     event_loop_run();
 

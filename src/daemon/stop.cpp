@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <cstdint>
 
+#include "util/clock.h"
+
 namespace kivd {
 namespace {
 
@@ -17,7 +19,10 @@ static_assert(std::atomic<int>::is_always_lock_free, "the signal handler writes 
 
 }  // namespace
 
-void stop_init() { stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK); }
+bool stop_init() {
+    stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+    return stop_event >= 0;
+}
 
 int stop_event_fd() { return stop_event; }
 
@@ -31,11 +36,12 @@ void request_stop() {
 
 bool is_stop_requested() { return stop_flag != 0; }
 
-void wait_for_stop() {
-    constexpr int day_ms = 86400 * 1000;
-    while (!is_stop_requested()) {
+void wait_for_stop(int timeout_ms) {
+    const int64_t deadline_ms = monotonic_ms() + timeout_ms;
+    for (int64_t left_ms = timeout_ms; left_ms > 0; left_ms = deadline_ms - monotonic_ms()) {
         pollfd event = {stop_event, POLLIN, 0};
-        (void)poll(&event, 1, day_ms);
+        if (is_stop_requested()) return;
+        (void)poll(&event, 1, static_cast<int>(left_ms));
     }
 }
 

@@ -3,9 +3,8 @@
 
 namespace kivd {
 
-// Makes the event that request_stop signals. When it cannot be made, a stop is seen at the next
-// wake-up.
-void stop_init();
+// Makes the event that request_stop signals. False, with errno set, when it cannot be made.
+[[nodiscard]] bool stop_init();
 
 // Readable once a stop has been requested; -1 when there is none.
 [[nodiscard]] int stop_event_fd();
@@ -14,8 +13,8 @@ void stop_init();
 void request_stop();
 [[nodiscard]] bool is_stop_requested();
 
-// Waits until a stop is requested.
-void wait_for_stop();
+// Waits until a stop is requested, for at most that time.
+void wait_for_stop(int timeout_ms);
 
 // In a forked child: a signal there sets the child's flag and wakes nobody else.
 void stop_forget_event();

@@ -1,20 +1,22 @@
 #include "diag/diag_files.h"
 
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <optional>
 #include <string_view>
+#include <utility>
 
 #include "daemon/error/log_and_raise.h"
 #include "platform/android_log.h"
+#include "util/directory.h"
+#include "util/file_io.h"
 #include "util/paths.h"
+#include "util/text_scan.h"
 
 namespace kivd {
 namespace {
@@ -24,28 +26,13 @@ constexpr char tag[] = "kivd-qz";
 // The last one that a client asked for: it still answers when the directory is gone.
 constinit diag_numbers exported = {};
 
-// Calls `function` with the name of each entry. False, with errno set, when the directory cannot be
-// opened.
-bool for_each_entry(auto function) {
-    const unique_dir directory(opendir(paths::diag_dir));
-    if (!directory) return false;
-    while (const dirent* const entry = readdir(directory.get())) {
-        const std::string_view name = entry->d_name;
-        if (name != "." && name != "..") function(entry->d_name);
-    }
-    return true;
-}
-
 // Reads a name as scanf does with "q%*c_%d": what follows the number does not matter.
-std::optional<int32_t> diag_number(const char* name) {
-    if (name[0] != 'q' || name[1] == '\0' || name[2] != '_') return std::nullopt;
-    char* end = nullptr;
-    const long number = strtol(name + 3, &end, 10);
-    if (end == name + 3) return std::nullopt;
-    return static_cast<int32_t>(number);
+std::optional<int32_t> diag_number(std::string_view name) {
+    if (name.size() < 3 || name[0] != 'q' || name[2] != '_') return std::nullopt;
+    const std::optional<int64_t> number = scan_number(name.data() + 3);
+    return number ? std::optional(static_cast<int32_t>(*number)) : std::nullopt;
 }
 
-// A file that is gone already is fine.
 void delete_entry(const char* path) {
     if (unlink(path) == 0 || errno == ENOENT) return;
     (void)log_and_raise(tag, "Failed to delete %s, <%s>", path, strerror(errno));
@@ -58,12 +45,12 @@ diag_path::diag_path(char letter, int32_t number) {
 }
 
 bool scan_diag_files(diag_numbers& numbers) {
-    diag_numbers found = {1, no_diag_file};
-    const bool scanned = for_each_entry([&found](const char* name) {
+    diag_numbers found = {1, INT32_MAX};
+    const bool scanned = for_each_entry(paths::diag_dir, [&found](std::string_view name) {
         const std::optional<int32_t> number = diag_number(name);
         if (!number) {
             __android_log_print(ANDROID_LOG_WARN, tag, "Unexpected file in %s directory: %s",
-                                paths::diag_dir, name);
+                                paths::diag_dir, name.data());
             return;
         }
         found.highest = std::max(found.highest, *number);
@@ -73,30 +60,29 @@ bool scan_diag_files(diag_numbers& numbers) {
     return scanned;
 }
 
+void delete_diag_file(const diag_path& path) { delete_entry(path.text); }
+
 void delete_diag_files(int32_t from, int32_t to) {
     // By what is there: with numbers far apart there may be very many to go through.
-    (void)for_each_entry([from, to](const char* name) {
+    (void)for_each_entry(paths::diag_dir, [from, to](std::string_view name) {
         const std::optional<int32_t> number = diag_number(name);
         if (!number || *number < from || *number > to) return;
-        delete_entry(diag_path('y', *number).text);
-        delete_entry(diag_path('z', *number).text);
+        delete_diag_file({'y', *number});
+        delete_diag_file({'z', *number});
     });
 }
 
 void delete_all_diag_entries() {
-    (void)for_each_entry([](const char* name) {
+    (void)for_each_entry(paths::diag_dir, [](std::string_view name) {
         char path[sizeof paths::diag_dir + NAME_MAX];
-        snprintf(path, sizeof path, "%s%s", paths::diag_dir, name);
+        snprintf(path, sizeof path, "%s%s", paths::diag_dir, name.data());
         delete_entry(path);
     });
 }
 
-void delete_plain_diag_file(int32_t number) { delete_entry(diag_path('z', number).text); }
-
 unique_fd qz_file_open(int32_t number) {
-    unique_fd compressed(open(diag_path('y', number).text, O_RDONLY | O_CLOEXEC));
-    if (compressed.ok()) return compressed;
-    return unique_fd(open(diag_path('z', number).text, O_RDONLY | O_CLOEXEC));
+    unique_fd compressed = open_regular(diag_path('y', number).text);
+    return compressed.ok() ? std::move(compressed) : open_regular(diag_path('z', number).text);
 }
 
 int32_t qz_file_next(int32_t number) {

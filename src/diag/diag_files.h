@@ -8,12 +8,10 @@
 
 namespace kivd {
 
-inline constexpr int32_t no_diag_file = 2147483647;  // as the lowest number
-
-// The numbers that are there, whatever the files hold.
+// The numbers that are there, whatever the files hold. Without any the lowest is above the highest.
 struct diag_numbers {
-    int32_t highest = 0;  // 1 when there is none
-    int32_t lowest = 0;   // no_diag_file when there is none
+    int32_t highest;
+    int32_t lowest;
 };
 
 struct diag_path {
@@ -22,17 +20,15 @@ struct diag_path {
     char text[32];
 };
 
-// False, with errno set and `numbers` unchanged, when the directory cannot be read. Foreign entries
-// have been logged.
+// False, with errno set and `numbers` unchanged, when the directory cannot be read; without a file
+// the numbers are 1 and 2147483647. Foreign entries have been logged.
 [[nodiscard]] bool scan_diag_files(diag_numbers& numbers);
 
-// Deletes the files numbered `from` to `to`, or every entry of the directory. What could not be
-// deleted has been logged and raised.
+// Deletes one file, those numbered `from` to `to`, or every entry of the directory. What could not
+// be deleted has been logged and raised; that it is gone already is fine.
+void delete_diag_file(const diag_path& path);
 void delete_diag_files(int32_t from, int32_t to);
 void delete_all_diag_entries();
-
-// Deletes the plain file of that number, as above.
-void delete_plain_diag_file(int32_t number);
 
 // The file of that number to read, compressed if it is so; not ok when there is none.
 [[nodiscard]] unique_fd qz_file_open(int32_t number);

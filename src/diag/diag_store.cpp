@@ -60,28 +60,36 @@ bool qz_select(const char* package, const char* name, std::span<const char> payl
 
 unique_fd open_current(int32_t number) {
     const diag_path path('z', number);
-    unique_fd fd(open(path.text, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0700));
+    unique_fd fd(open(path.text, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NONBLOCK, 0700));
     if (!fd.ok()) {
         (void)log_and_raise(tag, "Failed to open %s, <%s>", path.text, strerror(errno));
     }
     return fd;
 }
 
+// The compressed file takes the plain one's place when it is complete, so that no cut one hides it.
+void compress(int32_t number) {
+    const diag_path plain('z', number);
+    const diag_path compressed('y', number);
+    if (fu_gzip_file(plain.text, paths::diag_compressed, gzip_level::best) != 0 &&
+        rename(paths::diag_compressed, compressed.text) == 0) {
+        delete_diag_file(plain);
+    } else {
+        (void)unlink(paths::diag_compressed);
+    }
+}
+
 void start_compressor(int32_t number) {
     if (compressor_pid >= 0) {
         __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report. Waiting...");
-        wait_for_child(compressor_pid);
     }
+    qz_wait_for_compressor();
     __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report...");
     compressor_pid = fork_child(child_kind::worker);
     if (compressor_pid < 0) (void)log_and_raise(tag, "Failed to fork compactor thread.");
     if (compressor_pid != 0) return;
 
-    const diag_path plain('z', number);
-    const diag_path compressed('y', number);
-    if (fu_gzip_file(plain.text, compressed.text, gzip_level::best) != 0) {
-        delete_plain_diag_file(number);
-    }
+    compress(number);
     __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report. Done...");
     _exit(0);
 }
@@ -89,7 +97,7 @@ void start_compressor(int32_t number) {
 // Lets the files go that are too old by now; gives the number of the next one.
 int32_t make_room(const diag_numbers& numbers) {
     if (numbers.highest == INT32_MAX) {
-        wait_for_child(compressor_pid);  // or its file would come back
+        qz_wait_for_compressor();  // or its file would come back
         delete_diag_files(INT32_MIN, INT32_MAX);
         return 1;
     }

@@ -28,15 +28,12 @@ constexpr kept_tag kept_tags[] = {
 
 enum wire_type : uint32_t { varint = 0, fixed64 = 1, length_delimited = 2, fixed32 = 5 };
 
-// The messages that hold others: LogMessage a List, List its Fields, Field a List again.
-struct message_kind {
-    uint32_t nested_field;
-    const message_kind* nested;
-};
-extern const message_kind list_kind;
-constexpr message_kind log_message_kind = {9, &list_kind};
-constexpr message_kind field_kind = {4, &list_kind};
-constexpr message_kind list_kind = {1, &field_kind};
+// The field in which a message `depth` levels down holds the next: a LogMessage its List, a List
+// its Fields, a Field another List.
+constexpr uint32_t nesting_field(int depth) {
+    if (depth == 0) return 9;
+    return depth % 2 == 1 ? 1 : 4;
+}
 
 using bytes = std::span<const uint8_t>;
 
@@ -79,7 +76,7 @@ std::optional<bytes> take_content(bytes& rest, uint32_t type) {
 
 // Whether the message is made of fields all through and not nested too deep. The decoder calls
 // itself for each level, however many there are: a small payload could overflow the stack.
-bool is_decodable(bytes message, const message_kind& kind, int depth) {
+bool is_decodable(bytes message, int depth) {
     if (depth > max_depth) return false;
     while (!message.empty()) {
         const auto key = take_varint(message, 5);
@@ -87,8 +84,9 @@ bool is_decodable(bytes message, const message_kind& kind, int depth) {
         const auto type = static_cast<uint32_t>(*key & 7U);
         const auto content = take_content(message, type);
         if (!content) return false;
-        const bool nested = type == length_delimited && (*key >> 3U) == kind.nested_field;
-        if (nested && !is_decodable(*content, *kind.nested, depth + 1)) return false;
+        const bool nested =
+            type == length_delimited && static_cast<uint32_t>(*key >> 3U) == nesting_field(depth);
+        if (nested && !is_decodable(*content, depth + 1)) return false;
     }
     return true;
 }
@@ -98,7 +96,7 @@ bool is_decodable(bytes message, const message_kind& kind, int depth) {
 bool qz_log_message_check(std::span<const char> payload) {
     const bytes encoded(reinterpret_cast<const uint8_t*>(payload.data()), payload.size());
     const auto message =
-        is_decodable(encoded, log_message_kind, 0)
+        is_decodable(encoded, 0)
             ? unpack_message<kiv__system_logging__log_message__unpack,
                              kiv__system_logging__log_message__free_unpacked>(encoded)
             : nullptr;

@@ -7,7 +7,6 @@
 #include <cerrno>
 #include <climits>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <optional>
 #include <string_view>
@@ -17,8 +16,9 @@
 #include "daemon/stop.h"
 #include "diag/diag_store.h"
 #include "platform/android_log.h"
+#include "util/directory.h"
 #include "util/paths.h"
-#include "util/unique_fd.h"
+#include "util/text_scan.h"
 
 namespace kivd {
 namespace {
@@ -35,30 +35,18 @@ struct entry_path {
     char text[sizeof paths::output_dir + NAME_MAX];
 };
 
-// Calls `function` with the name of each entry but "config_request". False, with errno set, when
-// the directory cannot be read, or not to its end.
-bool for_each_entry(auto function) {
-    const unique_dir directory(opendir(paths::output_dir));
-    if (!directory) return false;
-    for (;;) {
-        errno = 0;
-        const dirent* const entry = readdir(directory.get());
-        if (entry == nullptr) return errno == 0;
-        const std::string_view name = entry->d_name;
-        if (name != "." && name != ".." && name != paths::config_request_name) {
-            function(entry->d_name);
-        }
-    }
+// Each entry but "config_request"; as for_each_entry.
+bool for_each_output(auto function) {
+    return for_each_entry(paths::output_dir, [&function](std::string_view name) {
+        if (name != paths::config_request_name) function(name.data());
+    });
 }
 
 // Reads a name as scanf does with "kiv_%d": what follows the number does not matter.
 std::optional<int32_t> report_number(const char* name) {
-    constexpr size_t prefix_size = sizeof paths::report_prefix - 1;
-    if (strncmp(name, paths::report_prefix, prefix_size) != 0) return std::nullopt;
-    char* end = nullptr;
-    const long number = strtol(name + prefix_size, &end, 10);
-    if (end == name + prefix_size) return std::nullopt;
-    return static_cast<int32_t>(number);
+    if (!std::string_view(name).starts_with(paths::report_prefix)) return std::nullopt;
+    const std::optional<int64_t> number = scan_number(name + sizeof paths::report_prefix - 1);
+    return number ? std::optional(static_cast<int32_t>(*number)) : std::nullopt;
 }
 
 struct directory_state {
@@ -69,7 +57,7 @@ struct directory_state {
 };
 
 bool scan_output_dir(directory_state& state) {
-    const bool complete = for_each_entry([&state](const char* name) {
+    const bool complete = for_each_output([&state](const char* name) {
         const entry_path path(name);
         struct stat status = {};
         if (lstat(path.text, &status) != 0) {
@@ -114,7 +102,7 @@ void log_deleted(const char* log_tag, const char* path) {
 }
 
 void delete_all_entries() {
-    (void)for_each_entry([](const char* name) {
+    (void)for_each_output([](const char* name) {
         const entry_path path(name);
         if (unlink(path.text) == 0) log_deleted(remove_tag, path.text);
     });
@@ -160,7 +148,8 @@ void delete_reports(int32_t number) {
 void check_disabled() {
     if (access(paths::disable_marker, F_OK) != 0) return;
     __android_log_print(ANDROID_LOG_ERROR, remove_tag, "KIV will disable itself.");
-    wait_for_stop();
+    constexpr int day_ms = 86400 * 1000;
+    while (!is_stop_requested()) wait_for_stop(day_ms);
 }
 
 }  // namespace kivd

@@ -65,6 +65,16 @@ unique_fd create_file(const char* path) {
     return unique_fd(open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
 }
 
+unique_fd open_regular(const char* path) {
+    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));  // no waiting for a pipe's writer
+    struct stat status = {};
+    if (fd.ok() && (fstat(fd.get(), &status) != 0 || !S_ISREG(status.st_mode))) {
+        fd.reset();
+        errno = EINVAL;
+    }
+    return fd;
+}
+
 unique_file open_to_read(const char* path) {
     unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!fd.ok()) return nullptr;

@@ -38,6 +38,10 @@ struct file_bytes {
 // Creates a file to write to, or empties the one that is there; not ok, with errno set, on failure.
 [[nodiscard]] unique_fd create_file(const char* path);
 
+// Opens a regular file to read; not ok, with errno set, when it is none (EINVAL) or cannot be
+// opened.
+[[nodiscard]] unique_fd open_regular(const char* path);
+
 // Opens a file to read; null with errno set. Unlike plain fopen it refuses a directory (EISDIR) and
 // doesn't wait for the writer of a pipe.
 [[nodiscard]] unique_file open_to_read(const char* path);

@@ -45,6 +45,7 @@ inline constexpr char event_filter[] = "private/filters.txt";
 inline constexpr char log_reader[] = "/system/bin/kiv-logreader";
 
 inline constexpr char diag_dir[] = "private/qz/";
+inline constexpr char diag_compressed[] = "private/qz_compressed";  // while it is being made
 
 inline constexpr char random_uuid[] = "/proc/sys/kernel/random/uuid";
 

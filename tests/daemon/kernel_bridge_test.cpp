@@ -127,7 +127,7 @@ TEST_F(kernel_bridge, its_set_up_says_what_fails_but_for_a_silent_kernel) {
 
 // Everything at once: messages, errors from both threads, forks, and a daemon that reads nothing.
 TEST_F(kernel_bridge, holds_up_neither_forks_nor_the_stop) {
-    stop_init();
+    EXPECT_TRUE(stop_init());
     std::thread bridge([this] {
         while (!is_stop_requested()) (void)receive_kernel_message(netlink_.get(), daemon_);
     });

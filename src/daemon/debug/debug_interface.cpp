@@ -6,10 +6,11 @@
 
 #include <array>
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 
+#include "daemon/error/give_up.h"
 #include "daemon/event_loop.h"
+#include "daemon/net/turn_away.h"
 #include "platform/android_log.h"
 #include "report/record_format.h"
 
@@ -37,6 +38,7 @@ void close_client() {
 // A new client takes the place of the one before.
 void di_accept(event_handler& handler) {
     const int fd = accept4(handler.fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+    if (fd < 0 && errno != EAGAIN) turn_away_client(handler.fd);
     close_client();
     client.fd = fd;
     if (fd >= 0 && event_loop_add(client) != 0) close_client();
@@ -47,24 +49,20 @@ void di_client_readable(event_handler& handler) {
     if (recv(handler.fd, unwanted, sizeof unwanted, MSG_DONTWAIT) == 0) close_client();
 }
 
-[[noreturn]] void give_up(const char* what) {
-    __android_log_print(ANDROID_LOG_ERROR, tag, "%s %s", what, strerror(errno));
-    exit(1);
-}
-
 }  // namespace
 
 void di_start() {
     listener.fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    if (listener.fd < 0) give_up("Failed to create di-socket:");
+    if (listener.fd < 0) give_up(tag, "Failed to create di-socket: %s", strerror(errno));
     sockaddr_in address = {};
     address.sin_family = AF_INET;
     address.sin_port = htons(port);
     if (bind(listener.fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        give_up("Cannot bind to di-socket - port already used?");
+        give_up(tag, "Cannot bind to di-socket - port already used? %s", strerror(errno));
     }
-    if (listen(listener.fd, listen_backlog) != 0) give_up("Failed to listen to di-socket:");
-    (void)event_loop_add(listener);
+    if (listen(listener.fd, listen_backlog) != 0 || event_loop_add(listener) != 0) {
+        give_up(tag, "Failed to listen to di-socket: %s", strerror(errno));
+    }
 }
 
 void di_mirror_request(std::span<const char> packet) {

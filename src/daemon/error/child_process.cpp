@@ -1,5 +1,6 @@
 #include "daemon/error/child_process.h"
 
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -15,6 +16,7 @@ namespace kivd {
 namespace {
 
 constinit int inherited_fd = -1;
+constinit rlimit usual_descriptor_limit = {};
 
 void drop_descriptors() {
     const auto first = static_cast<unsigned>(STDERR_FILENO + 1);
@@ -33,6 +35,12 @@ void drop_descriptors() {
 }  // namespace
 
 void set_inherited_descriptor(int fd) { inherited_fd = fd; }
+
+void raise_descriptor_limit() {
+    if (getrlimit(RLIMIT_NOFILE, &usual_descriptor_limit) != 0) return;
+    const rlimit raised = {usual_descriptor_limit.rlim_max, usual_descriptor_limit.rlim_max};
+    (void)setrlimit(RLIMIT_NOFILE, &raised);
+}
 
 pid_t fork_child(child_kind kind) {
     // No handler may run in the child while it still shares the parent's wake-up event.
@@ -62,6 +70,9 @@ void exec_program(const char* const* arguments) {
     sigset_t none;
     sigemptyset(&none);
     pthread_sigmask(SIG_SETMASK, &none, nullptr);
+    if (usual_descriptor_limit.rlim_max > 0) {
+        (void)setrlimit(RLIMIT_NOFILE, &usual_descriptor_limit);
+    }
     char* const no_environment[] = {nullptr};
     (void)execve(*arguments, const_cast<char* const*>(arguments), no_environment);
 }

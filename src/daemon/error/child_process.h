@@ -11,6 +11,10 @@ namespace kivd {
 // meets the work of an old one's child half done.
 void set_inherited_descriptor(int fd);
 
+// Raises the limit of open descriptors as far as it goes: each client takes one. Programs that are
+// started have the one from before.
+void raise_descriptor_limit();
+
 enum class child_kind : uint8_t {
     worker,   // keeps the flag-only stop handler, so that it ends its work
     program,  // calls exec_program; no signal reaches it before that has succeeded

@@ -8,12 +8,12 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <optional>
 #include <span>
 #include <string_view>
 
@@ -32,6 +32,7 @@ constexpr suseconds_t send_timeout_us = 50000;  // then it looks whether the dae
 
 constinit pthread_t thread = {};
 constinit bool thread_started = false;
+constinit std::atomic<bool> is_set_up = false;
 
 // Logs "WHAT [errno/text]"; gives the errno.
 int fail(const char* what, const char* end = "") {
@@ -51,11 +52,7 @@ bool wait_for_message(int fd) {
 
 // The size of the message that waits, without taking it; -1 on failure.
 ssize_t peek_size(int netlink) {
-    ssize_t size = 0;
-    do {
-        size = recv(netlink, nullptr, 0, MSG_PEEK | MSG_TRUNC | MSG_DONTWAIT);
-    } while (size < 0 && errno == EINTR);
-    return size;
+    return recv(netlink, nullptr, 0, MSG_PEEK | MSG_TRUNC | MSG_DONTWAIT);
 }
 
 // Waits for room in the daemon's queue until the daemon is to stop. Gives what sendto gives.
@@ -128,6 +125,7 @@ void pass_on(const daemon_socket& daemon, std::span<char> message) {
 }
 
 void* run_thread(void* /*argument*/) {
+    (void)pthread_setname_np(pthread_self(), "kivkb");
     kivkb_main();
     return nullptr;
 }
@@ -154,7 +152,9 @@ int open_netlink_socket(unique_fd& netlink) {
     own.nl_pid = static_cast<uint32_t>(getpid());
     if (bind(netlink.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0) return 0;
     const int error = fail("Failed to assign netlink socket name", ".");
-    netlink.reset();
+    if (close(netlink.release()) != 0) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to close netlink socket.");
+    }
     return error;
 }
 
@@ -189,12 +189,14 @@ int receive_kernel_message(int netlink, daemon_socket& daemon) {
 }
 
 void kivkb_main() {
-    daemon_socket daemon;
-    unique_fd netlink;
-    if (open_daemon_socket(daemon) != 0 || open_netlink_socket(netlink) != 0 ||
-        send_pid_to_kernel(netlink.get()) != 0) {
-        return;
-    }
+    // They stay open until the process ends, so that nobody else takes the port.
+    static daemon_socket daemon;
+    static unique_fd netlink;
+    const bool serving = open_daemon_socket(daemon) == 0 && open_netlink_socket(netlink) == 0 &&
+                         send_pid_to_kernel(netlink.get()) == 0;
+    is_set_up = true;
+    is_set_up.notify_one();
+    if (!serving) return;
     while (!is_stop_requested()) (void)receive_kernel_message(netlink.get(), daemon);
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting Down...");
 }
@@ -206,7 +208,7 @@ bool start_kernel_bridge() {
     pthread_sigmask(SIG_SETMASK, &all, &before);  // a stop signal has to wake the loop
     thread_started = pthread_create(&thread, nullptr, run_thread, nullptr) == 0;
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    if (thread_started) (void)pthread_setname_np(thread, "kivkb");
+    if (thread_started) is_set_up.wait(false);  // what it opens is open from the start on
     return thread_started;
 }
 

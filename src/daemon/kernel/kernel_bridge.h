@@ -29,7 +29,8 @@ int receive_kernel_message(int netlink, daemon_socket& daemon);
 // The body of the thread: ends when the set-up fails or the daemon is to stop.
 void kivkb_main();
 
-// Starts the thread, which takes no signals. False when there is none.
+// Starts the thread, which takes no signals, and waits until it is set up or has given up. False
+// when there is none.
 [[nodiscard]] bool start_kernel_bridge();
 // Waits until it has ended; the daemon is to stop.
 void join_kernel_bridge();

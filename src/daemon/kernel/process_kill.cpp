@@ -26,17 +26,11 @@ struct raw_process_kill {
 };
 static_assert(sizeof(raw_process_kill) == 64);
 
-struct named_process_kill {
-    raw_process_kill raw;
-    char comm[sizeof raw_process_kill::comm + 1];
-};
-
-void fill(Kernel__ProcessKill& message, named_process_kill& kill) {
+void fill(Kernel__ProcessKill& message, const raw_process_kill& raw, char* comm) {
     const auto set = [](protobuf_c_boolean& present, int32_t& field, int32_t value) {
         present = 1;
         field = value;
     };
-    const raw_process_kill& raw = kill.raw;
     set(message.has_pid, message.pid, raw.pid);
     set(message.has_rss, message.rss, raw.rss);
     set(message.has_oom_score_adj, message.oom_score_adj, raw.oom_score_adj);
@@ -45,8 +39,7 @@ void fill(Kernel__ProcessKill& message, named_process_kill& kill) {
     set(message.has_nr_file_pages, message.nr_file_pages, raw.nr_file_pages);
     set(message.has_nr_file_mapped, message.nr_file_mapped, raw.nr_file_mapped);
     set(message.has_nr_free_pages_lo, message.nr_free_pages_lo, raw.nr_free_pages_lo);
-    memcpy(kill.comm, raw.comm, sizeof raw.comm);
-    message.comm = kill.comm;
+    message.comm = comm;
 }
 
 }  // namespace
@@ -58,13 +51,15 @@ int32_t translate_event(std::string_view package, std::string_view name,
                              static_cast<int>(package.size()), package.data(),
                              static_cast<int>(name.size()), name.data());
     }
-    named_process_kill kill = {};
-    if (record.size() < sizeof kill.raw) {
+    raw_process_kill raw;
+    if (record.size() < sizeof raw) {
         return log_and_raise(tag, "%s got a record of %zu bytes", function_name, record.size());
     }
-    memcpy(&kill.raw, record.data(), sizeof kill.raw);
+    memcpy(&raw, record.data(), sizeof raw);
+    char comm[sizeof raw.comm + 1] = {};
+    memcpy(comm, raw.comm, sizeof raw.comm);
     Kernel__ProcessKill message = KERNEL__PROCESS_KILL__INIT;
-    fill(message, kill);
+    fill(message, raw, comm);
     packed.reset(static_cast<uint8_t*>(malloc(kernel__process_kill__get_packed_size(&message))));
     if (!packed) return log_and_raise(tag, "%s failed to allocate buffer", function_name);
     return static_cast<int32_t>(kernel__process_kill__pack(&message, packed.get()));

@@ -6,15 +6,15 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 
+#include "daemon/error/give_up.h"
 #include "daemon/event_loop.h"
 #include "daemon/net/connections.h"
 #include "daemon/net/datagrams.h"
 #include "daemon/net/packet_buffer.h"
+#include "daemon/net/turn_away.h"
 #include "daemon/net/wait.h"
-#include "platform/android_log.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -37,35 +37,34 @@ constinit client_socket client_sockets[] = {
 };
 
 // Logs what failed with the system error, and ends the process.
-[[noreturn]] void give_up(const char* what) {
-    __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to %s: %s", what, strerror(errno));
-    exit(1);
+[[noreturn]] void give_up_to(const char* what) {
+    give_up(tag, "Failed to %s: %s", what, strerror(errno));
 }
 
 int create_socket(int type, const char* name) {
     // No callback may wait for a client that has gone again.
     unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    if (!fd.ok()) give_up("create AF_UNIX socket");
+    if (!fd.ok()) give_up_to("create AF_UNIX socket");
     refuse_descriptors(fd.get());
     if (type == SOCK_DGRAM) {  // before the first packet can arrive
         set_socket_timeouts(fd.get());
         const int on = 1;
         // Without them the room for credentials would take descriptors instead.
         if (setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) {
-            give_up("receive credentials");
+            give_up_to("receive credentials");
         }
     }
 
     sockaddr_un address = {};
     address.sun_family = AF_UNIX;
     strncpy(address.sun_path, name, sizeof address.sun_path - 1);
-    if (unlink(name) != 0 && errno != ENOENT) give_up("unlink socket");
+    if (unlink(name) != 0 && errno != ENOENT) give_up_to("unlink socket");
     if (bind(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        give_up("bind to socket");
+        give_up_to("bind to socket");
     }
     (void)chmod(name, socket_mode);
     if (type != SOCK_DGRAM && listen(fd.get(), listen_backlog) != 0) {
-        give_up("listen to uds-socket");
+        give_up_to("listen to uds-socket");
     }
     return fd.release();
 }
@@ -73,11 +72,11 @@ int create_socket(int type, const char* name) {
 }  // namespace
 
 void create_client_sockets() {
-    if (packet_buffers_init() != 0) give_up("map packet buffers");
-    connections_init();
+    if (packet_buffers_init() != 0) give_up_to("map packet buffers");
+    turn_away_init();
     for (client_socket& each : client_sockets) {
         each.handler.fd = create_socket(each.type, each.name);
-        if (event_loop_add(each.handler) != 0) give_up("add socket to epoll");
+        if (event_loop_add(each.handler) != 0) give_up_to("add socket to epoll");
     }
 }
 
@@ -89,6 +88,7 @@ void remove_client_sockets() {
         each.handler.fd = -1;
     }
     connections_release();
+    turn_away_release();
     packet_buffers_release();
 }
 

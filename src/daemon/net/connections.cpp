@@ -1,6 +1,5 @@
 #include "daemon/net/connections.h"
 
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -18,6 +17,7 @@
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/send.h"
 #include "daemon/net/stream_framing.h"
+#include "daemon/net/turn_away.h"
 #include "daemon/net/wait.h"
 #include "daemon/request/handle_request.h"
 #include "util/clock.h"
@@ -29,7 +29,6 @@ namespace {
 constexpr char tag[] = "kivd";
 constexpr int64_t stream_packet_ms = 3000;  // for a whole packet, however it trickles in
 constexpr int64_t receive_timeout_ms = 1000;
-constexpr useconds_t accept_pause_us = 10000;
 constexpr rlim_t spare_descriptors = 16;  // for reports, saves and all else that opens files
 
 struct connection : event_handler {
@@ -38,7 +37,6 @@ struct connection : event_handler {
 };
 
 constinit connection* connections = nullptr;  // owns them
-constinit int placeholder = -1;               // a descriptor to give up when there are none left
 
 bool add_connection(unique_fd fd, void (*callback)(event_handler&)) {
     auto* const added = static_cast<connection*>(malloc(sizeof(connection)));
@@ -72,17 +70,6 @@ bool is_spare(int fd) {
     if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return false;
     const rlim_t kept = std::min(spare_descriptors, limit.rlim_cur / 4);
     return static_cast<rlim_t>(fd) >= limit.rlim_cur - kept;
-}
-
-void hold_placeholder() { placeholder = open("/dev/null", O_RDONLY | O_CLOEXEC); }
-
-// Takes a client that could not be accepted off the queue and hangs up on it: left there, it would
-// wake the loop again at once, for ever. Where even that fails, the loop at least doesn't spin.
-void turn_away_client(int listening_fd) {
-    if (placeholder >= 0) (void)close(placeholder);
-    const unique_fd refused(accept4(listening_fd, nullptr, nullptr, SOCK_CLOEXEC));
-    if (!refused.ok()) usleep(accept_pause_us);
-    hold_placeholder();
 }
 
 void accept_client(int listening_fd, void (*callback)(event_handler&)) {
@@ -220,10 +207,7 @@ void set_socket_timeouts(int fd) {
                         "set_socket_timeouts", error, strerror(error));
 }
 
-void connections_init() { hold_placeholder(); }
-
 void connections_release() {
-    if (placeholder >= 0) (void)close(std::exchange(placeholder, -1));
     while (connections != nullptr) close_connection(*connections);
 }
 

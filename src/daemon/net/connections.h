@@ -12,9 +12,6 @@ void accept_stream_client(event_handler& handler);
 // One second for sends and receives. A failure is logged and raised; the socket then waits longer.
 void set_socket_timeouts(int fd);
 
-// Sets a descriptor aside, so that there is one to turn clients away with.
-void connections_init();
-
 // Closes and frees all connections.
 void connections_release();
 

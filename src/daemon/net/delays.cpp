@@ -1,8 +1,5 @@
 #include "daemon/net/delays.h"
 
-#include <cerrno>
-#include <ctime>
-
 #include "daemon/stop.h"
 
 namespace kivd {
@@ -12,10 +9,7 @@ constinit int32_t receive_delay_ms = 0;
 constinit int32_t send_delay_ms = 0;
 
 void wait(int32_t delay_ms) {
-    if (delay_ms <= 0) return;
-    timespec left = {delay_ms / 1000, delay_ms % 1000 * 1000000L};
-    while (nanosleep(&left, &left) != 0 && errno == EINTR && !is_stop_requested()) {
-    }
+    if (delay_ms > 0) wait_for_stop(delay_ms);
 }
 
 }  // namespace
