@@ -9,6 +9,7 @@
 #include <atomic>
 #include <cerrno>
 #include <charconv>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <initializer_list>
@@ -34,8 +35,23 @@ constexpr string_view yes = "1";      // the answer to "IA", and to questions
 constexpr string_view no = "0";
 constexpr char producer_socket[] = "kiv_cl";
 constexpr char control_socket[] = "kiv_co";
+constexpr char diagnostics_files[] = "750";  // the set of files that they are for the daemon
 
 static_assert(KIV_DEVICE_ID_MAX == libkiv::answer_size_max);
+
+// A number in decimal, with zeros before it up to `digits_min` digits.
+class decimal {
+ public:
+    explicit decimal(int32_t value, int digits_min = 1) {
+        const int size = snprintf(text_, sizeof text_, "%0*d", digits_min, value);
+        size_ = static_cast<size_t>(size);
+    }
+    [[nodiscard]] string_view view() const { return {text_, size_}; }
+
+ private:
+    char text_[16];
+    size_t size_;
+};
 
 // Fills a new handle and connects it: 0 or a negative errno value.
 int open_handle(kiv_handle& handle, const char* directory) {
@@ -96,10 +112,8 @@ int produce_counter(kiv_handle& handle, string_view command, const char* package
     if (id_result < 0) return id_result;
     using range = std::numeric_limits<int32_t>;
     if (value < range::min() || value > range::max()) return -ERANGE;
-    char digits[16];
-    const auto written = std::to_chars(digits, digits + sizeof digits, value);
-    const string_view text(digits, static_cast<size_t>(written.ptr - digits));
-    return produce(handle, {command, package, " ", name, " ", text});
+    const decimal text(static_cast<int32_t>(value));
+    return produce(handle, {command, package, " ", name, " ", text.view()});
 }
 
 // Requests without an answer: "IA" follows, whose answer says that what came before is handled.
@@ -128,6 +142,26 @@ int ask(const kiv_handle& handle, access needed, std::initializer_list<const req
     if (result < 0) return result;
     if (got.last.view() == yes) return 1;
     return got.last.view() == no ? 0 : -EPROTO;
+}
+
+// converse() where -ENOENT is to say that the daemon has no such thing: that there is no daemon is
+// -ECONNREFUSED alone.
+int look_up(const kiv_handle& handle, access needed, const request& question, string_view refusal,
+            answers& got) {
+    const int result = converse(handle, needed, {&question}, refusal, got);
+    return result == -ENOENT ? -ECONNREFUSED : result;
+}
+
+// Requests that are answered with a descriptor: that, or a negative errno value; -ENOENT when the
+// daemon has none to give.
+int fetch(const kiv_handle& handle, access needed, const request& question) {
+    constexpr string_view no_descriptor = "FAIL";
+    answers got;
+    const int result = look_up(handle, needed, question, no_descriptor, got);
+    if (result < 0) return result;
+    if (got.last.view() == no_descriptor) return -ENOENT;
+    if (got.last.view() != "OK" || got.last.attached.fd < 0) return -EPROTO;
+    return std::exchange(got.last.attached.fd, -1);
 }
 
 }  // namespace
@@ -211,10 +245,7 @@ int kiv_set_data_collection(kiv_handle* handle, int on) {
 
 int kiv_remove_reports(kiv_handle* handle, int32_t number) {
     if (number < 0) return -EINVAL;
-    char digits[16];
-    const auto written = std::to_chars(digits, digits + sizeof digits, number);
-    const string_view text(digits, static_cast<size_t>(written.ptr - digits));
-    return control(*handle, access::privileged, {"RM ", text});
+    return control(*handle, access::privileged, {"RM ", decimal(number).view()});
 }
 
 int kiv_set_group_id(kiv_handle* handle, const char* id) {
@@ -242,13 +273,7 @@ int kiv_is_probe_active(kiv_handle* handle, const char* package, const char* nam
 int kiv_get_config(kiv_handle* handle, const char* package, const char* name) {
     const int id_result = check_probe_id(package, name);
     if (id_result < 0) return id_result;
-    const request question{"GC ", package, " ", name};
-    answers got;
-    const int result = converse(*handle, access::open, {&question}, "", got);
-    if (result < 0) return result == -ENOENT ? -ECONNREFUSED : result;
-    if (got.last.view() == "FAIL") return -ENOENT;
-    if (got.last.view() != "OK" || got.last.attached.fd < 0) return -EPROTO;
-    return std::exchange(got.last.attached.fd, -1);
+    return fetch(*handle, access::open, {"GC ", package, " ", name});
 }
 
 int kiv_install_config(kiv_handle* handle, const void* bytes, size_t size) {
@@ -262,4 +287,28 @@ int kiv_install_config(kiv_handle* handle, const void* bytes, size_t size) {
 int kiv_announce_config(kiv_handle* handle) {
     const request announcement{"NC"};
     return ask(*handle, access::privileged, {&announcement});
+}
+
+int kiv_next_file(kiv_handle* handle, int32_t number) {
+    constexpr string_view none = "-1";
+    constexpr int digits_max = 10;  // written out, since the daemon's answer is no longer than that
+    if (number < 0) return -EINVAL;
+    const decimal text(number, digits_max);
+    const request question{"FN ", diagnostics_files, " ", text.view()};
+    answers got;
+    const int result = look_up(*handle, access::privileged, question, none, got);
+    if (result < 0) return result;
+    const string_view answer = got.last.view();
+    if (answer == none) return -ENOENT;
+    const char* const end = answer.data() + answer.size();
+    int32_t next = 0;
+    const auto parsed = std::from_chars(answer.data(), end, next);
+    const bool is_next = parsed.ec == std::errc() && parsed.ptr == end && next > number;
+    return is_next ? next : -EPROTO;
+}
+
+int kiv_get_file(kiv_handle* handle, int32_t number) {
+    if (number < 0) return -EINVAL;
+    const decimal text(number);
+    return fetch(*handle, access::privileged, {"FG ", diagnostics_files, " ", text.view()});
 }

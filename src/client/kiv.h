@@ -81,8 +81,8 @@ int kiv_set_static_data(kiv_handle* handle, const char* package, const char* nam
  * -ECONNREFUSED, -ENOENT   no daemon
  * -ECONNRESET              the daemon ended, or hung up, before it answered
  * -EPROTO                  an answer that makes no sense
- * -EINVAL                  a negative report number; an empty or null package, name or group id, or
- *                          one with a blank; an empty or null configuration
+ * -EINVAL                  a negative number; an empty or null package, name or group id, or one
+ *                          with a blank; an empty or null configuration
  * -EMSGSIZE                a package and name of more than KIV_PROBE_ID_MAX bytes, a configuration
  *                          of more than KIV_CONFIG_MAX; group ids beyond what the daemon takes
  * -EPERM                   the daemon refused the caller: it has neither the daemon's user id nor
@@ -139,6 +139,23 @@ int kiv_install_config(kiv_handle* handle, const void* bytes, size_t size);
  * such file there the result is 0, and the log says nothing.
  */
 int kiv_announce_config(kiv_handle* handle);
+
+/*
+ * Diagnostics files are numbered from 1; the oldest have the lowest numbers and are removed as new
+ * ones come. kiv_next_file gives the number of the next file behind `number`; start with 0 and go
+ * on with each answer. kiv_get_file gives a descriptor of the file with that number, to read from
+ * its first byte. It is close-on-exec, and the caller's to close.
+ *
+ * A file may be gone before it is asked for, so a number is no promise that there is one. The file
+ * with the highest number may still be growing, and is replaced by a compressed one when it is
+ * full: what is read from the descriptor is gzip, or is not.
+ *
+ * -ENOENT   no file behind that number, or with it; that no daemon is there is told by
+ *           -ECONNREFUSED alone
+ * -EMFILE   the process may have no more descriptors
+ */
+int kiv_next_file(kiv_handle* handle, int32_t number);
+int kiv_get_file(kiv_handle* handle, int32_t number);
 
 #ifdef __cplusplus
 }

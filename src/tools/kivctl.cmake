@@ -1,4 +1,9 @@
-add_executable(kivctl kivctl.cpp kivctl_io.cpp ../util/unique_fd.cpp)
-target_include_directories(kivctl PRIVATE ${PROJECT_SOURCE_DIR}/src)
+# What kivctl shows of requests is a library, so that tests can call it.
+add_library(kivctl_core STATIC watch_frames.cpp watch_line.cpp)
+target_link_libraries(kivctl_core PUBLIC kiv_tool_text PRIVATE kiv_warnings)
+
+add_executable(kivctl
+    kivctl.cpp kivctl_commands.cpp kivctl_files.cpp kivctl_io.cpp watch_command.cpp
+    ../util/file_io.cpp ../util/unique_fd.cpp)
 target_compile_definitions(kivctl PRIVATE KIV_DEFAULT_DIRECTORY="${KIV_DEFAULT_DIRECTORY}")
-target_link_libraries(kivctl PRIVATE kiv CLI11::CLI11 kiv_warnings)
+target_link_libraries(kivctl PRIVATE kivctl_core kiv CLI11::CLI11 kiv_warnings)

@@ -13,7 +13,18 @@ namespace {
 
 [[noreturn]] void fail(const std::string& what) { throw failure(what + ": " + strerror(errno)); }
 
-[[noreturn]] void fail_output() { fail("cannot write to standard output"); }
+// False, with errno set, when `file` cannot take it.
+bool copy_content(int fd, FILE* file) {
+    char bytes[16'384];
+    ssize_t size;
+    while ((size = read(fd, bytes, sizeof bytes)) != 0) {
+        if (size < 0 && errno == EINTR) continue;
+        if (size < 0) fail("cannot read what the daemon handed over");
+        const auto count = static_cast<size_t>(size);
+        if (fwrite(bytes, 1, count, file) != count) return false;
+    }
+    return fflush(file) == 0;
+}
 
 }  // namespace
 
@@ -40,15 +51,15 @@ void print_line(const char* text) {
 }
 
 void print_content(int fd) {
-    char bytes[16'384];
-    ssize_t size;
-    while ((size = read(fd, bytes, sizeof bytes)) != 0) {
-        if (size < 0 && errno == EINTR) continue;
-        if (size < 0) fail("cannot read what the daemon handed over");
-        const auto count = static_cast<size_t>(size);
-        if (fwrite(bytes, 1, count, stdout) != count) fail_output();
-    }
-    if (fflush(stdout) != 0) fail_output();
+    if (!copy_content(fd, stdout)) fail_output();
 }
+
+void save_content(int fd, const std::string& path) {
+    unique_file file(fopen(path.c_str(), "we"));
+    if (!file) fail("cannot create " + path);
+    if (!copy_content(fd, file.get()) || fclose(file.release()) != 0) fail("cannot write " + path);
+}
+
+void fail_output() { fail("cannot write to standard output"); }
 
 }  // namespace kivd

@@ -1,4 +1,5 @@
-// The files that kivctl reads, and its standard output. What fails is thrown as one sentence.
+// The files that kivctl reads and writes, and its standard output. What fails is thrown as one
+// sentence.
 #pragma once
 
 #include <cstddef>
@@ -7,9 +8,19 @@
 
 namespace kivd {
 
+enum exit_status : int {
+    status_done = 0,
+    status_refused = 1,  // or the data is bad
+    status_usage = 2,
+    status_unreachable = 3,  // or not in time
+};
+
 // A command that couldn't be carried out, in one sentence.
 struct failure : std::runtime_error {
-    using std::runtime_error::runtime_error;
+    explicit failure(const std::string& text, exit_status new_status = status_refused)
+        : std::runtime_error(text), status(new_status) {}
+
+    exit_status status;
 };
 
 // What to call the file of that path in messages: "-" is standard input.
@@ -21,5 +32,11 @@ std::string read_source(const std::string& path, size_t size_max, const char* ki
 // To standard output: a line, or all that can be read from `fd`.
 void print_line(const char* text);
 void print_content(int fd);
+
+// Writes all that can be read from `fd` to the file of that path, which is created or replaced.
+void save_content(int fd, const std::string& path);
+
+// Standard output couldn't be written to, as errno says.
+[[noreturn]] void fail_output();
 
 }  // namespace kivd

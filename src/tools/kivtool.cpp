@@ -25,7 +25,8 @@ struct report_given {
 
 CLI::App* add_report(CLI::App& app, report_given& given) {
     CLI::App* report = app.add_subcommand(
-        "report", "Prints reports, and unfinished ones (private/events), as protobuf text");
+        "report",
+        "Prints reports, unfinished ones (private/events) and diagnostics files, as protobuf text");
     report->add_flag("--json", given.json, "Print one JSON document for each file");
     report->add_flag("--summary", given.summary, "Print a summary for people")->excludes("--json");
     report->add_option("--key", given.options.key_path,

@@ -11,6 +11,7 @@
 #include <stdexcept>
 #include <vector>
 
+#include "tools/known_payload.h"
 #include "tools/text_escape.h"
 
 namespace kivd {
@@ -20,6 +21,19 @@ namespace protobuf = google::protobuf;
 using protobuf::FieldDescriptor;
 
 constexpr char type_prefix[] = "type.googleapis.com";
+
+// An event, and what its payload is when that is known.
+class event_printer : public protobuf::TextFormat::MessagePrinter {
+ public:
+    void Print(const protobuf::Message& message, bool /*single_line_mode*/,
+               protobuf::TextFormat::BaseTextGenerator* generator) const override {
+        std::string text;
+        (void)protobuf::TextFormat::PrintToString(message, &text);
+        const std::string known = known_payload_text(static_cast<const kiv::Event&>(message));
+        if (!known.empty()) text += "# " + known + '\n';
+        generator->PrintString(text);
+    }
+};
 
 void escape_strings(protobuf::Message& message);
 
@@ -53,7 +67,12 @@ void escape_strings(protobuf::Message& message) {
 void print_text(std::ostream& out, const std::string& path, const kiv::Report& report) {
     out << "# " << printable(path) << '\n';
     protobuf::io::OstreamOutputStream stream(&out);
-    if (!protobuf::TextFormat::Print(report, &stream)) out.setstate(std::ios::failbit);
+    protobuf::TextFormat::Printer printer;
+    auto for_events = std::make_unique<event_printer>();
+    if (printer.RegisterMessagePrinter(kiv::Event::descriptor(), for_events.get())) {
+        (void)for_events.release();  // the printer's now
+    }
+    if (!printer.Print(report, &stream)) out.setstate(std::ios::failbit);
 }
 
 void print_json(std::ostream& out, const kiv::Report& report) {

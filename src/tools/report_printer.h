@@ -9,7 +9,8 @@
 namespace kivd {
 
 // Protobuf's text format behind a comment line that names the file, so that the whole can be
-// encoded again.
+// encoded again. Behind the fields of an event whose payload is a known message, a comment line
+// shows that.
 void print_text(std::ostream& out, const std::string& path, const kiv::Report& report);
 
 // One JSON document with the field names of the schema, in protobuf's mapping: 64-bit numbers are

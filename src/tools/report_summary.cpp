@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "tools/known_payload.h"
 #include "tools/text_escape.h"
 
 namespace kivd {
@@ -16,6 +17,7 @@ namespace {
 
 constexpr size_t event_rows = 10;
 constexpr size_t counter_rows = 10;
+constexpr size_t message_rows = 10;
 constexpr size_t value_characters = 60;
 
 struct event_kind {
@@ -155,6 +157,19 @@ void print_events(std::ostream& out, const kiv::Report& report) {
     }
 }
 
+// The latest events whose payload is a known message, in the order of the file.
+void print_messages(std::ostream& out, const kiv::Report& report) {
+    std::vector<std::string> lines;
+    for (int i = report.events_size() - 1; i >= 0 && lines.size() < message_rows; --i) {
+        const kiv::Event& event = report.events(i);
+        const std::string text = known_payload_text(event);
+        if (!text.empty()) lines.push_back(time_text(event.timestamp()) + "  " + printable(text));
+    }
+    if (lines.empty()) return;
+    out << "\n  latest messages: time, message\n";
+    for (auto line = lines.rbegin(); line != lines.rend(); ++line) out << "    " << *line << '\n';
+}
+
 using counter_list = std::vector<const kiv::Counter*>;
 
 void print_counter_list(std::ostream& out, const char* what, const counter_list& counters,
@@ -197,9 +212,11 @@ void print_static_data(std::ostream& out, const kiv::Report& report) {
 
 void print_summary(std::ostream& out, const std::string& path, const report_file& file) {
     out << printable(path) << '\n';
+    if (!file.report.has_header()) print_fact(out, "note", "no header, as in diagnostics files");
     print_identity(out, file.report.header());
     print_contents(out, file);
     print_events(out, file.report);
+    print_messages(out, file.report);
     print_counters(out, file.report);
     print_static_data(out, file.report);
 }

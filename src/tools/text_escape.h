@@ -1,4 +1,5 @@
-// Text from reports, made fit to be shown: names and values are whatever bytes a producer sent.
+// Text from reports and requests, made fit to be shown: names and values are whatever bytes a
+// producer sent.
 #pragma once
 
 #include <cstddef>

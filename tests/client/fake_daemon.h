@@ -148,19 +148,22 @@ class control_server {
     std::jthread thread_;  // last: it uses the others
 };
 
-// What a daemon answers to a caller that it lets do everything.
+// What a daemon answers to a caller that it lets do everything. It has no diagnostics files, but
+// once had those up to number 5.
 inline control_server::answer_function allowing(std::string device_id,
-                                                std::string is_config_taken = "1") {
+                                                std::string is_config_taken = "1",
+                                                std::string last_file = "5") {
     return [=](const std::string& request) -> std::optional<control_answer> {
         if (request == "GD") return device_id;
         if (request == "NC") return is_config_taken;
         if (request.starts_with("PA ")) return request == "PA p wanted" ? "1" : "0";
-        if (request.starts_with("GC ")) return "FAIL";
+        if (request.starts_with("GC ") || request.starts_with("FG ")) return "FAIL";
+        if (request.starts_with("FN ")) return request < "FN 750 0000000005" ? last_file : "-1";
         return request == "IA" ? "1" : "";
     };
 }
 
 // What a daemon answers to a caller without permission.
-inline control_server::answer_function refusing() { return allowing("", "0"); }
+inline control_server::answer_function refusing() { return allowing("", "0", "-1"); }
 
 }  // namespace kivd

@@ -289,6 +289,12 @@ const control_call control_calls[] = {
      1},
     {[](kiv_handle* h) { return kiv_is_probe_active(h, "p", "n"); }, {"PA p n"}, false, 0},
     {[](kiv_handle* h) { return kiv_get_config(h, "p", "n"); }, {"GC p n"}, false, -ENOENT},
+    {[](kiv_handle* h) { return kiv_next_file(h, 4); }, {"GD", "FN 750 0000000004"}, true, 5},
+    {[](kiv_handle* h) { return kiv_next_file(h, INT32_MAX); },
+     {"GD", "FN 750 2147483647"},
+     true,
+     -ENOENT},
+    {[](kiv_handle* h) { return kiv_get_file(h, 7); }, {"GD", "FG 750 7"}, true, -ENOENT},
     {kiv_announce_config, {"GD", "NC"}, true, 1},
     {[](kiv_handle* h) { return kiv_install_config(h, " \0\n", 3); },
      {"GD", std::string("WC  \0\n", 6), "NC"},
@@ -298,7 +304,7 @@ const control_call control_calls[] = {
 
 TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_are_noticed) {
     // ids that look like answers, and none for a refused caller
-    for (const std::string device_id : {"1", "0", ""}) {
+    for (const std::string device_id : {"1", "0", "-1", "FAIL", ""}) {
         const bool is_allowed = !device_id.empty();
         control_server server(directory.path, is_allowed ? allowing(device_id) : refusing());
         for (const auto& c : control_calls) {
@@ -309,7 +315,9 @@ TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_a
     }
     // not sent, so that no daemon is needed
     const std::string longest(31'173, 'g');
-    EXPECT_EQ(kiv_remove_reports(handle.get(), -1), -EINVAL);
+    for (auto* call : {kiv_remove_reports, kiv_next_file, kiv_get_file}) {
+        EXPECT_EQ(call(handle.get(), -1), -EINVAL);
+    }
     for (const char* bad : {"", "a b", "a\n", static_cast<const char*>(nullptr)}) {
         EXPECT_EQ(kiv_set_group_id(handle.get(), bad), -EINVAL);
         EXPECT_EQ(kiv_delete_group_id(handle.get(), bad), -EINVAL);
@@ -335,6 +343,8 @@ TEST_F(libkiv, control_requests_are_handled_when_the_call_returns_and_refusals_a
     EXPECT_EQ(kiv_get_config(handle.get(), "app", "Settings"), -ENOENT);
     EXPECT_EQ(server.take_requests()[0],
               doc_example("requests.md", "hex", "get-configuration-request"));
+    EXPECT_EQ(kiv_next_file(handle.get(), 0), 5);
+    EXPECT_EQ(server.take_requests()[1], doc_example("requests.md", "hex", "next-file-request"));
     EXPECT_EQ(kiv_set_group_id(handle.get(), longest.c_str()), 0);
     EXPECT_EQ(kiv_set_group_id(handle.get(), (longest + "g").c_str()), -EMSGSIZE);
 }
@@ -368,6 +378,9 @@ TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {
         {"2", -EPROTO},
         {"10", -EPROTO},
         {"OK", -EPROTO},
+        {"-2", -EPROTO},
+        {"5x", -EPROTO},
+        {"2147483648", -EPROTO},
         {"0" + std::string(KIV_DEVICE_ID_MAX, ' '), -EPROTO},
         {std::nullopt, -ECONNRESET},  // hangs up on WC already
     };
@@ -380,9 +393,13 @@ TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {
         EXPECT_EQ(kiv_is_probe_active(handle.get(), "p", "n"), q.result);
         EXPECT_EQ(kiv_get_config(handle.get(), "p", "n"), q.result);
         EXPECT_EQ(kiv_install_config(handle.get(), "x", 1), q.result);
+        EXPECT_EQ(kiv_next_file(handle.get(), 10), q.result);  // going on with "10" has no end
+        EXPECT_EQ(kiv_get_file(handle.get(), 10), q.result);
     }
     std::filesystem::remove(directory.path + "/kiv_co");
     EXPECT_EQ(kiv_get_config(handle.get(), "p", "n"), -ECONNREFUSED);  // not: no such part
+    EXPECT_EQ(kiv_next_file(handle.get(), 0), -ECONNREFUSED);
+    EXPECT_EQ(kiv_get_file(handle.get(), 1), -ECONNREFUSED);
     EXPECT_EQ(kiv_is_alive(handle.get()), -ENOENT);
     { const bound_socket closed(SOCK_SEQPACKET, directory.path + "/kiv_co"); }
     EXPECT_EQ(kiv_flush(handle.get()), -ECONNREFUSED);
@@ -398,7 +415,7 @@ int count_open(const std::string& path) {
     return count;
 }
 
-TEST_F(libkiv, a_part_comes_as_one_descriptor_and_all_others_are_closed) {
+TEST_F(libkiv, a_part_or_file_comes_as_one_descriptor_and_all_others_are_closed) {
     const std::string path = directory.path + "/part";
     std::ofstream(path) << "content";
     const int part = open(path.c_str(), O_RDONLY | O_CLOEXEC);
@@ -416,17 +433,21 @@ TEST_F(libkiv, a_part_comes_as_one_descriptor_and_all_others_are_closed) {
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(&c - cases);
-        const control_server server(directory.path,
-                                    [&c](const std::string&) { return std::optional(c.answer); });
-        const int fd = kiv_get_config(handle.get(), "p", "n");
-        EXPECT_EQ(std::min(fd, 0), c.result);
-        if (fd >= 0) {
-            char content[16];
-            EXPECT_EQ(read(fd, content, sizeof content), 7);
-            EXPECT_EQ(fcntl(fd, F_GETFD), FD_CLOEXEC);
-            close(fd);
+        const control_server server(directory.path, [&c](const std::string& request) {
+            return std::optional(request == "GD" ? "id" : c.answer);
+        });
+        for (const bool is_file : {false, true}) {
+            const int fd =
+                is_file ? kiv_get_file(handle.get(), 1) : kiv_get_config(handle.get(), "p", "n");
+            EXPECT_EQ(std::min(fd, 0), c.result);
+            if (fd >= 0) {
+                char content[16];
+                EXPECT_EQ(pread(fd, content, sizeof content, 0), 7);
+                EXPECT_EQ(fcntl(fd, F_GETFD), FD_CLOEXEC);
+                close(fd);
+            }
+            EXPECT_EQ(count_open(path), 1);
         }
-        EXPECT_EQ(count_open(path), 1);
 
         EXPECT_EQ(kiv_is_probe_active(handle.get(), "p", "n"), -EPROTO);
         EXPECT_EQ(count_open(path), 1);

@@ -152,12 +152,68 @@ TEST(kivctl, hands_over_configurations_and_prints_their_parts) {
     close(part);
 }
 
+TEST(kivctl, lists_and_fetches_the_files_that_are_there) {
+    const socket_directory directory;
+    const bound_socket producer_socket(SOCK_DGRAM, directory.path + "/kiv_cl");
+    const std::string content("\x12\0file\n", 7), saved = directory.path + "/saved";
+    std::ofstream(directory.path + "/file") << content;
+    const int file = open((directory.path + "/file").c_str(), O_RDONLY | O_CLOEXEC);
+    // numbers 3 to `last`, of which 3 and 5 have a file
+    std::atomic<int> last = 5;
+    control_server server(directory.path, [&](const std::string& request) {
+        if (request == "FG 750 3" || request == "FG 750 5") {
+            return std::optional(control_answer("OK", {file}));
+        }
+        if (!request.starts_with("FN 750 ")) return allowing("id")(request);
+        const int number = std::max(2, std::stoi(request.substr(7)));
+        return std::optional(control_answer(number < last ? std::to_string(number + 1) : "-1"));
+    });
+    const struct {
+        std::string arguments;
+        int last, status;
+        std::string output;
+    } cases[] = {
+        {"files list", 2, 0, ""},
+        {"files list", 5, 0, "3  7 bytes\n5  7 bytes\n"},
+        {"files list", 1'004, 0, "3  7 bytes\n5  7 bytes\n"},
+        {"files list 2>&1 >/dev/null", 1'005, 1,
+         "kivctl: gave up at number 1005: none of the last 1000 files is there\n"},
+        {"files list >/dev/full", 5, 1,
+         "kivctl: cannot write to standard output: No space left on device\n"},
+        {"files get 3", 5, 0, content},
+        {"files get 5 -o " + saved, 5, 0, ""},
+        {"files get 5 -o /dev/full", 5, 1,
+         "kivctl: cannot write /dev/full: No space left on device\n"},
+        {"files get 5 -o " + saved + "/none", 5, 1,
+         "kivctl: cannot create " + saved + "/none: Not a directory\n"},
+        {"files get 4", 5, 1, "kivctl: there is no diagnostics file 4\n"},
+        {"files get 0", 5, 2,
+         "kivctl: NUMBER: \"0\" is not a file number, 1 or more (see kivctl --help)\n"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.arguments);
+        last = c.last;
+        lseek(file, 0, SEEK_SET);
+        const auto [status, output] = run_kivctl("--base " + directory.path + " " + c.arguments);
+        EXPECT_EQ(status, c.status);
+        EXPECT_EQ(output, c.output);
+    }
+    std::ifstream copy(saved);
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(copy), {}), content);
+    close(file);
+}
+
 TEST(kivctl, tells_a_refused_caller) {
     const socket_directory directory;
     const bound_socket producer_socket(SOCK_DGRAM, directory.path + "/kiv_cl");
     const control_server server(directory.path, refusing());
-    const auto commands = {"flush", "device-id", "remove-report all", "config announce",
-                           "config install /etc/passwd"};
+    const auto commands = {"flush",
+                           "device-id",
+                           "remove-report all",
+                           "config announce",
+                           "config install /etc/passwd",
+                           "files list",
+                           "files get 1"};
     for (const char* command : commands) {
         SCOPED_TRACE(command);
         const auto [status, output] = run_kivctl("--base " + directory.path + " " + command);

@@ -42,6 +42,60 @@ TEST_F(report_command, shows_every_file_it_can_and_tells_what_is_wrong_with_the_
     }
 }
 
+// Diagnostics files: events and nothing before them, the last one perhaps being written.
+TEST_F(report_command, shows_files_without_a_header_and_the_messages_in_them) {
+    const google::protobuf::LogSilencer silencer;
+    const auto event = [](const std::string& package, const std::string& name,
+                          const std::string& payload) {
+        return records_of("events { package: '" + package + "' name: '" + name +
+                          "' timestamp: 1262325600000 payload: '" + payload + "' }");
+    };
+    const std::string logged = R"(\010\003:\006am_anrB\004\033[m\n)";  // log 3, tag, msg
+    const std::string messages = event("kiv.system_logging", "LogMessage", logged) +
+                                 event("kernel", "ProcessKill", R"(\010\007)") +
+                                 event("kiv", "DaemonError", R"(\n\001x\020\001)");
+    const std::string others = event("kiv.system_logging", "LogMessage", R"(:\001t)") +  // no log
+                               event("kernel", "ProcessKill", "text") +
+                               event("app", "ProcessKill", R"(\010\010)") +
+                               event("kernel", "Processkill", R"(\010\011)");
+    const std::string shown[] = {
+        R"(kiv.system_logging.LogMessage { log: EVENTS tag: "am_anr" msg: "\033[m\n" })",
+        "kernel.ProcessKill { pid: 7 }",
+        R"(kiv.DaemonError { log: "x" flooding: true })",
+    };
+    for (const std::string& bytes : {messages + others, gzip(messages + others)}) {
+        const std::string whole = write("qz_1", bytes);
+        std::ostringstream text, json, summary, err;
+        EXPECT_EQ(run_report_command({whole}, {report_view::text}, text, err), 0);
+        EXPECT_EQ(run_report_command({whole}, {report_view::json}, json, err), 0);
+        EXPECT_EQ(run_report_command({whole}, {report_view::summary}, summary, err), 0);
+        EXPECT_EQ(err.str(), "");
+        EXPECT_EQ(records_of(text.str()), messages + others);  // with the comments
+        for (const std::string& line : shown) {
+            EXPECT_NE(text.str().find("\n  # " + line + "\n}"), std::string::npos) << text.str();
+            std::string escaped = line;
+            if (line == shown[0]) escaped = escaped.replace(escaped.find(R"(\033)"), 1, R"(\\)");
+            if (line == shown[0]) escaped = escaped.replace(escaped.find(R"(\n)"), 1, R"(\\)");
+            EXPECT_NE(summary.str().find("    2010-01-01 06:00:00  " + escaped + "\n"),
+                      std::string::npos)
+                << summary.str();
+            EXPECT_EQ(json.str().find(line), std::string::npos);
+        }
+        EXPECT_NE(json.str().find("\"CAc=\""), std::string::npos) << json.str();
+        for (const char* unknown : {"pid: 8", "pid: 9", "\"t\" }"}) {
+            EXPECT_EQ(text.str().find(unknown), std::string::npos) << text.str();
+        }
+        EXPECT_NE(summary.str().find("no header"), std::string::npos) << summary.str();
+    }
+    const std::string torn = write("qz_2", messages + others.substr(0, 9));
+    std::ostringstream out, err;
+    EXPECT_EQ(run_report_command({torn}, {report_view::text}, out, err), 1);
+    EXPECT_EQ(records_of(out.str()), messages);
+    EXPECT_NE(err.str().find("stopped at byte " + std::to_string(messages.size())),
+              std::string::npos)
+        << err.str();
+}
+
 TEST_F(report_command, tells_when_its_output_is_lost) {
     const std::string good = write("kiv_1", records_of(header_text));
     for (const report_view view : views) {

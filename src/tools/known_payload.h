@@ -1,0 +1,15 @@
+// Payloads of events whose messages are known here.
+#pragma once
+
+#include <string>
+
+#include "report.pb.h"
+
+namespace kivd {
+
+// The payload as protobuf text in one line, "kernel.ProcessKill { pid: 7 }", with nothing in it
+// that a terminal would act on. Empty when the event is not of a known kind or its payload cannot
+// be decoded as that.
+[[nodiscard]] std::string known_payload_text(const kiv::Event& event);
+
+}  // namespace kivd
