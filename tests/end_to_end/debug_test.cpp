@@ -1,11 +1,5 @@
 // The debug interface on its one TCP port.
-#include <fcntl.h>
-#include <netinet/in.h>
-#include <sys/file.h>
-#include <sys/socket.h>
-#include <unistd.h>
-
-#include "daemon_test.h"
+#include "debug_port.h"
 
 namespace kivd {
 namespace {
@@ -13,33 +7,7 @@ namespace {
 using namespace std::string_literals;
 using enum socket_kind;
 
-const sockaddr_in port = {AF_INET, htons(2305), {htonl(INADDR_LOOPBACK)}, {}};
-
-class debug_interface : public daemon_test {
- protected:
-    // One test at a time has the port, whichever build it is of; and a client that closed its end
-    // later than a daemon keeps it for a minute.
-    void SetUp() override {
-        EXPECT_EQ(flock(port_lock_.get(), LOCK_EX), 0);
-        const auto is_free = [] {
-            const unique_fd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-            return bind(fd.get(), reinterpret_cast<const sockaddr*>(&port), sizeof port) == 0;
-        };
-        if (!wait_until(is_free, 70000)) GTEST_SKIP() << "port 2305 is in use";
-    }
-    // Its end leaves the port free at once.
-    static unique_fd connect_debugger() {
-        unique_fd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        const linger reset = {1, 0};
-        EXPECT_EQ(setsockopt(fd.get(), SOL_SOCKET, SO_LINGER, &reset, sizeof reset), 0);
-        EXPECT_EQ(connect(fd.get(), reinterpret_cast<const sockaddr*>(&port), sizeof port), 0);
-        return fd;
-    }
-
- private:
-    const unique_fd port_lock_{
-        open("/tmp/kivd-port-2305.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0666)};
-};
+class debug_interface : public debug_port_test {};
 
 std::string frame(const std::string& packet) {
     const auto size = static_cast<char>(packet.size());

@@ -1,48 +1,13 @@
 // kivctl with the real daemon, where a stand-in would not do.
-#include <netinet/in.h>
-#include <sys/socket.h>
-
-#include "daemon_test.h"
+#include "debug_port.h"
 #include "kiv.h"
 
 namespace kivd {
 namespace {
 
-sockaddr_in debug_address() {
-    sockaddr_in address = {};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(2305);
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    return address;
-}
-
-bool is_served() {
-    const unique_fd client(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    const sockaddr_in address = debug_address();
-    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-    return connect(client.get(), generic, sizeof address) == 0;
-}
-
-// Not ok as long as there is a listener, or a connection that had one is not quite over.
-unique_fd listen_there() {
-    unique_fd listener(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    const sockaddr_in address = debug_address();
-    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-    if (bind(listener.get(), generic, sizeof address) != 0) return unique_fd();
-    EXPECT_EQ(listen(listener.get(), 5), 0);
-    return listener;
-}
-
-// kivctl watch. There is one port for all: the name of the suite has ctest run it while no other
-// test uses that.
-class debug_watch : public daemon_test {
+// kivctl watch.
+class debug_watch : public debug_port_test {
  protected:
-    void SetUp() override {
-        if (is_served() || !wait_until([] { return listen_there().ok(); }, 70'000)) {
-            GTEST_SKIP() << "port 2305 is in use";
-        }
-    }
-
     [[nodiscard]] daemon_process watch(const std::vector<std::string>& options = {}) const {
         std::vector<std::string> arguments = {"--base", directory, "watch"};
         arguments.insert(arguments.end(), options.begin(), options.end());
