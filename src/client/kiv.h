@@ -97,7 +97,11 @@ int kiv_get_device_id(kiv_handle* handle, char* device_id);
 int kiv_flush(kiv_handle* handle);
 /* Saves counters and static data now. */
 int kiv_save(kiv_handle* handle);
-/* Switches data collection on (not 0) or off (0). */
+/*
+ * Switches data collection and diagnostics on (not 0) or off (0); off deletes the diagnostics
+ * files. The daemon remembers it of data collection; diagnostics are as the configuration says from
+ * its next start on.
+ */
 int kiv_set_data_collection(kiv_handle* handle, int on);
 /* Removes the report with that number (1 or more), or with 0 all of them. */
 int kiv_remove_reports(kiv_handle* handle, int32_t number);

@@ -182,7 +182,8 @@ constexpr command commands[] = {
          {"PACKAGE", &given::package, "The part's package", true},
          {"NAME", &given::name, "The part's name", true}},
      print_config_part},
-    {nullptr, "collection", "Switch data collection on or off", {
+    {nullptr, "collection",
+     "Switch data collection and diagnostics on or off; off deletes the diagnostics files", {
          {"STATE", &given::state, "on or off", true, check_state}},
      [](kiv_handle* daemon, const given& g) {
          return kiv_set_data_collection(daemon, g.state == "on" ? 1 : 0);

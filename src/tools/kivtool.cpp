@@ -31,7 +31,7 @@ CLI::App* add_report(CLI::App& app, report_given& given) {
     report->add_flag("--summary", given.summary, "Print a summary for people")->excludes("--json");
     report->add_option("--key", given.options.key_path,
                        "Private key (PEM) that opens sealed reports");
-    report->add_option("FILE", given.paths, "Files to read")->required();
+    report->add_option("FILE", given.paths, "Files to read, - for standard input")->required();
     return report;
 }
 

@@ -1,5 +1,8 @@
 #include "tools/unpacked_bytes.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cerrno>
 #include <cstring>
 #include <new>
@@ -10,10 +13,18 @@ namespace {
 constexpr int gzip_only = 16 + MAX_WBITS;
 constexpr Bytef gzip_magic[] = {0x1f, 0x8b};
 constexpr size_t piece_size = 65536;
+
+// Null, with errno set, when it cannot be opened.
+FILE* open_source(const std::string& path) {
+    if (path != "-") return fopen(path.c_str(), "re");
+    const int fd = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 0);
+    return fd < 0 ? nullptr : fdopen(fd, "re");
+}
+
 }  // namespace
 
 unpacked_bytes::unpacked_bytes(const std::string& path)
-    : place_("the file"), file_(fopen(path.c_str(), "re")) {
+    : place_("the file"), file_(open_source(path)) {
     if (!file_) {
         fail(std::string("cannot be opened: ") + strerror(errno));
         return;

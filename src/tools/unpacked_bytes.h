@@ -17,7 +17,7 @@ namespace kivd {
 // of its members end to end; anything else comes as it is.
 class unpacked_bytes {
  public:
-    // A file.
+    // A file; "-" is standard input.
     explicit unpacked_bytes(const std::string& path);
     // Bytes in memory, less than 4 GiB, that outlive this object. `place` is what problems call
     // them, such as "the sealed data".

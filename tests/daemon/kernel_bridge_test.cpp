@@ -60,10 +60,10 @@ std::string record(int32_t sign, const std::string& comm) {
 }
 
 TEST_F(kernel_bridge, translates_kills_and_passes_counters_as_they_are) {
-    receive("EV kernel ProcessKill " + record(1, "app"));
     const std::string head = "EV kernel ProcessKill ";
+    receive(head + doc_example("requests.md", "hex", "process-kill-record"));
     const std::string packet = next_packet();
-    ASSERT_TRUE(packet.starts_with(head));
+    EXPECT_EQ(packet, head + doc_example("requests.md", "hex", "process-kill-payload"));
     kernel::ProcessKill kill;
     ASSERT_TRUE(kill.ParseFromString(packet.substr(head.size())));
     EXPECT_EQ(kill.ShortDebugString(),

@@ -8,6 +8,7 @@
 #include "support/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "system_logging.pb.h"
+#include "util/clock.h"
 
 namespace kivd {
 namespace {
@@ -159,9 +160,11 @@ TEST_F(diag_store, numbers_start_again_when_they_have_run_out) {
 }
 
 TEST_F(diag_store, a_record_torn_by_a_crash_is_cut_off_when_it_is_switched_on) {
+    enable_test_mode();
     qz_set_active(1);
     add(log_package, "LogMessage", log_message("am_anr"));
     const std::string whole = file(1);
+    EXPECT_EQ(whole, doc_example("files.md", "hex", "diagnostics-file"));
     write_file("private/qz/qz_1", whole + whole.substr(0, 20));
     qz_set_active(1);
     EXPECT_EQ(file(1), whole);

@@ -395,6 +395,7 @@ TEST_F(configurations, are_made_and_shown_from_the_command_line) {
         {"config show", 2, "required"},
         {"config", 2, "required"},
         {"report --key key.pem c.bin", 1, "c.bin: "},
+        {"report - <c.bin", 1, "-: stopped at byte"},
     };
     for (const auto& line : cases) {
         SCOPED_TRACE(line.arguments);
