@@ -63,13 +63,12 @@ fault_list find_certificate_path(const facts& f) {
         const std::string used = arguments.key_directory.value_or(paths::default_key_dir);
         lines found;
         if (used != no_encryption && !used.ends_with('/')) {
-            found.push_back("the directory of -c has no final \"/\": the daemon looks for " +
-                            printable(used + paths::report_key_name) + " and " +
-                            printable(used + paths::config_key_name));
+            found.push_back("the directory of -c has no final \"/\": the daemon looks for " + used +
+                            paths::report_key_name + " and " + used + paths::config_key_name);
         }
         if (!f.given_key_directory.empty() && used != f.given_key_directory) {
-            found.push_back("the daemon looks for its keys by -c " + printable(used) + ", not in " +
-                            printable(f.given_key_directory));
+            found.push_back("the daemon looks for its keys by -c " + used + ", not in " +
+                            f.given_key_directory);
         }
         return found;
     });
@@ -78,21 +77,21 @@ fault_list find_certificate_path(const facts& f) {
 fault_list find_key_off(key_verdict verdict, const std::string& path) {
     if (verdict == key_verdict::unknown) return std::nullopt;
     if (verdict == key_verdict::switched_off) return lines{"-c NO_ENCRYPTION is given"};
-    if (verdict == key_verdict::missing) return lines{printable(path) + " is missing"};
+    if (verdict == key_verdict::missing) return lines{path + " is missing"};
     return one_if(verdict == key_verdict::unreadable,
-                  printable(path) + " cannot be read by the daemon's user");
+                  path + " cannot be read by the daemon's user");
 }
 
 fault_list find_key_unusable(key_verdict verdict, const std::string& path, const char* kind) {
     if (verdict == key_verdict::unknown) return std::nullopt;
-    return one_if(verdict == key_verdict::unusable, printable(path) + " is no " + kind);
+    return one_if(verdict == key_verdict::unusable, path + " is no " + kind);
 }
 
 fault_list find_bad_files(const facts& f) {
     return if_known(f.state.output, [](const output_facts& output) {
         lines found;
         for (const std::string& name : output.bad_names) {
-            found.push_back(paths::output_dir + printable(name) + " is no report");
+            found.push_back(paths::output_dir + name + " is no report");
         }
         return found;
     });
@@ -269,7 +268,8 @@ facts gather(const check_options& options) {
 void print_text(const findings& result) {
     if (result.found.empty()) print_line("all is well");
     for (const auto& [id, what, why, remedy] : result.found) {
-        print_line((id + ": " + what + "; " + why + "; to do: " + remedy).c_str());
+        const std::string text = printable(what, std::string::npos);
+        print_line((id + ": " + text + "; " + why + "; to do: " + remedy).c_str());
     }
 }
 

@@ -11,7 +11,6 @@
 #include "config.pb-c.h"
 #include "store/list_file.h"
 #include "tools/kivctl_io.h"
-#include "tools/text_escape.h"
 #include "util/directory.h"
 #include "util/paths.h"
 #include "util/protobuf_message.h"
@@ -138,7 +137,7 @@ left_files find_left_files(daemon_questions& questions, const process_facts& pro
         if (each.made_by == maker::worker && !is_worked_on) {
             list.reset();
         } else if (list && (each.made_by == maker::daemon || is_worked_on == false)) {
-            list->push_back(printable(each.path));
+            list->push_back(each.path);
         }
     }
     return found;

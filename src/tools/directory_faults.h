@@ -1,5 +1,5 @@
-// What is wrong with the files of a daemon's directory, which is the current one: a line for each
-// fault, or nothing when it cannot be looked at from here.
+// What is wrong with the files of a daemon's directory, which is the current one: a text for each
+// fault, with names as they are, or nothing when it cannot be looked at from here.
 #pragma once
 
 #include <optional>

@@ -206,7 +206,7 @@ constexpr command commands[] = {
          return kiv_replace_group_id(daemon, g.id.c_str(), g.old_id.c_str());
      }},
     {"files", "list", "List the number and the size of each file", {},
-     [](kiv_handle* daemon, const given&) { return list_files(daemon); }},
+     [](kiv_handle* daemon, const given& g) { return list_files(daemon, g.timeout_ms); }},
     {"files", "get", "Print a file; kivtool report shows what is in it", {
          {"NUMBER", &given::number, "The file's number", true, check_file_number},
          {"-o,--output", &given::output, "Write it to a file instead", false, nullptr, "FILE"}},
