@@ -74,16 +74,22 @@ fault_list find_certificate_path(const facts& f) {
     });
 }
 
-fault_list find_key_off(key_verdict verdict, const std::string& path) {
-    if (verdict == key_verdict::unknown) return std::nullopt;
+// Without a daemon nobody knows where it would look.
+bool is_known(const key_facts& keys, key_verdict verdict) {
+    return verdict != key_verdict::unknown && keys.source != key_source::assumed;
+}
+
+fault_list find_key_off(const key_facts& keys, key_verdict verdict, const std::string& path) {
+    if (!is_known(keys, verdict)) return std::nullopt;
     if (verdict == key_verdict::switched_off) return lines{"-c NO_ENCRYPTION is given"};
     if (verdict == key_verdict::missing) return lines{path + " is missing"};
     return one_if(verdict == key_verdict::unreadable,
                   path + " cannot be read by the daemon's user");
 }
 
-fault_list find_key_unusable(key_verdict verdict, const std::string& path, const char* kind) {
-    if (verdict == key_verdict::unknown) return std::nullopt;
+fault_list find_key_unusable(const key_facts& keys, key_verdict verdict, const std::string& path,
+                             const char* kind) {
+    if (!is_known(keys, verdict)) return std::nullopt;
     return one_if(verdict == key_verdict::unusable, path + " is no " + kind);
 }
 
@@ -165,23 +171,23 @@ constexpr check checks[] = {
      "keys that are elsewhere protect nothing",
      "give the directory of the keys to -c, with the final \"/\", and start the daemon again"},
     {"report_key_off",
-     [](const facts& f) { return find_key_off(f.state.keys.report_key, f.state.keys.report_key_path); },
+     [](const facts& f) { return find_key_off(f.state.keys, f.state.keys.report_key, f.state.keys.report_key_path); },
      "reports are not sealed: whoever gets one can read it",
      "let the daemon read the public report key there"},
     {"report_key_unusable",
      [](const facts& f) {
-         return find_key_unusable(f.state.keys.report_key, f.state.keys.report_key_path,
+         return find_key_unusable(f.state.keys, f.state.keys.report_key, f.state.keys.report_key_path,
                                   "public RSA key in PEM form of at most 4096 bits");
      },
      "no reports are made at all",
      "put the public report key there"},
     {"config_key_off",
-     [](const facts& f) { return find_key_off(f.state.keys.config_key, f.state.keys.config_key_path); },
+     [](const facts& f) { return find_key_off(f.state.keys, f.state.keys.config_key, f.state.keys.config_key_path); },
      "configurations are taken without a signature",
      "let the daemon read the public configuration key there"},
     {"config_key_unusable",
      [](const facts& f) {
-         return find_key_unusable(f.state.keys.config_key, f.state.keys.config_key_path,
+         return find_key_unusable(f.state.keys, f.state.keys.config_key, f.state.keys.config_key_path,
                                   "public key in PEM form that SHA-1 signatures can be checked with");
      },
      "no configuration is taken at all",
