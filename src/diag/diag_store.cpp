@@ -26,8 +26,8 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-qz";
-constexpr off_t max_file_size = 204800;      // bytes; the event that goes beyond is still kept
-constexpr int32_t full_files = 3;            // that stay beside the one being written
+constexpr off_t max_file_size = 204800;  // bytes; the event that goes beyond is still kept
+constexpr int32_t full_files = 3;        // that stay beside the one being written
 
 struct selection {
     std::string_view package_end;

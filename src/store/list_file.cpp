@@ -15,7 +15,8 @@ constexpr char tag[] = "kivd-list";
 constexpr size_t path_size = 4096;
 constexpr size_t buffer_size = 32768;
 
-// A window on the file that always shows the next `list_record_size_max` bytes, or all that are left.
+// A window on the file that always shows the next bytes, as many as a record may have, or all
+// that are left.
 class record_window {
  public:
     explicit record_window(FILE* file) : file_(file) {}

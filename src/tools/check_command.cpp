@@ -274,8 +274,10 @@ facts gather(const check_options& options) {
 void print_text(const findings& result) {
     if (result.found.empty()) print_line("all is well");
     for (const auto& [id, what, why, remedy] : result.found) {
-        const std::string text = printable(what, std::string::npos);
-        print_line((id + ": " + text + "; " + why + "; to do: " + remedy).c_str());
+        std::string line = id + ": ";
+        line += printable(what, std::string::npos);
+        for (const std::string& part : {"; " + why, "; to do: " + remedy}) line += part;
+        print_line(line.c_str());
     }
 }
 

@@ -73,7 +73,7 @@ key_verdict inspect_as(const user_ids& user, std::optional<pid_t> pid, const cha
     return static_cast<key_verdict>(WEXITSTATUS(status));
 }
 
-bool is_open_to_all(std::string path, mode_t mode) {
+bool is_open_to_all(const std::string& path, mode_t mode) {
     struct stat status = {};
     return stat(path.c_str(), &status) == 0 && (status.st_mode & mode) == mode;
 }
