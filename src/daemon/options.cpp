@@ -12,6 +12,7 @@
 #include "config/limits.h"
 #include "daemon/error/daemon_error.h"
 #include "daemon/net/delays.h"
+#include "daemon/option_names.h"
 #include "daemon/save_clock.h"
 #include "platform/android_log.h"
 #include "report/report_generation.h"
@@ -48,29 +49,6 @@ constexpr char usage[] =
     "  -c, --cert-path        use certificates from this path. NO_ENCRYPTION to turn off "
     "encryption.\n";
 
-// Options that have no short letter.
-constexpr int socket_delays_option = 256;
-constexpr int verify_config_option = 257;
-constexpr int encrypt_option = 258;
-
-constexpr option long_options[] = {
-    {"verbose", no_argument, nullptr, 'v'},
-    {"basedir", required_argument, nullptr, 'b'},
-    {"help", no_argument, nullptr, 'h'},
-    {"test-mode", no_argument, nullptr, 't'},
-    {"no-detach", no_argument, nullptr, 'D'},
-    {"no-compress", no_argument, nullptr, 'Z'},
-    {"save-interval", required_argument, nullptr, 's'},
-    {"expire-data", required_argument, nullptr, 'e'},
-    {"enable-di", no_argument, nullptr, 'd'},
-    {"enable-dc", no_argument, nullptr, 'C'},
-    {"cert-path", required_argument, nullptr, 'c'},
-    {"verify-config", required_argument, nullptr, verify_config_option},
-    {"encrypt", required_argument, nullptr, encrypt_option},
-    {"socket-delays", required_argument, nullptr, socket_delays_option},
-    {nullptr, 0, nullptr, 0},
-};
-
 void set_expire_age(const char* seconds) {
     const auto age = static_cast<uint32_t>(parse_saturated(seconds));
     limits& values = get_limits();
@@ -79,7 +57,7 @@ void set_expire_age(const char* seconds) {
 }
 
 void set_certificate_path(const char* path) {
-    if (strcmp(path, "NO_ENCRYPTION") == 0) {
+    if (strcmp(path, no_encryption) == 0) {
         clear_report_key_path();
         clear_config_key_path();
         return;
@@ -122,7 +100,7 @@ options parse_options(int argc, char** argv) {
     const char* verified_file = nullptr;
     const char* encrypted_file = nullptr;
     int letter = 0;
-    while ((letter = getopt_long(argc, argv, "vb:htDZs:dCe:c:", long_options, nullptr)) != -1) {
+    while ((letter = getopt_long(argc, argv, short_options, long_options, nullptr)) != -1) {
         switch (letter) {
             case 'b':
                 given.base_directory = optarg;

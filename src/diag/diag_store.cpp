@@ -26,9 +26,8 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-qz";
-constexpr off_t max_file_size = 204800;      // bytes; the event that goes beyond is still kept
-constexpr int32_t full_files = 3;            // that stay beside the one being written
-constexpr uint32_t reserved_space = 327680;  // bytes
+constexpr off_t max_file_size = 204800;  // bytes; the event that goes beyond is still kept
+constexpr int32_t full_files = 3;        // that stay beside the one being written
 
 struct selection {
     std::string_view package_end;
@@ -167,7 +166,7 @@ bool qz_wants_probe(const char* package, const char* name) {
     return qz_active == 1 && find_selection(package, name) != nullptr;
 }
 
-uint32_t qz_space_reserve() { return qz_active != 0 ? reserved_space : 0; }
+uint32_t qz_space_reserve() { return qz_active != 0 ? qz_reserved_space : 0; }
 
 void qz_wait_for_compressor() { wait_for_child(compressor_pid); }
 

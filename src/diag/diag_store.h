@@ -8,6 +8,8 @@
 
 namespace kivd {
 
+inline constexpr uint32_t qz_reserved_space = 327680;  // bytes that stay free while it is active
+
 // 0 switches the store off and deletes all that it has kept; any other value switches it on.
 // Failures have been logged and raised.
 void qz_set_active(int32_t value);

@@ -25,8 +25,6 @@ namespace {
 
 constexpr char tag[] = "kivd-compactor";
 constexpr char remove_tag[] = "kivd-util";
-constexpr uint64_t compaction_overhead = 256000;  // bytes beside a report of the largest size
-constexpr uint64_t min_free_inodes = 8;
 
 struct entry_path {
     explicit entry_path(const char* name) {
@@ -88,14 +86,14 @@ bool is_free_space_enough() {
         (void)log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
         return false;
     }
-    const uint64_t needed =
-        2 * (get_limits().max_report_size + compaction_overhead) + qz_space_reserve();
+    const uint64_t needed = compaction_space(get_limits().max_report_size) + qz_space_reserve();
     const uint64_t available = static_cast<uint64_t>(status.f_bsize) * status.f_bavail;
-    return needed <= available && (status.f_files == 0 || status.f_ffree >= min_free_inodes);
+    return needed <= available && (status.f_files == 0 || status.f_ffree >= free_inodes_min);
 }
 
-// Wraps in 32 bits when the limits are the wrong way round: then only free space counts.
-uint32_t size_budget() { return get_limits().max_output_dir_size - get_limits().max_report_size; }
+uint32_t size_budget() {
+    return output_size_budget(get_limits().max_output_dir_size, get_limits().max_report_size);
+}
 
 void log_deleted(const char* log_tag, const char* path) {
     __android_log_print(ANDROID_LOG_INFO, log_tag, "Deleting %s from output directory", path);

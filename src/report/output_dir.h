@@ -7,6 +7,21 @@
 
 namespace kivd {
 
+inline constexpr uint64_t free_inodes_min = 8;
+
+// Bytes that have to be free to make a report of the largest size.
+[[nodiscard]] constexpr uint64_t compaction_space(uint32_t max_report_size) {
+    constexpr uint64_t overhead = 256000;
+    return 2 * (max_report_size + overhead);
+}
+
+// The size that all files together stay below. Wraps in 32 bits when the limits are the wrong way
+// round: then only free space counts.
+[[nodiscard]] constexpr uint32_t output_size_budget(uint32_t max_output_dir_size,
+                                                    uint32_t max_report_size) {
+    return max_output_dir_size - max_report_size;
+}
+
 // Deletes the oldest reports until another one fits. Gives the highest report number left, 0 when
 // there is none, or -1 when room cannot be made; what stood in the way has mostly been logged.
 [[nodiscard]] int32_t prune_dir();

@@ -8,13 +8,10 @@
 #include <cstdio>
 
 #include "util/file_io.h"
+#include "util/paths.h"
 
 namespace kivd {
 namespace {
-
-constexpr char default_directory[] = "/system/etc/security/";
-constexpr char report_key_name[] = "kiv_report.pem";
-constexpr char config_key_name[] = "kiv_config.pem";
 
 using key_path = std::array<char, 4096>;
 
@@ -38,16 +35,16 @@ unique_pkey load_public_key(const key_path& path) {
 }  // namespace
 
 void set_default_key_paths() {
-    set_report_key_dir(default_directory);
-    set_config_key_dir(default_directory);
+    set_report_key_dir(paths::default_key_dir);
+    set_config_key_dir(paths::default_key_dir);
 }
 
 void set_report_key_dir(const char* directory) {
-    set_path(report_key_path, directory, report_key_name);
+    set_path(report_key_path, directory, paths::report_key_name);
 }
 
 void set_config_key_dir(const char* directory) {
-    set_path(config_key_path, directory, config_key_name);
+    set_path(config_key_path, directory, paths::config_key_name);
 }
 
 void clear_report_key_path() { report_key_path.front() = '\0'; }

@@ -12,21 +12,19 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-list";
-constexpr int max_records = 20000;
-constexpr size_t max_record_size = 1024;
 constexpr size_t path_size = 4096;
 constexpr size_t buffer_size = 32768;
-constexpr char terminator[] = {'\0', '\0', '\n'};
 
-// A window on the file that always shows the next `max_record_size` bytes, or all that are left.
+// A window on the file that always shows the next bytes, as many as a record may have, or all
+// that are left.
 class record_window {
  public:
     explicit record_window(FILE* file) : file_(file) {}
 
     const char* start() const { return bytes_.data() + start_; }
     size_t size() {
-        if (end_ - start_ < max_record_size) refill();
-        return end_ - start_ < max_record_size ? end_ - start_ : max_record_size;
+        if (end_ - start_ < list_record_size_max) refill();
+        return end_ - start_ < list_record_size_max ? end_ - start_ : list_record_size_max;
     }
     void step(size_t size) { start_ += size; }
 
@@ -58,11 +56,11 @@ int list_load(sorted_list& list, const char* path, list_parse_fn parse, void* co
     setvbuf(file.get(), nullptr, _IONBF, 0);  // the window is buffer enough
 
     record_window window(file.get());
-    for (int records = 0; records < max_records; ++records) {
+    for (int records = 0; records < list_records_max; ++records) {
         const size_t size = window.size();
-        if (size < sizeof terminator) return 1;
+        if (size < sizeof list_terminator) return 1;
         const char* const record = window.start();
-        const void* const found = memmem(record, size, terminator, sizeof terminator);
+        const void* const found = memmem(record, size, list_terminator, sizeof list_terminator);
         if (found == nullptr) {
             (void)log_and_raise(tag, "Corrupt data when reading list");
             return 0;
@@ -73,7 +71,7 @@ int list_load(sorted_list& list, const char* path, list_parse_fn parse, void* co
             (void)log_and_raise(tag, "Out of memory when adding element to list");
             return 0;
         }
-        window.step(static_cast<size_t>(end - record) + sizeof terminator);
+        window.step(static_cast<size_t>(end - record) + sizeof list_terminator);
     }
     return 0;
 }

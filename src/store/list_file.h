@@ -14,6 +14,10 @@
 
 namespace kivd {
 
+inline constexpr int list_records_max = 20000;
+inline constexpr size_t list_record_size_max = 1024;  // bytes, its end with it
+inline constexpr char list_terminator[] = {'\0', '\0', '\n'};
+
 // Makes an element of one record, or null to skip it. `terminator` is the first of the three bytes
 // that end the record: the last field's NUL.
 using list_parse_fn = void* (*)(const char* record, const char* terminator, void* context);

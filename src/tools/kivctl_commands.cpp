@@ -5,8 +5,10 @@
 #include <cstdint>
 #include <limits>
 
+#include "tools/check_command.h"
 #include "tools/kivctl_files.h"
 #include "tools/kivctl_io.h"
+#include "tools/status_command.h"
 #include "tools/watch_command.h"
 #include "util/unique_fd.h"
 
@@ -137,6 +139,9 @@ constexpr argument package = {"PACKAGE", &given::package, "First half of the pro
 constexpr argument name = {"NAME", &given::name, "Second half of the probe's id", true};
 constexpr argument group_id = {"ID", &given::id, "A group id", true};
 
+constexpr argument as_json = {"--json", nullptr, "Print JSON", false, nullptr, nullptr,
+                              &given::is_json};
+
 constexpr command_group groups[] = {
     {"config",  "Hand over a configuration, or look at the one in force"},
     {"counter", "Set a counter or add to it"},
@@ -202,13 +207,26 @@ constexpr command commands[] = {
          return kiv_replace_group_id(daemon, g.id.c_str(), g.old_id.c_str());
      }},
     {"files", "list", "List the number and the size of each file", {},
-     [](kiv_handle* daemon, const given&) { return list_files(daemon); }},
+     [](kiv_handle* daemon, const given& g) { return list_files(daemon, g.timeout_ms); }},
     {"files", "get", "Print a file; kivtool report shows what is in it", {
          {"NUMBER", &given::number, "The file's number", true, check_file_number},
          {"-o,--output", &given::output, "Write it to a file instead", false, nullptr, "FILE"}},
      [](kiv_handle* daemon, const given& g) {
          return get_file(daemon, static_cast<int32_t>(to_number(g.number)), g.output);
      }},
+    {nullptr, "status", "Show how the daemon stands; the exit status is 3 when it does not answer", {
+         as_json},
+     [](kiv_handle*, const given& g) { return run_status({g.base, g.timeout_ms, g.is_json}); },
+     handle_use::none},
+    {nullptr, "check", "Say what is weak; the exit status is 1 when there is something", {as_json,
+         {"--keys", &given::key_directory, "Where the keys ought to be, instead of where the daemon "
+          "looks for them", false, nullptr, "DIR"},
+         {"--user", &given::user, "Who ought to read the keys, instead of the daemon's user", false,
+          nullptr, "NAME"}},
+     [](kiv_handle*, const given& g) {
+         return run_check({g.base, g.timeout_ms, g.is_json, g.key_directory, g.user});
+     },
+     handle_use::none},
     {nullptr, "watch", "Show the requests to a daemon that was started with -d, as it handles them", {
          {"--host", &given::host, "Where the daemon runs", false, nullptr, "ADDRESS [127.0.0.1]"},
          {"--package", &given::package, "Show the requests of that package only", false, nullptr,

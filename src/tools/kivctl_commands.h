@@ -23,6 +23,9 @@ struct given {
     std::string output;
     std::string host = "127.0.0.1";
     bool is_raw = false;
+    bool is_json = false;
+    std::string key_directory;
+    std::string user;
 
     // options before the command
     std::string base = KIV_DEFAULT_DIRECTORY;

@@ -24,11 +24,14 @@ void print_file(int32_t number, int fd) {
 
 }  // namespace
 
-int list_files(kiv_handle* daemon) {
+int list_files(kiv_handle* daemon, unsigned timeout_ms) {
+    const deadline end(timeout_ms);
     int missing = 0;
     int number = 0;
     while ((number = kiv_next_file(daemon, number)) >= 0) {
+        kiv_set_timeout(daemon, end.left_ms());
         const unique_fd file(kiv_get_file(daemon, number));
+        kiv_set_timeout(daemon, end.left_ms());
         if (file.ok()) {
             missing = 0;
             print_file(number, file.get());

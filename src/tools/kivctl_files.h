@@ -9,8 +9,9 @@
 
 namespace kivd {
 
-// Prints a line for each file: its number and its size.
-int list_files(kiv_handle* daemon);
+// Prints a line for each file: its number and its size. The answers have to come within that time,
+// all of them together.
+int list_files(kiv_handle* daemon, unsigned timeout_ms);
 
 // Writes the file with that number to `path`, or to standard output when that is empty.
 int get_file(kiv_handle* daemon, int32_t number, const std::string& path);

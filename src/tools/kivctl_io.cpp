@@ -2,16 +2,25 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 
+#include "util/file_io.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
 
 [[noreturn]] void fail(const std::string& what) { throw failure(what + ": " + strerror(errno)); }
+
+int64_t monotonic_ms() {
+    timespec now = {};
+    (void)clock_gettime(CLOCK_MONOTONIC, &now);
+    return int64_t{now.tv_sec} * 1000 + now.tv_nsec / 1'000'000;
+}
 
 // False, with errno set, when `file` cannot take it.
 bool copy_content(int fd, FILE* file) {
@@ -44,6 +53,24 @@ std::string read_source(const std::string& path, size_t size_max, const char* ki
                       std::to_string(size_max) + " bytes");
     }
     return content;
+}
+
+std::optional<std::string> read_if_possible(const std::string& path, size_t size_max) {
+    const unique_file file = open_to_read(path.c_str());
+    if (!file) return std::nullopt;
+    std::string content;
+    char bytes[16'384];
+    while (const size_t size = fread(bytes, 1, sizeof bytes, file.get())) {
+        content.append(bytes, size);
+        if (content.size() > size_max) return std::nullopt;
+    }
+    return ferror(file.get()) == 0 ? std::optional(content) : std::nullopt;
+}
+
+deadline::deadline(unsigned milliseconds) : end_ms_(monotonic_ms() + milliseconds) {}
+
+unsigned deadline::left_ms() const {
+    return static_cast<unsigned>(std::max<int64_t>(end_ms_ - monotonic_ms(), 0));
 }
 
 void print_line(const char* text) {

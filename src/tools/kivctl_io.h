@@ -3,6 +3,8 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
+#include <optional>
 #include <stdexcept>
 #include <string>
 
@@ -28,6 +30,20 @@ std::string name_source(const std::string& path);
 
 // The content of the file, at most `size_max` bytes; `kind` says what it is to be.
 std::string read_source(const std::string& path, size_t size_max, const char* kind);
+
+// The content of a file or of what is in /proc; nothing when it cannot be read or is larger. Never
+// waits for a writer.
+[[nodiscard]] std::optional<std::string> read_if_possible(const std::string& path, size_t size_max);
+
+// When a command has to be through.
+class deadline {
+ public:
+    explicit deadline(unsigned milliseconds);
+    [[nodiscard]] unsigned left_ms() const;  // 0 when it has passed
+
+ private:
+    int64_t end_ms_;
+};
 
 // To standard output: a line, or all that can be read from `fd`.
 void print_line(const char* text);

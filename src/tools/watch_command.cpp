@@ -8,6 +8,7 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <csignal>
@@ -48,12 +49,49 @@ void end_on_signals() {
                   status_unreachable);
 }
 
+// A name service may take its time, and a name may stand for several machines: all of
+// that together has one limit.
+void give_up(int /*signal*/) {
+    constexpr char text[] = "kivctl: the debug interface could not be reached in time\n";
+    (void)!write(STDERR_FILENO, text, sizeof text - 1);
+    _exit(status_unreachable);
+}
+
+// Gives up in so many milliseconds; with 0 no more.
+void limit_time(unsigned milliseconds) {
+    (void)signal(SIGALRM, give_up);
+    const itimerval limit = {
+        {}, {milliseconds / 1000, static_cast<suseconds_t>(milliseconds % 1000) * 1000}};
+    (void)setitimer(ITIMER_REAL, &limit, nullptr);
+}
+
+// 0 when it answers, else as libkiv says.
+int ask_daemon(const watch_options& options, unsigned timeout_ms) {
+    const std::unique_ptr<kiv_handle, releaser<kiv_destroy>> daemon(
+        kiv_create_from_path(options.base.c_str()));
+    if (!daemon) return -errno;
+    kiv_set_timeout(daemon.get(), timeout_ms);
+    return kiv_is_alive(daemon.get());
+}
+
+bool is_loopback(const addrinfo& address) {
+    sockaddr_in internet = {};
+    memcpy(&internet, address.ai_addr, sizeof internet);
+    return ntohl(internet.sin_addr.s_addr) >> 24U == IN_LOOPBACKNET;
+}
+
+// A connection to a daemon that is stopped is made all the same, and nothing would ever come.
+void check_local_daemon(const watch_options& options, unsigned timeout_ms) {
+    if (ask_daemon(options, timeout_ms) != -ETIMEDOUT) return;
+    throw failure("the daemon in " + options.base + " has not answered within " +
+                      std::to_string(options.timeout_ms) + " ms; it may be busy or stopped",
+                  status_unreachable);
+}
+
 // Not ok, with errno set, when it cannot be had.
-unique_fd connect_to(const addrinfo& address, unsigned timeout_ms) {
+unique_fd connect_to(const addrinfo& address) {
     unique_fd fd(socket(address.ai_family, address.ai_socktype | SOCK_CLOEXEC, 0));
     if (!fd.ok()) return fd;
-    const timeval limit = {timeout_ms / 1000, static_cast<suseconds_t>(timeout_ms % 1000) * 1000};
-    (void)setsockopt(fd.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
     const int on = 1;  // so that a machine that vanished is noticed some day
     (void)setsockopt(fd.get(), SOL_SOCKET, SO_KEEPALIVE, &on, sizeof on);
     if (connect(fd.get(), address.ai_addr, address.ai_addrlen) != 0) fd.reset();
@@ -61,6 +99,8 @@ unique_fd connect_to(const addrinfo& address, unsigned timeout_ms) {
 }
 
 unique_fd connect_to_host(const watch_options& options) {
+    const deadline end(options.timeout_ms);
+    limit_time(options.timeout_ms);
     addrinfo wanted = {};
     wanted.ai_family = AF_INET;
     wanted.ai_socktype = SOCK_STREAM;
@@ -69,11 +109,17 @@ unique_fd connect_to_host(const watch_options& options) {
     if (result != 0) fail_to_connect(options, gai_strerror(result));
     const std::unique_ptr<addrinfo, releaser<freeaddrinfo>> found(list);
     for (const addrinfo* each = found.get(); each != nullptr; each = each->ai_next) {
-        unique_fd fd = connect_to(*each, options.timeout_ms);
-        if (fd.ok()) return fd;
+        limit_time(0);
+        if (is_loopback(*each)) check_local_daemon(options, end.left_ms());
+        limit_time(std::max(end.left_ms(), 1U));
+        unique_fd fd = connect_to(*each);
+        if (fd.ok()) {
+            limit_time(0);
+            return fd;
+        }
     }
-    if (errno != EINPROGRESS) fail_to_connect(options, strerror(errno));
-    fail_to_connect(options, "no answer within " + std::to_string(options.timeout_ms) + " ms");
+    limit_time(0);
+    fail_to_connect(options, strerror(errno));
 }
 
 // Whether both ends of the connection are on this machine.
@@ -83,14 +129,6 @@ bool is_local(int fd) {
     if (getsockname(fd, reinterpret_cast<sockaddr*>(&own), &own_size) != 0) return false;
     if (getpeername(fd, reinterpret_cast<sockaddr*>(&other), &other_size) != 0) return false;
     return own.sin_addr.s_addr == other.sin_addr.s_addr;
-}
-
-bool is_daemon_alive(const watch_options& options) {
-    const std::unique_ptr<kiv_handle, releaser<kiv_destroy>> daemon(
-        kiv_create_from_path(options.base.c_str()));
-    if (!daemon) return false;
-    kiv_set_timeout(daemon.get(), options.timeout_ms);
-    return kiv_is_alive(daemon.get()) == 0;
 }
 
 // The side that closes first holds its port for a minute, and as long no daemon could be started
@@ -112,7 +150,7 @@ void reset_connection(unique_fd& connection) {
     }
     if (!was_local) {
         text = options.host + " closed the connection: the daemon there has ended, or " + text;
-    } else if (!is_daemon_alive(options)) {
+    } else if (ask_daemon(options, options.timeout_ms) != 0) {
         text =
             "the daemon has ended: it closed the connection, and none answers in " + options.base;
     }

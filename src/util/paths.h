@@ -42,6 +42,10 @@ inline constexpr char counter_filter[] = "private/filters_cnt.txt";
 inline constexpr char static_data_filter[] = "private/filters_sd.txt";
 inline constexpr char event_filter[] = "private/filters.txt";
 
+inline constexpr char default_key_dir[] = "/system/etc/security/";
+inline constexpr char report_key_name[] = "kiv_report.pem";  // in the directory of the keys
+inline constexpr char config_key_name[] = "kiv_config.pem";
+
 inline constexpr char log_reader[] = "/system/bin/kiv-logreader";
 
 inline constexpr char diag_dir[] = "private/qz/";

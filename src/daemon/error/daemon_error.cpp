@@ -20,13 +20,12 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-error";
-constexpr int32_t period_limit = 100;
 
 constinit std::mutex mutex;  // guards everything below
 constinit int32_t error_nr = 0;
 constinit time_t error_time = 0;
 constinit bool notice_logged = false;
-constinit time_t flood_interval = 36000;
+constinit time_t flood_interval = error_flood_interval;
 constinit const char* connection_directory = nullptr;
 constinit kiv_handle* connection = nullptr;
 
@@ -46,7 +45,7 @@ std::optional<bool> admit() {
         error_time = now;
     }
     if (error_nr < INT32_MAX) ++error_nr;
-    if (error_nr <= period_limit) return error_nr == period_limit;
+    if (error_nr <= error_period_limit) return error_nr == error_period_limit;
 
     if (!read_clock(now) || now - error_time <= flood_interval) return std::nullopt;
     error_time = now;
@@ -99,7 +98,7 @@ void send_event(char* text, bool flooding) {
 void daemon_error_init(const char* directory) {
     const std::lock_guard lock(mutex);
     connection_directory = directory;
-    if (is_test_mode()) flood_interval = 6;
+    if (is_test_mode()) flood_interval = error_flood_interval_in_test_mode;
 }
 
 void raise_daemon_error(const char* format, ...) {

@@ -13,6 +13,10 @@ namespace kivd {
 
 inline constexpr size_t error_text_size = 1024;  // NUL included; longer texts are cut
 
+inline constexpr int32_t error_period_limit = 100;
+inline constexpr time_t error_flood_interval = 36000;  // seconds
+inline constexpr time_t error_flood_interval_in_test_mode = 6;
+
 // `directory` is where the daemon's own sockets are; the text is kept by the caller.
 void daemon_error_init(const char* directory);
 

@@ -1,0 +1,42 @@
+// The process that serves a working directory, as its lock file and /proc show it to anybody.
+#pragma once
+
+#include <sys/types.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace kivd {
+
+struct user_ids {
+    uid_t uid;
+    gid_t gid;
+    std::vector<gid_t> groups;
+};
+
+// What the command line of the daemon says.
+struct daemon_arguments {
+    std::optional<std::string> key_directory;  // that of -c, as given
+    bool is_test_mode = false;
+};
+
+// What is missing could not be found out.
+struct process_facts {
+    std::optional<bool> is_lock_held;
+    std::optional<bool> is_running;  // a process of its own, whatever it does
+    std::optional<pid_t> pid;        // of the running one
+    std::optional<bool> is_stopped;  // by a signal or a debugger
+    std::optional<daemon_arguments> arguments;
+    std::optional<user_ids> user;
+};
+
+// Those of the daemon of the current directory.
+[[nodiscard]] process_facts find_daemon_process();
+
+// Whether a child of the daemon, or one that has outlived it, makes a report or compresses a file.
+[[nodiscard]] std::optional<bool> has_worker(const process_facts& daemon);
+
+[[nodiscard]] std::optional<user_ids> find_user(const std::string& name);
+
+}  // namespace kivd

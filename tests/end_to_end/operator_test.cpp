@@ -1,0 +1,260 @@
+// kivctl for those who look after a daemon: status, check, and how long each command may take.
+#include <google/protobuf/struct.pb.h>
+#include <google/protobuf/util/json_util.h>
+#include <sys/stat.h>
+
+#include <chrono>
+#include <set>
+
+#include "daemon_test.h"
+#include "support/config_package.h"
+
+namespace kivd {
+namespace {
+
+using google::protobuf::Struct;
+
+class operator_commands : public daemon_test {
+ protected:
+    // As whom the daemon runs: root could read every key.
+    const uid_t daemon_user = geteuid() == 0 ? 65534 : 0;
+
+    void SetUp() override {
+        EXPECT_EQ(system("mkdir keys input"), 0);
+        for (const char* name : {"report", "config"}) {
+            make_keys(name, 2048);
+            std::filesystem::rename("kiv_" + std::string(name) + ".pem",
+                                    "keys/kiv_" + std::string(name) + ".pem");
+        }
+        const std::string package = gzip(pack({own_part<kiv::config::FilterConfig>(
+            "FilterConfig",
+            R"(event_filter { type: EXCLUDE item { package: "shop" name: "debug" } })")}));
+        write_file("input/config", config_file(package, sign(package, "config")));
+        if (daemon_user != 0) {
+            EXPECT_EQ(system(("chown -R " + std::to_string(daemon_user) + " .").c_str()), 0);
+        }
+    }
+
+    [[nodiscard]] daemon_process start_with_keys(const std::string& keys = "/keys/") const {
+        return start({{"-C", "-c", directory + keys}, 0, daemon_user});
+    }
+
+    [[nodiscard]] daemon_process kivctl(std::vector<std::string> arguments, uid_t uid = 0) const {
+        arguments.insert(arguments.begin(), {"--base", directory});
+        return {KIVCTL_PATH, {arguments, 0, uid}};
+    }
+
+    // What it printed as JSON, and its exit status as "status".
+    [[nodiscard]] Struct ask(const std::vector<std::string>& arguments, uid_t uid = 0) const {
+        daemon_process tool = kivctl(arguments, uid);
+        const int status = tool.wait_exit();
+        Struct answer;
+        EXPECT_TRUE(google::protobuf::util::JsonStringToMessage(tool.output(), &answer).ok())
+            << tool.output() << tool.log();
+        (*answer.mutable_fields())["status"].set_number_value(status);
+        return answer;
+    }
+
+    // The ids of what is found.
+    [[nodiscard]] std::set<std::string> check(double& status) const {
+        const Struct answer = ask({"check", "--json"});
+        status = answer.fields().at("status").number_value();
+        std::set<std::string> ids;
+        for (const auto& each : answer.fields().at("findings").list_value().values()) {
+            ids.insert(each.struct_value().fields().at("id").string_value());
+        }
+        return ids;
+    }
+};
+
+TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
+    daemon_process daemon = start_with_keys();
+    const std::string key = "keys/kiv_report.pem", config_key = "keys/kiv_config.pem";
+    const std::string record = "; printf '\\0\\0\\n' >>private/sdata.txt";
+    const auto fill = [](int size) {
+        return "head -c " + std::to_string(size) + " /dev/zero | tr '\\0' ";
+    };
+    const auto guard = [](int errors, int age) {
+        return "sed -i 's/^error_nr.*/error_nr: " + std::to_string(errors) +
+               "/; s/^error_time.*/error_time: '$(($(date +%s)-" + std::to_string(age) +
+               "))/ private/kivd.state";
+    };
+    const struct {
+        std::string damage;  // a command; all files are as before afterwards
+        std::string found;   // empty for nothing
+    } cases[] = {
+        {"true", ""},
+        {"rm " + key, "report_key_off"},
+        {"chmod 0 " + key, "report_key_off"},
+        {"chmod 0 keys", "report_key_off config_key_off"},
+        {"echo >" + key, "report_key_unusable"},
+        {"cp report.key " + key, "report_key_unusable"},
+        {"openssl ecparam -genkey -name prime256v1 -noout | openssl ec -pubout >" + key,
+         "report_key_unusable"},
+        {"openssl ecparam -genkey -name prime256v1 -noout | openssl ec -pubout >" + config_key, ""},
+        {"openssl genpkey -algorithm ed25519 | openssl pkey -pubout >" + config_key,
+         "config_key_unusable"},
+        {"rm " + config_key, "config_key_off"},
+        {"touch output/kiv_disabled", "disabled"},
+        {"touch output/kiv_7", ""},
+        {"touch output/kiv_7x", "bad_file"},
+        {"mkdir output/kiv_7", "bad_file"},
+        {"touch private/counters.txt_", "stale_temporary"},
+        {"touch private/kivd.state_tmp", "stale_temporary"},
+        {"touch private/new_config.gz", "stale_temporary"},
+        {"touch private/flushed_data.encrypted", "stale_temporary"},
+        {"touch private/qz_compressed", "stale_temporary"},
+        {"touch private/flushed_data", "unsent_report"},
+        {"rm private/filters.txt", "filter"},
+        {"printf '__type\\0exclude\\0\\0\\n' >private/filters.txt", "filter"},
+        {"printf '*\\0*\\0\\0\\n' >private/filters.txt", "filter"},
+        {"printf 'a\\0*\\0\\0\\n' >private/filters.txt", ""},
+        {fill(1021) + "x >private/sdata.txt" + record, ""},
+        {fill(1022) + "x >private/sdata.txt" + record, "list_file"},
+        {"for i in $(seq 20000); do printf 'x\\0\\0\\n'; done >private/sdata.txt", ""},
+        {"for i in $(seq 20001); do printf 'x\\0\\0\\n'; done >private/sdata.txt", "list_file"},
+        {"for i in $(seq 20000); do printf 'x\\0\\0\\n'; done >private/filters.txt", "list_file"},
+        {guard(99, 0), ""},
+        {guard(100, 35000), "error_guard"},
+        {guard(100, 36100), ""},
+        {"truncate -s 368639 private/events", ""},
+        {"truncate -s 368640 private/events", "partial_file"},
+        {"truncate -s 4349951 output/kiv_1", ""},
+        {"truncate -s 4349952 output/kiv_1", "output_size"},
+        {"sed -i 's/^data-collection.*/data-collection: 0/' private/kivd.state", "collection_off"},
+        {"chmod 600 kiv_co_stream", "socket"},
+    };
+    EXPECT_EQ(system("tar cf all.tar keys private output"), 0);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.damage);
+        EXPECT_EQ(system(("( " + c.damage + " ) 2>/dev/null").c_str()), 0);
+        double status = -1;
+        std::string found;
+        for (const std::string& id : check(status))
+            found.insert(0, (found.empty() ? id : id + " "));
+        EXPECT_EQ(found, c.found);
+        EXPECT_EQ(status, c.found.empty() ? 0 : 1);
+        EXPECT_EQ(system("rm -r keys private output; tar xpf all.tar; chmod 622 kiv_co_stream"), 0);
+    }
+}
+
+TEST_F(operator_commands, names_of_any_bytes_and_a_path_without_its_slash_are_told) {
+    daemon_process daemon = start_with_keys("/keys");
+    write_file("output/a\"\n\xff\\", "");
+    const Struct answer = ask({"check", "--json", "--keys", directory + "/keys"});
+    std::set<std::string> what;
+    for (const auto& each : answer.fields().at("findings").list_value().values()) {
+        what.insert(each.struct_value().fields().at("what").string_value());
+    }
+    const std::string wrong = directory + "/keyskiv_";
+    EXPECT_EQ(what, (std::set<std::string>{
+                        "output/a\"\n\\xFF\\\\ is no report",
+                        "the directory of -c has no final \"/\": the daemon looks for " + wrong +
+                            "report.pem and " + wrong + "config.pem",
+                        "the daemon looks for its keys by -c " + directory + "/keys, not in " +
+                            directory + "/keys/"}));
+    daemon_process text = kivctl({"check"});
+    EXPECT_EQ(text.wait_exit(), 1);
+    EXPECT_EQ(text.output().find('\n' + wrong), std::string::npos);
+    EXPECT_NE(text.output().find("report_key_off: " + wrong + "report.pem is missing; "),
+              std::string::npos);
+    EXPECT_NE(text.output().find("bad_file: output/a\"\\x0A\\xFF\\\\ is no"), std::string::npos);
+}
+
+TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
+    daemon_process daemon = start_with_keys();
+    write_file("output/kiv_7", "12345");
+    write_file("private/events", "123");
+    const std::string checksum = read_file("private/kivd.state").substr(17, 40);
+    const std::string common =
+        R"("directory":")" + directory + R"(","running":true,"pid":)" +
+        std::to_string(daemon.pid()) + R"(,"stopped":false,"lock_held":true,"answers":true,)" +
+        R"("reports":{"count":1,"lowest":7,"highest":7},"keys_from":"command_line",)" +
+        R"("sealing":{"on":true,"key":"usable","path":")" + directory +
+        R"(/keys/kiv_report.pem"},"verification":{"on":true,"key":"usable","path":")" + directory +
+        R"(/keys/kiv_config.pem"},"config_checksum":")" + checksum + R"(","status":0,)";
+    const struct {
+        uid_t uid;
+        std::string rest;
+    } cases[] = {
+        {daemon_user,
+         R"("collection":true,"diagnostics":false,"partial_file":{"size":3,"limit":409600},)"
+         R"("output":{"size":5,"limit":4833280},"needed":1331200,"used":0,"suppressed":false)"},
+        {1, R"("collection":null,"diagnostics":null,"partial_file":{"size":null,"limit":null},)"
+            R"("output":{"size":5,"limit":null},"needed":null,"used":null,"suppressed":null)"},
+    };
+    for (const auto& [uid, rest] : cases) {
+        if (uid == 1 && geteuid() != 0) continue;
+        SCOPED_TRACE(uid);
+        Struct got = ask({"status", "--json"}, uid);
+        auto& fields = *got.mutable_fields();
+        EXPECT_GT(fields["answer_us"].number_value(), 0);
+        // of these two, what doesn't change by itself
+        for (const char* name : {"needed", "used", "suppressed"}) {
+            auto& from =
+                *fields[*name == 'n' ? "free_space" : "error_guard"].mutable_struct_value();
+            fields[name] = from.fields().at(name);
+        }
+        for (const char* name : {"free_space", "error_guard", "answer_us"}) fields.erase(name);
+        Struct expected;
+        EXPECT_TRUE(
+            google::protobuf::util::JsonStringToMessage('{' + common + rest + '}', &expected).ok());
+        EXPECT_EQ(got.DebugString(), expected.DebugString());
+    }
+    EXPECT_EQ(daemon.stop(), 0);
+    const Struct after = ask({"status", "--json"});
+    EXPECT_FALSE(after.fields().at("running").bool_value());
+    EXPECT_EQ(after.fields().at("status").number_value(), 3);
+}
+
+// Named like the others that use the one port of the debug interface.
+class debug_operator : public operator_commands {};
+
+TEST_F(debug_operator, every_command_ends_in_time_when_the_daemon_is_stopped) {
+    daemon_process daemon = launch({{"-C", "-d"}});
+    if (!daemon.wait_ready()) GTEST_SKIP() << "port 2305 is in use";
+    write_file("config", "c");
+    daemon.send_signal(SIGSTOP);
+    const std::vector<std::vector<std::string>> commands = {
+        {"alive"},
+        {"flush"},
+        {"save"},
+        {"device-id"},
+        {"wanted", "p", "n"},
+        {"config", "install", "config"},
+        {"config", "announce"},
+        {"config", "get", "p", "n"},
+        {"collection", "on"},
+        {"remove-report", "all"},
+        {"group", "add", "x"},
+        {"group", "delete", "x"},
+        {"group", "replace", "x", "y"},
+        {"files", "list"},
+        {"files", "get", "1"},
+        {"status"},
+        {"status", "--json"},
+        {"check"},
+        {"check", "--json"},
+        {"watch"},
+        {"watch", "--host", "localhost"},
+    };
+    const auto start_time = std::chrono::steady_clock::now();
+    std::vector<daemon_process> tools;
+    for (const auto& command : commands) tools.push_back(kivctl(command));
+    for (size_t i = 0; i < tools.size(); ++i) {
+        EXPECT_EQ(tools[i].wait_exit(), 3) << commands[i].front() << tools[i].log();
+    }
+    // twice the time is what one would take that gives it to each of its questions
+    EXPECT_LT(std::chrono::steady_clock::now() - start_time, std::chrono::milliseconds(3900));
+    // data is done when it is in the daemon's queue, and then there is no more room
+    int status = 0;
+    for (int i = 0; i < 2000 && status == 0; ++i) {
+        status = kivctl({"--timeout", "50", "event", "p", "n"}).wait_exit();
+    }
+    EXPECT_EQ(status, 3);
+    daemon.send_signal(SIGCONT);
+    EXPECT_EQ(daemon.stop(), 0);
+}
+
+}  // namespace
+}  // namespace kivd
