@@ -1,4 +1,7 @@
+// What kiv.h declares is all that the shared library shows.
+#pragma GCC visibility push(default)
 #include "kiv.h"
+#pragma GCC visibility pop
 
 #include <poll.h>
 #include <sys/socket.h>
