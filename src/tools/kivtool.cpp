@@ -1,6 +1,7 @@
 // kivtool: looks into what kivd leaves on disk and makes what it is configured with. Needs no
 // daemon.
 #include <google/protobuf/stubs/logging.h>
+#include <unistd.h>
 
 #include <CLI/CLI.hpp>
 #include <exception>
@@ -19,25 +20,51 @@ constexpr int wrong_usage = 2;
 struct report_given {
     std::vector<std::string> paths;
     kivd::report_options options;
-    bool json = false;
-    bool summary = false;
 };
+
+constexpr struct {
+    const char *name, *description;
+    kivd::report_format format;
+} report_formats[] = {
+    {"text", "As protobuf text", kivd::report_format::text},
+    {"json", "One JSON document for each file", kivd::report_format::json},
+    {"jsonl", "One JSON object for each record, a line each", kivd::report_format::jsonl},
+    {"csv", "A line of comma-separated values for each record", kivd::report_format::csv},
+    {"summary", "A few lines for people", kivd::report_format::summary},
+};
+
+CLI::Option* add_report_arguments(CLI::App& report, report_given& given) {
+    report.add_option("--key", given.options.key_path,
+                      "Private key (PEM) that opens sealed reports");
+    return report.add_option("PATH", given.paths,
+                             "Files to read, and directories whose reports to read");
+}
 
 CLI::App* add_report(CLI::App& app, report_given& given) {
     CLI::App* report = app.add_subcommand(
         "report",
-        "Prints reports, unfinished ones (private/events) and diagnostics files, as protobuf text");
-    report->add_flag("--json", given.json, "Print one JSON document for each file");
-    report->add_flag("--summary", given.summary, "Print a summary for people")->excludes("--json");
-    report->add_option("--key", given.options.key_path,
-                       "Private key (PEM) that opens sealed reports");
-    report->add_option("FILE", given.paths, "Files to read")->required();
+        "Shows reports, unfinished ones (private/events) and diagnostics files; as text, if no "
+        "other form is asked for");
+    add_report_arguments(*report, given);
+    report->require_subcommand(0, 1);
+    for (const auto& format : report_formats) {
+        CLI::App* sub = report->add_subcommand(format.name, format.description);
+        add_report_arguments(*sub, given)->required();
+        sub->callback([&given, &format] { given.options.format = format.format; });
+        if (format.format != kivd::report_format::summary) continue;
+        sub->add_option("--plot", given.options.plot_path,
+                        "Picture (SVG) of the events per minute by package to make");
+    }
+    report->final_callback([&given] {
+        if (given.paths.empty()) throw CLI::RequiredError("PATH");
+    });
     return report;
 }
 
 int run_report(report_given& given) {
-    if (given.json) given.options.view = kivd::report_view::json;
-    if (given.summary) given.options.view = kivd::report_view::summary;
+    const bool is_shown_as_it_comes = given.options.format != kivd::report_format::summary;
+    given.options.show_progress =
+        isatty(STDERR_FILENO) != 0 && !(is_shown_as_it_comes && isatty(STDOUT_FILENO) != 0);
     return kivd::run_report_command(given.paths, given.options, std::cout, std::cerr);
 }
 
@@ -87,6 +114,7 @@ CLI::App* add_show(CLI::App& config, show_given& given) {
 
 int main(int argc, char** argv) try {
     google::protobuf::SetLogHandler(nullptr);  // problems are told once, by us
+    std::ios::sync_with_stdio(false);          // reports are long
 
     CLI::App app("Looks into the files that kivd leaves and makes those that it is given.",
                  "kivtool");
