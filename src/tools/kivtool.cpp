@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "tools/config_build.h"
+#include "tools/config_lint.h"
 #include "tools/config_show.h"
 #include "tools/report_command.h"
 
@@ -81,6 +82,8 @@ CLI::App* add_build(CLI::App& config, build_given& given) {
     CLI::App* build = config.add_subcommand("build", "Makes a configuration file");
     build->add_option("-o,--output", given.options.output_path, "File to make")->required();
     build->add_option("--sign", given.options.key_path, "Private key (PEM) to sign with");
+    build->add_flag("--no-lint", given.options.no_lint,
+                    "Don't look for what the daemon would refuse, and don't refuse it");
     build
         ->add_option("PACKAGE:NAME=FILE", given.parts,
                      "A part and the file with its payload; for FilterConfig, Settings, RunActions "
@@ -96,6 +99,15 @@ int run_build(const build_given& given) {
         sources.push_back(*kivd::read_part_argument(part));
     }
     return kivd::run_config_build(sources, given.options, std::cerr);
+}
+
+CLI::App* add_lint(CLI::App& config, std::vector<std::string>& arguments) {
+    CLI::App* lint = config.add_subcommand(
+        "lint", "Finds what the daemon would refuse, or take for something else than was meant");
+    lint->add_option("FILE|PACKAGE:NAME=FILE", arguments,
+                     "Configuration files, each on its own, and parts, all of them together")
+        ->required();
+    return lint;
 }
 
 struct show_given {
@@ -121,11 +133,13 @@ int main(int argc, char** argv) try {
     app.require_subcommand(1);
     report_given reporting;
     build_given building;
+    std::vector<std::string> linted;
     show_given showing;
     const CLI::App* report = add_report(app, reporting);
-    CLI::App* config = app.add_subcommand("config", "Makes and shows configuration files");
+    CLI::App* config = app.add_subcommand("config", "Makes, checks and shows configuration files");
     config->require_subcommand(1);
     const CLI::App* build = add_build(*config, building);
+    const CLI::App* lint = add_lint(*config, linted);
     add_show(*config, showing);
 
     try {
@@ -135,6 +149,7 @@ int main(int argc, char** argv) try {
     }
     if (report->parsed()) return run_report(reporting);
     if (build->parsed()) return run_build(building);
+    if (lint->parsed()) return kivd::run_config_lint(linted, std::cout, std::cerr);
     return kivd::run_config_show(showing.path, showing.key_path, std::cout, std::cerr);
 } catch (const std::exception& error) {
     std::cerr << "kivtool: " << error.what() << '\n';
