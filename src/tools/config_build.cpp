@@ -1,58 +1,37 @@
 #include "tools/config_build.h"
 
-#include <set>
 #include <utility>
 
 #include "config.pb.h"
 #include "tools/config_file.h"
+#include "tools/config_lint.h"
 #include "tools/keys.h"
-#include "tools/part_text.h"
+#include "tools/lint_findings.h"
 #include "tools/text_escape.h"
 #include "tools/whole_file.h"
 
 namespace kivd {
 namespace {
 
-// The daemon keeps package and name, with some numbers, in a record of at most 1024 bytes.
-constexpr size_t max_id_size = 1000;
-
 // All of these give what is wrong as a sentence, empty when it is done.
 
-std::string id_of(const part_source& source) {
-    return printable(source.package) + ":" + printable(source.name);
-}
-
-std::string check_ids(const std::vector<part_source>& sources) {
-    std::set<std::pair<std::string, std::string>> seen;
+std::string read_parts(const std::vector<part_source>& sources, std::vector<part_content>& parts) {
+    std::string problem;
     for (const part_source& source : sources) {
-        if (source.package == "kivd" && source.name == "_last_id") {
-            return id_of(source) + ": is the daemon's own, no part can have that name";
-        }
-        if (source.package.size() + source.name.size() > max_id_size) {
-            return id_of(source) + ": package and name have at most " +
-                   std::to_string(max_id_size) + " bytes together";
-        }
-        if (!seen.emplace(source.package, source.name).second) {
-            return id_of(source) + ": is given twice";
-        }
+        problem = read_part(source, parts.emplace_back());
+        if (!problem.empty()) break;
     }
-    return "";
+    return problem;
 }
 
-std::string add_part(const part_source& source, kiv::config::ConfigPackage& package) {
-    kiv::config::ConfigPart& part = *package.add_parts();
-    part.set_package(source.package);
-    part.set_name(source.name);
-    std::string content;
-    const std::string problem = read_whole_file(source.path, max_package_size, content);
-    if (!problem.empty()) return printable(source.path) + ": " + problem;
-    const auto* type = daemon_part_type(source.package, source.name);
-    if (!type) {
-        part.set_payload(std::move(content));
-        return "";
-    }
-    const std::string text_problem = encode_part(*type, content, *part.mutable_payload());
-    return text_problem.empty() ? "" : printable(source.path) + ":" + text_problem;
+std::string lint(const std::vector<part_content>& parts, const std::string& path,
+                 std::ostream& err) {
+    lint_findings findings;
+    lint_config(parts, path, findings);
+    findings.print(err);
+    if (!findings.has_errors()) return "";
+    return printable(path) +
+           ": not built because of these errors; --no-lint builds it all the same";
 }
 
 std::string add_signature(const std::string& key_path, kiv::config::ConfigResponse& file) {
@@ -63,13 +42,19 @@ std::string add_signature(const std::string& key_path, kiv::config::ConfigRespon
     return problem.empty() ? "" : printable(key_path) + ": " + problem;
 }
 
-std::string build(const std::vector<part_source>& sources, const config_build_options& options) {
-    std::string problem = check_ids(sources);
-    kiv::config::ConfigPackage package;
-    for (const part_source& source : sources) {
-        if (problem.empty()) problem = add_part(source, package);
-    }
+std::string build(const std::vector<part_source>& sources, const config_build_options& options,
+                  std::ostream& err) {
+    std::vector<part_content> parts;
+    std::string problem = read_parts(sources, parts);
+    if (problem.empty() && !options.no_lint) problem = lint(parts, options.output_path, err);
     if (!problem.empty()) return problem;
+    kiv::config::ConfigPackage package;
+    for (part_content& part : parts) {
+        kiv::config::ConfigPart& packed = *package.add_parts();
+        packed.set_package(std::move(part.package));
+        packed.set_name(std::move(part.name));
+        packed.set_payload(std::move(part.payload));
+    }
 
     const std::string output = printable(options.output_path) + ": ";
     kiv::config::ConfigResponse file;
@@ -88,19 +73,9 @@ std::string build(const std::vector<part_source>& sources, const config_build_op
 
 }  // namespace
 
-std::optional<part_source> read_part_argument(const std::string& argument) {
-    const size_t colon = argument.find(':');
-    const size_t equals = argument.find('=', colon == std::string::npos ? 0 : colon);
-    if (colon == std::string::npos || equals == std::string::npos) return std::nullopt;
-    part_source source = {argument.substr(0, colon), argument.substr(colon + 1, equals - colon - 1),
-                          argument.substr(equals + 1)};
-    if (source.package.empty() || source.name.empty() || source.path.empty()) return std::nullopt;
-    return source;
-}
-
 int run_config_build(const std::vector<part_source>& sources, const config_build_options& options,
                      std::ostream& err) {
-    const std::string problem = build(sources, options);
+    const std::string problem = build(sources, options, err);
     if (problem.empty()) return 0;
     err << "kivtool: " << problem << '\n';
     return 1;

@@ -30,12 +30,18 @@ constexpr struct {
     {"kiv.system_logging", "LogMessage", empty<kiv::system_logging::LogMessage>},
 };
 
-}  // namespace
-
-std::string known_payload_text(const kiv::Event& event) {
-    const auto* const kind = std::ranges::find_if(known_kinds, [&event](const auto& each) {
+const auto* find_kind(const kiv::Event& event) {
+    return std::ranges::find_if(known_kinds, [&event](const auto& each) {
         return each.package == event.package() && each.name == event.name();
     });
+}
+
+}  // namespace
+
+bool is_of_known_kind(const kiv::Event& event) { return find_kind(event) != std::end(known_kinds); }
+
+std::string known_payload_text(const kiv::Event& event) {
+    const auto* const kind = find_kind(event);
     if (kind == std::end(known_kinds)) return "";
     const std::unique_ptr<Message> message(kind->message().New());
     if (!message->ParseFromString(event.payload())) return "";

@@ -2,7 +2,6 @@
 
 #include <google/protobuf/descriptor.h>
 #include <google/protobuf/io/tokenizer.h>
-#include <google/protobuf/text_format.h>
 
 #include <memory>
 #include <vector>
@@ -107,17 +106,17 @@ const Message* daemon_part_type(std::string_view package, std::string_view name)
     return nullptr;
 }
 
-std::string encode_part(const Message& type, const std::string& text, std::string& payload) {
+std::string encode_part(const Message& type, const std::string& text, std::string& payload,
+                        TextFormat::ParseInfoTree& places) {
     const std::unique_ptr<Message> message(type.New());
     first_error error;
-    TextFormat::ParseInfoTree locations;
     TextFormat::Parser parser;
     parser.RecordErrorsTo(&error);
-    parser.WriteLocationsTo(&locations);
+    parser.WriteLocationsTo(&places);
     parser.AllowPartialMessage(true);  // the parser itself cannot say where a field is missing
     if (!parser.ParseFromString(text, message.get())) return error.text;
     payload = message->SerializePartialAsString();
-    return find_incomplete(*message, &locations, {0, 0});
+    return find_incomplete(*message, &places, {0, 0});
 }
 
 std::string decode_part(const Message& type, const std::string& payload, std::string& text) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <google/protobuf/message.h>
+#include <google/protobuf/text_format.h>
 
 #include <string>
 #include <string_view>
@@ -12,10 +13,11 @@ namespace kivd {
 [[nodiscard]] const google::protobuf::Message* daemon_part_type(std::string_view package,
                                                                 std::string_view name);
 
-// Encodes `text`. Gives what is wrong as "LINE:COLUMN: reason", both counted from 1, empty when
-// `payload` has been made.
+// Encodes `text`; `places` gets where its fields are. Gives what is wrong as "LINE:COLUMN: reason",
+// both counted from 1, empty when `payload` has been made.
 [[nodiscard]] std::string encode_part(const google::protobuf::Message& type,
-                                      const std::string& text, std::string& payload);
+                                      const std::string& text, std::string& payload,
+                                      google::protobuf::TextFormat::ParseInfoTree& places);
 
 // The other way; every line of `text` is indented. Gives what is wrong as the end of a sentence
 // about the part, empty when all is well; `text` then holds what could be read.

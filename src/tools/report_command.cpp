@@ -1,57 +1,108 @@
 #include "tools/report_command.h"
 
 #include <exception>
+#include <memory>
 
 #include "tools/keys.h"
-#include "tools/report_printer.h"
+#include "tools/progress_line.h"
+#include "tools/report_csv.h"
+#include "tools/report_json.h"
+#include "tools/report_paths.h"
 #include "tools/report_reader.h"
 #include "tools/report_summary.h"
-#include "tools/sealed_report.h"
+#include "tools/report_text.h"
 #include "tools/text_escape.h"
 
 namespace kivd {
 namespace {
 
-void print_report(std::ostream& out, const std::string& path, const report_file& file,
-                  report_view view) {
-    switch (view) {
-        case report_view::text:
-            return print_text(out, path, file.report);
-        case report_view::json:
-            return print_json(out, file.report);
-        case report_view::summary:
-            return print_summary(out, path, file);
+std::unique_ptr<report_view> make_view(const report_options& options, std::ostream& out) {
+    switch (options.format) {
+        case report_format::text:
+            return make_text_view(out);
+        case report_format::json:
+            return make_json_view(out);
+        case report_format::jsonl:
+            return make_json_lines_view(out);
+        case report_format::csv:
+            return make_csv_view(out);
+        case report_format::summary:
+            return make_summary_view(out, options.plot_path);
     }
+    return nullptr;
 }
 
-// Puts the report that is sealed in `file` in its place. Gives what is wrong, empty when it is
-// open.
-std::string unseal(report_file& file, EVP_PKEY* key) {
-    if (!key) return "the report is sealed, give the private key that opens it with --key";
-    std::string content;
-    std::string problem = open_sealed(file.report, *key, content);
-    if (!problem.empty()) return problem;
-    file = {};  // before what it holds is in memory once more
-    file = read_report_bytes(content, "the sealed data");
-    return is_sealed(file.report) ? "the report is sealed twice" : "";
-}
+// Shows files one after the other and keeps what was wrong.
+class report_shower {
+ public:
+    report_shower(report_view& view, EVP_PKEY* key, const report_options& options,
+                  std::ostream& out, std::ostream& err)
+        : view_(view),
+          key_(key),
+          out_(out),
+          err_(err),
+          progress_(options.show_progress ? &err : nullptr) {}
 
-// Gives what is wrong with the file, empty when all is well.
-std::string show_report(const std::string& path, report_view view, EVP_PKEY* key, bool is_first,
-                        std::ostream& out) {
-    report_file file = read_report(path);
-    std::string seal_problem;
-    if (is_sealed(file.report)) {
-        seal_problem = file.problem;
-        const std::string problem = unseal(file, key);
-        if (!problem.empty()) return problem + (seal_problem.empty() ? "" : "; " + seal_problem);
+    void expect(size_t files) { files_ += files; }
+
+    void show(const std::string& path) {
+        std::string problem;
+        try {
+            problem = show_records(path);
+        } catch (const std::exception& error) {
+            problem = error.what();
+        }
+        ++files_done_;
+        tell(path, problem);
     }
-    if (file.data_size > 0) {
-        if (!is_first && view != report_view::json) out << '\n';
-        print_report(out, path, file, view);
+
+    void finish() {
+        progress_.clear();
+        const std::string problem = view_.finish();
+        out_.flush();
+        if (problem.empty()) return;
+        err_ << "kivtool: " << problem << '\n';
+        status_ = 1;
     }
-    return file.problem.empty() ? seal_problem : file.problem;
-}
+
+    void tell(const std::string& path, const std::string& problem) {
+        if (problem.empty()) return;
+        progress_.clear();
+        out_.flush();  // what could be read stands before what went wrong
+        err_ << "kivtool: " << printable(path) << ": " << problem << '\n';
+        status_ = 1;
+    }
+
+    [[nodiscard]] int status() const { return status_; }
+
+ private:
+    std::string show_records(const std::string& path) {
+        report_reader reader(path, key_);
+        bool is_started = false;
+        while (const report_record* record = reader.next()) {
+            if (!is_started) view_.start_file(path);
+            is_started = true;
+            view_.add(*record);
+            progress_.show(files_done_, files_, ++records_);
+            if (!out_) return "";  // the rest would be lost too
+        }
+        if (!is_started) return reader.problem();
+        progress_.clear();
+        const std::string problem = view_.finish_file(reader);
+        if (reader.problem().empty()) return problem;
+        return reader.problem() + (problem.empty() ? "" : "; " + problem);
+    }
+
+    report_view& view_;
+    EVP_PKEY* key_;
+    std::ostream& out_;
+    std::ostream& err_;
+    progress_line progress_;
+    size_t files_ = 0;
+    size_t files_done_ = 0;
+    uint64_t records_ = 0;
+    int status_ = 0;
+};
 
 }  // namespace
 
@@ -65,25 +116,20 @@ int run_report_command(const std::vector<std::string>& paths, const report_optio
             return 1;
         }
     }
-    int status = 0;
-    for (size_t i = 0; i < paths.size(); ++i) {
-        std::string problem;
-        try {
-            problem = show_report(paths[i], options.view, key.get(), i == 0, out);
-        } catch (const std::exception& error) {
-            problem = error.what();
-        }
-        out.flush();  // what could be read stands before what went wrong
-        if (!problem.empty()) {
-            err << "kivtool: " << printable(paths[i]) << ": " << problem << '\n';
-            status = 1;
-        }
+    const std::unique_ptr<report_view> view = make_view(options, out);
+    report_shower shower(*view, key.get(), options, out, err);
+    const std::vector<report_paths> all(paths.begin(), paths.end());
+    for (const report_paths& each : all) shower.expect(each.size());
+    for (size_t i = 0; i < all.size(); ++i) {
+        for (size_t k = 0; out && k < all[i].size(); ++k) shower.show(all[i].path(k));
+        shower.tell(paths[i], all[i].problem());
     }
+    shower.finish();
     if (!out) {
         err << "kivtool: the output could not be written\n";
         return 1;
     }
-    return status;
+    return shower.status();
 }
 
 }  // namespace kivd

@@ -8,16 +8,21 @@
 
 namespace kivd {
 
-enum class report_view { text, json, summary };
+enum class report_format { text, json, jsonl, csv, summary };
 
 struct report_options {
-    report_view view = report_view::text;
+    report_format format = report_format::text;
     // Of the private key that opens sealed reports.
     std::optional<std::string> key_path = std::nullopt;
+    // Of a picture to draw; for summaries.
+    std::optional<std::string> plot_path = std::nullopt;
+    // `err` is a terminal on which to show how far the reading is.
+    bool show_progress = false;
 };
 
 // Prints each file to `out`, as far as it can be read, and what is wrong with it, a sentence each,
-// to `err`. Gives the exit status: 0 when all was well, 1 when something was not.
+// to `err`; of a directory, all reports in the order of their numbers. Takes bounded memory. Gives
+// the exit status: 0 when all was well, 1 when something was not.
 [[nodiscard]] int run_report_command(const std::vector<std::string>& paths,
                                      const report_options& options, std::ostream& out,
                                      std::ostream& err);

@@ -1,9 +1,15 @@
-// Reading a report file record by record, so that what is wrong with it can be said and located.
-// A record is one field of kiv.Report: a key byte, the length, the content.
+// Reading a report file record by record, so that a file of any size takes little memory and what
+// is wrong with it can be said and located. A record is one field of kiv.Report: a key byte, the
+// length, the content.
 #pragma once
 
+#include <google/protobuf/message.h>
+#include <openssl/evp.h>
+
+#include <array>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <string_view>
 
@@ -15,23 +21,64 @@ namespace kivd {
 // amount of data.
 struct reading_limits {
     uint64_t data_size = uint64_t{1} << 30;  // bytes, decompressed
-    size_t memory_size = size_t{256} << 20;  // bytes that the decoded records take
-    size_t message_size = size_t{1} << 20;   // bytes of one record; keys and ciphertext excepted
+    size_t message_size = size_t{1} << 20;   // bytes of a record that is a message
+    size_t bytes_size = size_t{256} << 20;   // and of one that is not, such as ciphertext
 };
 
-struct report_file {
-    kiv::Report report;   // of all whole records; its header may be missing
-    std::string problem;  // why reading stopped, as the end of a sentence; empty at a good end
-    bool is_gzip = false;
-    uint64_t file_size = 0;  // bytes of the file that were used
-    uint64_t data_size = 0;  // bytes of all whole records
+struct report_record {
+    const google::protobuf::FieldDescriptor* field;  // of kiv.Report
+    const google::protobuf::Message* message;        // null when the field holds bytes
+    std::string_view bytes;                          // the whole record
 };
 
-[[nodiscard]] report_file read_report(const std::string& path, const reading_limits& limits = {});
+// The message of a record whose field is known to hold such.
+template <class message>
+const message& get(const report_record& record) {
+    return static_cast<const message&>(*record.message);
+}
 
-// The same for the content of a file, less than 4 GiB. `place` is what problems call it, such as
-// "the sealed data".
-[[nodiscard]] report_file read_report_bytes(std::string_view content, const char* place,
-                                            const reading_limits& limits = {});
+class report_layer;
+
+class report_reader {
+ public:
+    // `key` opens sealed reports; null: they stay closed.
+    report_reader(const std::string& path, EVP_PKEY* key, const reading_limits& limits = {});
+    ~report_reader();
+    report_reader(const report_reader&) = delete;
+    report_reader& operator=(const report_reader&) = delete;
+
+    // The next whole record, null at the end. It is there until the next call. Those of a sealed
+    // report are what was sealed; the empty header before the seal is left out.
+    [[nodiscard]] const report_record* next();
+
+    // At the end: why there was no more, as the end of a sentence; empty at a good end.
+    [[nodiscard]] const std::string& problem() const { return problem_; }
+    // What follows is about the sealed data in a report that was opened.
+    [[nodiscard]] bool is_gzip() const { return is_gzip_; }
+    [[nodiscard]] uint64_t file_size() const { return file_size_; }  // bytes that were used
+    [[nodiscard]] uint64_t data_size() const { return data_size_; }  // bytes of all whole records
+
+ private:
+    static constexpr int fields = 16;  // what a key byte has room for
+
+    bool decode(size_t head_size);
+    bool stands_before_seal();
+    void end_layer();
+    bool open_seal();
+
+    reading_limits limits_;
+    EVP_PKEY* key_;
+    std::unique_ptr<report_layer> layer_;
+    std::array<std::unique_ptr<google::protobuf::Message>, fields> messages_;  // used again
+    report_record record_{};
+    kiv::Report seal_;     // what is needed to open it, as far as it has been read
+    std::string content_;  // of the seal that was opened
+    bool in_seal_ = false;
+    std::string seal_problem_;
+    std::string problem_;
+    bool is_gzip_ = false;
+    uint64_t file_size_ = 0;
+    uint64_t data_size_ = 0;
+};
 
 }  // namespace kivd

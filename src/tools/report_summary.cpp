@@ -2,15 +2,19 @@
 
 #include <algorithm>
 #include <cstdio>
-#include <ctime>
+#include <functional>
 #include <iomanip>
-#include <limits>
-#include <map>
-#include <utility>
+#include <span>
+#include <string_view>
+#include <tuple>
 #include <vector>
 
+#include "tools/event_plot.h"
 #include "tools/known_payload.h"
+#include "tools/report_tally.h"
 #include "tools/text_escape.h"
+#include "tools/time_text.h"
+#include "tools/whole_file.h"
 
 namespace kivd {
 namespace {
@@ -18,40 +22,35 @@ namespace {
 constexpr size_t event_rows = 10;
 constexpr size_t counter_rows = 10;
 constexpr size_t message_rows = 10;
-constexpr size_t value_characters = 60;
 
-struct event_kind {
-    std::string probe;
-    size_t count = 0;
-    size_t payload_size = 0;
-    int64_t last = std::numeric_limits<int64_t>::min();
+// A probe and what is kept for it.
+template <class value>
+struct table_row {
+    std::string_view package, name;
+    const value* kept;
+
+    [[nodiscard]] std::string probe() const { return printable(package) + " " + printable(name); }
 };
 
-struct time_span {
-    int64_t first = std::numeric_limits<int64_t>::max();
-    int64_t last = std::numeric_limits<int64_t>::min();
-
-    void add(int64_t time) {
-        first = std::min(first, time);
-        last = std::max(last, time);
-    }
-    [[nodiscard]] bool empty() const { return first > last; }
-};
-
-template <class part>
-std::string probe_name(const part& probe) {
-    return printable(probe.package()) + " " + printable(probe.name());
+// The rows of a table by package and name.
+template <class value>
+std::vector<table_row<value>> rows_of(const probe_table<value>& table) {
+    std::vector<table_row<value>> rows;
+    rows.reserve(table.size());
+    table.for_each([&rows](auto package, auto name, const value& kept) {
+        rows.push_back({package, name, &kept});
+    });
+    std::ranges::sort(rows, [](const auto& a, const auto& b) {
+        return std::tie(a.package, a.name) < std::tie(b.package, b.name);
+    });
+    return rows;
 }
 
-std::string time_text(int64_t ms) {
-    constexpr int64_t end_of_year_9999_ms = 253402300800000;
-    if (ms < 0 || ms >= end_of_year_9999_ms) return std::to_string(ms) + " ms";
-    const auto seconds = static_cast<time_t>(ms / 1000);
-    tm utc{};
-    char text[32];
-    gmtime_r(&seconds, &utc);
-    strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", &utc);
-    return text;
+// Those with the largest `member` first.
+template <class value>
+void sort_by(std::vector<table_row<value>>& rows, auto member) {
+    std::ranges::stable_sort(rows, std::greater{},
+                             [member](const auto& row) { return row.kept->*member; });
 }
 
 std::string offset_text(int32_t seconds) {
@@ -98,44 +97,25 @@ void print_identity(std::ostream& out, const kiv::Header& header) {
     if (header.has_timezone()) print_fact(out, "local time", offset_text(header.timezone()));
 }
 
-time_span span_of(const kiv::Report& report) {
-    time_span span;
-    for (const kiv::Event& event : report.events()) span.add(event.timestamp());
-    for (const kiv::Counter& counter : report.counters()) span.add(counter.to_timestamp());
-    for (const kiv::StaticData& item : report.statics()) span.add(item.timestamp());
-    return span;
-}
-
-void print_contents(std::ostream& out, const report_file& file) {
-    const kiv::Report& report = file.report;
-    const time_span span = span_of(report);
+void print_contents(std::ostream& out, const report_tally& tally) {
+    const time_span& span = tally.span;
     if (!span.empty()) {
         print_fact(out, "time (UTC)",
                    time_text(span.first) + " to " + time_text(span.last) + ", " +
                        duration_text(span.first, span.last));
     }
     print_fact(out, "contents",
-               std::to_string(report.events_size()) + " events, " +
-                   std::to_string(report.counters_size()) + " counters, " +
-                   std::to_string(report.statics_size()) + " static values");
-    print_fact(out, "size",
-               std::to_string(file.data_size) + " bytes" +
-                   (file.is_gzip ? ", " + std::to_string(file.file_size) + " compressed" : ""));
-}
-
-std::vector<event_kind> events_by_kind(const kiv::Report& report) {
-    std::map<std::pair<std::string, std::string>, event_kind> found;
-    for (const kiv::Event& event : report.events()) {
-        event_kind& kind = found[{event.package(), event.name()}];
-        if (kind.count++ == 0) kind.probe = probe_name(event);
-        kind.payload_size += event.payload().size();
-        kind.last = std::max(kind.last, event.timestamp());
+               std::to_string(tally.events) + " events, " + std::to_string(tally.counters) +
+                   " counters, " + std::to_string(tally.statics) + " static values");
+    print_fact(
+        out, "size",
+        std::to_string(tally.data_size) + " bytes" +
+            (tally.file_size > 0 ? ", " + std::to_string(tally.file_size) + " compressed" : ""));
+    if (tally.unlisted > 0) {
+        print_fact(out, "note",
+                   std::to_string(tally.unlisted) + " records are of probes beyond the first " +
+                       std::to_string(max_table_probes) + " and are not listed");
     }
-    std::vector<event_kind> kinds;
-    kinds.reserve(found.size());
-    for (auto& [id, kind] : found) kinds.push_back(std::move(kind));
-    std::ranges::stable_sort(kinds, std::greater{}, &event_kind::count);
-    return kinds;
 }
 
 // "events (10 of 14)", as the head of a list that shows `shown`.
@@ -145,80 +125,133 @@ void print_head(std::ostream& out, const char* what, size_t shown, size_t all) {
     out << '\n';
 }
 
-void print_events(std::ostream& out, const kiv::Report& report) {
-    const std::vector<event_kind> kinds = events_by_kind(report);
-    if (kinds.empty()) return;
-    const size_t shown = std::min(kinds.size(), event_rows);
-    print_head(out, "events by probe: number, probe, payload, latest", shown, kinds.size());
-    for (size_t i = 0; i < shown; ++i) {
-        out << std::right << std::setw(12) << kinds[i].count << "  " << std::left << std::setw(40)
-            << kinds[i].probe << "  " << kinds[i].payload_size << " bytes, "
-            << time_text(kinds[i].last) << '\n';
+void print_events(std::ostream& out, const report_tally& tally) {
+    auto rows = rows_of(tally.by_event);
+    if (rows.empty()) return;
+    sort_by(rows, &event_tally::count);
+    const size_t shown = std::min(rows.size(), event_rows);
+    print_head(out, "events by probe: number, probe, payload, latest", shown, rows.size());
+    for (const auto& row : std::span(rows).first(shown)) {
+        out << std::right << std::setw(12) << row.kept->count << "  " << std::left << std::setw(40)
+            << row.probe() << "  " << row.kept->payload_size << " bytes, "
+            << time_text(row.kept->last) << '\n';
     }
 }
 
 // The latest events whose payload is a known message, in the order of the file.
-void print_messages(std::ostream& out, const kiv::Report& report) {
+void print_messages(std::ostream& out, const report_tally& tally) {
     std::vector<std::string> lines;
-    for (int i = report.events_size() - 1; i >= 0 && lines.size() < message_rows; --i) {
-        const kiv::Event& event = report.events(i);
-        const std::string text = known_payload_text(event);
-        if (!text.empty()) lines.push_back(time_text(event.timestamp()) + "  " + printable(text));
+    const auto& messages = tally.messages;
+    for (auto event = messages.rbegin(); event != messages.rend(); ++event) {
+        const std::string text = known_payload_text(*event);
+        if (!text.empty()) lines.push_back(time_text(event->timestamp()) + "  " + printable(text));
+        if (lines.size() == message_rows) break;
     }
     if (lines.empty()) return;
     out << "\n  latest messages: time, message\n";
     for (auto line = lines.rbegin(); line != lines.rend(); ++line) out << "    " << *line << '\n';
 }
 
-using counter_list = std::vector<const kiv::Counter*>;
+using counter_list = std::vector<table_row<latest_counter>>;
 
 void print_counter_list(std::ostream& out, const char* what, const counter_list& counters,
                         size_t shown) {
     print_head(out, what, shown, counters.size());
-    for (size_t i = 0; i < shown; ++i) {
-        out << std::right << std::setw(22) << counters[i]->value() << "  " << std::left
-            << std::setw(40) << probe_name(*counters[i]) << "  "
-            << time_text(counters[i]->to_timestamp()) << '\n';
+    for (const auto& row : std::span(counters).first(shown)) {
+        out << std::right << std::setw(22) << row.kept->value << "  " << std::left << std::setw(40)
+            << row.probe() << "  " << time_text(row.kept->time) << '\n';
     }
 }
 
-void print_counters(std::ostream& out, const kiv::Report& report) {
-    counter_list counters;
-    counters.reserve(static_cast<size_t>(report.counters_size()));
-    for (const kiv::Counter& counter : report.counters()) counters.push_back(&counter);
+void print_counters(std::ostream& out, const report_tally& tally) {
+    counter_list counters = rows_of(tally.by_counter);
     if (counters.empty()) return;
-    std::ranges::stable_sort(counters, std::greater{}, &kiv::Counter::value);
+    sort_by(counters, &latest_counter::value);
     if (counters.size() <= counter_rows) {
         print_counter_list(out, "counters: value, probe, latest change", counters, counters.size());
         return;
     }
     print_counter_list(out, "largest counters: value, probe, latest change", counters,
                        counter_rows / 2);
-    std::ranges::stable_sort(counters, std::greater{}, &kiv::Counter::to_timestamp);
+    sort_by(counters, &latest_counter::time);
     print_counter_list(out, "latest counters: value, probe, latest change", counters,
                        counter_rows / 2);
 }
 
-void print_static_data(std::ostream& out, const kiv::Report& report) {
-    if (report.statics_size() == 0) return;
+// In the order in which they came.
+void print_static_data(std::ostream& out, const report_tally& tally) {
+    auto rows = rows_of(tally.by_static);
+    if (rows.empty()) return;
+    std::ranges::sort(rows, std::less{}, [](const auto& row) { return row.kept->rank; });
     print_head(out, "static data: probe, value", 0, 0);
-    for (const kiv::StaticData& item : report.statics()) {
-        out << "    " << std::left << std::setw(40) << probe_name(item) << "  "
-            << printable(item.value(), value_characters) << '\n';
+    for (const auto& row : rows) {
+        out << "    " << std::left << std::setw(40) << row.probe() << "  " << row.kept->value
+            << '\n';
     }
 }
 
+void print_tables(std::ostream& out, const report_tally& tally) {
+    print_contents(out, tally);
+    print_events(out, tally);
+    print_messages(out, tally);
+    print_counters(out, tally);
+    print_static_data(out, tally);
+}
+
+class summary_view : public report_view {
+ public:
+    summary_view(std::ostream& out, const std::optional<std::string>& plot_path)
+        : out_(out), plot_path_(plot_path) {}
+
+    void start_file(const std::string& path) override {
+        path_ = path;
+        file_ = {};
+    }
+
+    void add(const report_record& record) override {
+        file_.add(record);
+        if (plot_path_ && record.field->number() == kiv::Report::kEventsFieldNumber) {
+            plot_.add(get<kiv::Event>(record));
+        }
+    }
+
+    std::string finish_file(const report_reader& file) override {
+        file_.data_size = file.data_size();
+        if (file.is_gzip()) file_.file_size = file.file_size();
+        if (files_++ > 0) out_ << '\n';
+        out_ << printable(path_) << '\n';
+        if (!file_.has_header) print_fact(out_, "note", "no header, as in diagnostics files");
+        print_identity(out_, file_.header);
+        print_tables(out_, file_);
+        total_.add(file_);
+        return "";
+    }
+
+    std::string finish() override {
+        if (files_ > 1) {
+            out_ << "\ntotal of " << files_ << " files\n";
+            print_tables(out_, total_);
+        }
+        if (!plot_path_) return "";
+        const std::string problem = replace_file(*plot_path_, plot_.svg());
+        return problem.empty() ? "" : printable(*plot_path_) + ": " + problem;
+    }
+
+ private:
+    std::ostream& out_;
+    std::optional<std::string> plot_path_;
+    std::string path_;
+    report_tally file_;
+    report_tally total_;
+    size_t files_ = 0;
+    event_plot plot_;
+};
+
 }  // namespace
 
-void print_summary(std::ostream& out, const std::string& path, const report_file& file) {
-    out << printable(path) << '\n';
-    if (!file.report.has_header()) print_fact(out, "note", "no header, as in diagnostics files");
-    print_identity(out, file.report.header());
-    print_contents(out, file);
-    print_events(out, file.report);
-    print_messages(out, file.report);
-    print_counters(out, file.report);
-    print_static_data(out, file.report);
+std::unique_ptr<report_view> make_summary_view(std::ostream& out,
+                                               const std::optional<std::string>& plot_path) {
+    return std::make_unique<summary_view>(out, plot_path);
 }
 
 }  // namespace kivd

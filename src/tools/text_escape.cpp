@@ -1,5 +1,6 @@
 #include "tools/text_escape.h"
 
+#include <algorithm>
 #include <cstdint>
 
 namespace kivd {
@@ -53,9 +54,25 @@ void append_hex(std::string& to, std::string_view bytes) {
     }
 }
 
+// How much of the start of `text` is characters that nothing is ever done to.
+size_t plain_length(std::string_view text) {
+    size_t length = 0;
+    while (length < text.size() && byte_at(text, length) >= 0x20 && byte_at(text, length) < 0x7f &&
+           text[length] != '\\') {
+        ++length;
+    }
+    return length;
+}
+
 std::string escape(std::string_view text, bool controls_too, size_t max_characters) {
     std::string escaped;
+    escaped.reserve(text.size());
     for (size_t characters = 0; !text.empty(); ++characters) {
+        const size_t plain = std::min(plain_length(text), max_characters - characters);
+        escaped += text.substr(0, plain);
+        text.remove_prefix(plain);
+        characters += plain;
+        if (text.empty()) break;
         if (characters == max_characters) return escaped + "...";
         const size_t length = utf8_length(text);
         const std::string_view character = text.substr(0, length == 0 ? 1 : length);

@@ -10,7 +10,8 @@ namespace {
 
 class report_command : public report_files {};
 
-constexpr report_view views[] = {report_view::text, report_view::json, report_view::summary};
+constexpr report_format formats[] = {report_format::text, report_format::json, report_format::jsonl,
+                                     report_format::csv, report_format::summary};
 
 TEST_F(report_command, shows_every_file_it_can_and_tells_what_is_wrong_with_the_others) {
     const std::string records = records_of(header_text + event_text("shown"));
@@ -21,24 +22,27 @@ TEST_F(report_command, shows_every_file_it_can_and_tells_what_is_wrong_with_the_
                             " device_id: '' } encryption_key: 'k' encryption_iv: 'i'"
                             " encrypted_compressed_data: 'secret'"));
     const std::string missing = directory / "kiv_3";
+    const std::string empty = directory / "empty";
+    std::filesystem::create_directory(empty);
 
     const std::string complaints =
         "kivtool: " + missing + ": cannot be opened: No such file or directory\n" +
         "kivtool: " + torn + ": stopped at byte " + std::to_string(records.size()) +
         ": the record there is cut short: it has 9 of its 17 bytes\n" + "kivtool: " + sealed +
-        ": the report is sealed, give the private key that opens it with --key\n";
+        ": the report is sealed, give the private key that opens it with --key\n" +
+        "kivtool: " + empty + ": is a directory without reports\n";
 
-    for (const report_view view : views) {
-        SCOPED_TRACE(static_cast<int>(view));
+    for (const report_format format : formats) {
+        SCOPED_TRACE(static_cast<int>(format));
         std::ostringstream out, err;
-        EXPECT_EQ(run_report_command({missing, torn, sealed, good}, {view}, out, err), 1);
+        EXPECT_EQ(run_report_command({missing, torn, sealed, empty, good}, {format}, out, err), 1);
         const std::string text = out.str();
         EXPECT_NE(text.find("shown"), text.rfind("shown")) << text;  // in both files
         EXPECT_EQ(text.find("torn"), std::string::npos) << text;
         EXPECT_EQ(err.str(), complaints);
 
         std::ostringstream good_err;
-        EXPECT_EQ(run_report_command({good}, {view}, out, good_err), 0) << good_err.str();
+        EXPECT_EQ(run_report_command({good}, {format}, out, good_err), 0) << good_err.str();
     }
 }
 
@@ -66,9 +70,9 @@ TEST_F(report_command, shows_files_without_a_header_and_the_messages_in_them) {
     for (const std::string& bytes : {messages + others, gzip(messages + others)}) {
         const std::string whole = write("qz_1", bytes);
         std::ostringstream text, json, summary, err;
-        EXPECT_EQ(run_report_command({whole}, {report_view::text}, text, err), 0);
-        EXPECT_EQ(run_report_command({whole}, {report_view::json}, json, err), 0);
-        EXPECT_EQ(run_report_command({whole}, {report_view::summary}, summary, err), 0);
+        EXPECT_EQ(run_report_command({whole}, {report_format::text}, text, err), 0);
+        EXPECT_EQ(run_report_command({whole}, {report_format::json}, json, err), 0);
+        EXPECT_EQ(run_report_command({whole}, {report_format::summary}, summary, err), 0);
         EXPECT_EQ(err.str(), "");
         EXPECT_EQ(records_of(text.str()), messages + others);  // with the comments
         for (const std::string& line : shown) {
@@ -89,7 +93,7 @@ TEST_F(report_command, shows_files_without_a_header_and_the_messages_in_them) {
     }
     const std::string torn = write("qz_2", messages + others.substr(0, 9));
     std::ostringstream out, err;
-    EXPECT_EQ(run_report_command({torn}, {report_view::text}, out, err), 1);
+    EXPECT_EQ(run_report_command({torn}, {report_format::text}, out, err), 1);
     EXPECT_EQ(records_of(out.str()), messages);
     EXPECT_NE(err.str().find("stopped at byte " + std::to_string(messages.size())),
               std::string::npos)
@@ -98,10 +102,10 @@ TEST_F(report_command, shows_files_without_a_header_and_the_messages_in_them) {
 
 TEST_F(report_command, tells_when_its_output_is_lost) {
     const std::string good = write("kiv_1", records_of(header_text));
-    for (const report_view view : views) {
+    for (const report_format format : formats) {
         std::ofstream full("/dev/full");
         std::ostringstream err;
-        EXPECT_EQ(run_report_command({good}, {view}, full, err), 1);
+        EXPECT_EQ(run_report_command({good}, {format}, full, err), 1);
         EXPECT_EQ(err.str(), "kivtool: the output could not be written\n");
     }
 }
@@ -151,18 +155,19 @@ TEST_F(sealed_reports, are_shown_as_plain_ones_are_with_the_key_that_opens_them)
     const std::string content = gzip(records_of(header_text + event_text("shown")));
     const std::string plain = write("kiv_1", content);
     std::vector<std::string> shown;
-    for (const report_view view : views) {
+    for (const report_format format : formats) {
         std::ostringstream out, err;
-        EXPECT_EQ(run_report_command({plain}, {view}, out, err), 0);
+        EXPECT_EQ(run_report_command({plain}, {format}, out, err), 0);
         shown.push_back(out.str());
     }
     write("kiv_1", seal(content).bytes());
-    const report_options options = {report_view::text, directory / "key.pem"};
-    for (const report_view view : views) {
-        SCOPED_TRACE(static_cast<int>(view));
+    const report_options options = {report_format::text, directory / "key.pem"};
+    for (const report_format format : formats) {
+        SCOPED_TRACE(static_cast<int>(format));
         std::ostringstream out, err;
-        EXPECT_EQ(run_report_command({plain}, {view, options.key_path}, out, err), 0) << err.str();
-        EXPECT_EQ(out.str(), shown[static_cast<size_t>(view)]);
+        EXPECT_EQ(run_report_command({plain}, {format, options.key_path}, out, err), 0)
+            << err.str();
+        EXPECT_EQ(out.str(), shown[static_cast<size_t>(format)]);
     }
 
     // What is torn or follows is told all the same.
@@ -217,9 +222,9 @@ TEST_F(sealed_reports, that_do_not_open_are_told_and_the_next_is_shown) {
         const std::string first = write("kiv_1", bad.bad.bytes());
         const std::string second = write("kiv_2", content);
         std::ostringstream out, err;
-        EXPECT_EQ(
-            run_report_command({first, second}, {report_view::text, directory / bad.key}, out, err),
-            1);
+        EXPECT_EQ(run_report_command({first, second}, {report_format::text, directory / bad.key},
+                                     out, err),
+                  1);
         EXPECT_TRUE(err.str().starts_with("kivtool: " + first + ": ")) << err.str();
         EXPECT_NE(err.str().find(bad.problem), std::string::npos) << err.str();
         EXPECT_NE(out.str().find("# " + second), std::string::npos) << out.str();
@@ -228,7 +233,7 @@ TEST_F(sealed_reports, that_do_not_open_are_told_and_the_next_is_shown) {
     for (const char* key : {"none.pem", "key.pub.pem"}) {
         std::ostringstream out, err;
         const std::string path = directory / key;
-        EXPECT_EQ(run_report_command({"kiv_1"}, {report_view::text, path}, out, err), 1);
+        EXPECT_EQ(run_report_command({"kiv_1"}, {report_format::text, path}, out, err), 1);
         EXPECT_TRUE(err.str().starts_with("kivtool: " + path + ": ")) << err.str();
     }
 }

@@ -1,0 +1,28 @@
+// The report files that a command line names.
+#pragma once
+
+#include <string>
+#include <vector>
+
+namespace kivd {
+
+// A file, or the reports kiv_N of a directory, in the order of their numbers. They are named one by
+// one, since there may be a great many.
+class report_paths {
+ public:
+    // A directory that cannot be read, or has no reports in it, leaves a problem.
+    explicit report_paths(const std::string& path);
+
+    [[nodiscard]] size_t size() const { return is_directory_ ? numbers_.size() : 1; }
+    [[nodiscard]] std::string path(size_t index) const;
+    // As the end of a sentence about the path; empty when all is well.
+    [[nodiscard]] const std::string& problem() const { return problem_; }
+
+ private:
+    std::string path_;  // with a final "/" when it is a directory
+    bool is_directory_ = false;
+    std::vector<int64_t> numbers_;
+    std::string problem_;
+};
+
+}  // namespace kivd

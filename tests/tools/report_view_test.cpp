@@ -1,0 +1,271 @@
+#include "tools/report_view.h"
+
+#include <google/protobuf/util/json_util.h>
+
+#include <set>
+#include <sstream>
+
+#include "outside_tools.h"
+#include "sample_reports.h"
+#include "support/scratch_directory.h"
+#include "tools/report_command.h"
+
+namespace kivd {
+namespace {
+
+using namespace std::string_literals;
+
+using path_list = std::vector<std::string>;
+
+class report_views : public report_files {
+ protected:
+    // What is shown of files, all of them sound.
+    static std::string show(const std::vector<std::string>& paths, const report_options& options) {
+        std::ostringstream out, err;
+        EXPECT_EQ(run_report_command(paths, options, out, err), 0);
+        EXPECT_EQ(err.str(), "");
+        return out.str();
+    }
+
+    std::string show_records(const std::string& records, report_format format) {
+        return show(path_list{write("kiv_7", records)}, {format});
+    }
+
+    kiv::Report through_json(const std::string& records) {
+        kiv::Report back;
+        const std::string document = show_records(records, report_format::json);
+        EXPECT_TRUE(google::protobuf::util::JsonStringToMessage(document, &back).ok()) << document;
+        return back;
+    }
+
+    // The same, from JSON objects of records.
+    kiv::Report through_lines(const std::string& records) {
+        std::string document =
+            R"({"header":{"product_id":"","software_version":"","software_variant":"",)"
+            R"("device_id":""},"events":[)";
+        std::istringstream lines(show_records(records, report_format::jsonl));
+        for (std::string line; std::getline(lines, line);) {
+            const std::string start =
+                "{\"file\":\"" + (directory / "kiv_7").string() + "\",\"kind\":\"event\",";
+            if (line.starts_with(start)) document += "{" + line.substr(start.size()) + ",";
+        }
+        kiv::Report back;
+        document.back() = ']';
+        EXPECT_TRUE(google::protobuf::util::JsonStringToMessage(document + "}", &back).ok())
+            << document;
+        return back;
+    }
+
+    const google::protobuf::LogSilencer silencer;
+};
+
+TEST_F(report_views, keep_names_apart_that_are_not_utf8) {
+    // clang-format off
+    const struct {
+        std::string name, shown;
+    } cases[] = {
+        {"a", "a"},
+        {"a\xff", "a\\xFF"},
+        {"a\xfe", "a\\xFE"},
+        {"a\\xFF", "a\\\\xFF"},
+        {"a\\\\xFF", "a\\\\\\\\xFF"},
+        {"\xffz", "\\xFFz"},
+        {"\x80", "\\x80"},
+        {"\xc0\xaf", "\\xC0\\xAF"},                    // "/" in two bytes
+        {"\xe0\x80\xaf", "\\xE0\\x80\\xAF"},           // in three
+        {"\xf0\x80\x80\xaf", "\\xF0\\x80\\x80\\xAF"},  // and in four
+        {"\xed\xa0\x80", "\\xED\\xA0\\x80"},           // a surrogate
+        {"\xed\x9f\xbf", "\xed\x9f\xbf"},              // the last character before them
+        {"\xf4\x8f\xbf\xbf", "\xf4\x8f\xbf\xbf"},      // the last character of all
+        {"\xf4\x90\x80\x80", "\\xF4\\x90\\x80\\x80"},  // and one beyond it
+        {"\xe2\x82", "\\xE2\\x82"},                    // cut
+        {"\xe2\x82z", "\\xE2\\x82z"},
+        {"\xe2\x82\xac \xc3\xa9 \xf0\x9f\x98\x80", "\xe2\x82\xac \xc3\xa9 \xf0\x9f\x98\x80"},
+        {"nul\0"s + "nul", "nul\0"s + "nul"},
+        {"\x1b[31m\"<&>", "\x1b[31m\"<&>"},
+    };
+    // clang-format on
+    kiv::Report report = report_of(header_text);
+    report.mutable_header()->add_group_id("\xff");
+    for (const auto& name : cases) {
+        *report.add_events() = report_of(event_text("")).events(0);
+        report.mutable_events()->rbegin()->set_name(name.name);
+    }
+    for (const kiv::Report& back :
+         {through_json(report.SerializeAsString()), through_lines(report.SerializeAsString())}) {
+        ASSERT_EQ(back.events_size(), std::ssize(cases));
+        std::set<std::string> names;
+        for (int i = 0; i < back.events_size(); ++i) {
+            EXPECT_EQ(back.events(i).name(), cases[i].shown);
+            EXPECT_TRUE(names.insert(back.events(i).name()).second) << cases[i].shown;
+        }
+    }
+    EXPECT_EQ(through_json(report.SerializeAsString()).header().group_id(1), "\\xFF");
+}
+
+// Records in an order that the daemon doesn't write, too.
+TEST_F(report_views, of_json_keep_every_value_and_do_without_a_header) {
+    const std::string parts[] = {event_text("n", INT64_MAX, "\\000\\377 payload"),
+                                 counter_text("n", INT64_MIN, 1), static_text("n", "one\\ntwo"),
+                                 event_text("m", 5, "4444"), counter_text("m", 7, 8)};
+    std::string records;
+    for (const std::string& part : parts) records += records_of(part);
+    const std::string trailer =
+        records_of("import_info { file_nr: 4294967295 orig_encrypted: true }");
+    const std::string header = records_of(header_text);
+    for (const std::string& bytes : {header + records, records + header + trailer,
+                                     trailer + records + header, header, trailer + header}) {
+        kiv::Report whole;
+        ASSERT_TRUE(whole.ParseFromString(bytes));
+        EXPECT_EQ(through_json(bytes).SerializeAsString(), whole.SerializeAsString());
+    }
+    EXPECT_EQ(show_records(trailer, report_format::json),
+              "{\n\"import_info\": {\"file_nr\":4294967295,\"orig_encrypted\":true}\n}\n");
+    std::ostringstream out, err;
+    const std::string two =
+        write("two", records_of(header_text) + records_of(header_text) + trailer);
+    EXPECT_EQ(run_report_command({two}, {report_format::json}, out, err), 1);
+    EXPECT_NE(err.str().find("JSON has room for one header"), std::string::npos) << err.str();
+    const std::string lines = show(path_list{two}, {report_format::jsonl});
+    EXPECT_NE(lines.find("\"test_id\""), lines.rfind("\"test_id\"")) << lines;
+}
+
+TEST_F(report_views, of_text_can_be_encoded_again) {
+    const std::string records = records_of(header_text + event_text("n\\377", 1, "\\000\\n\\376"));
+    const std::string text = show(path_list{write("a\nfile", records)}, {report_format::text});
+    EXPECT_EQ(text.substr(0, text.find('\n')), "# " + directory.string() + "/a\\x0Afile");
+    EXPECT_EQ(records_of(text), records);
+}
+
+TEST_F(report_views, of_csv_have_a_line_a_record_and_quotes_where_they_are_needed) {
+    const std::string records = records_of(
+        header_text + event_text("a,\"b\"", 1262325600007, "\\n\\377\\\\") + event_text(" ", -1) +
+        counter_text("c", -5, 253402300800000) + static_text("s", "=x, y"));
+    std::string text = show_records(records, report_format::csv);
+    const std::string file = ',' + (directory / "kiv_7").string() + '\n';
+    for (size_t at = 0; (at = text.find(file)) != std::string::npos;)
+        text.replace(at, file.size(), "|");
+    EXPECT_EQ(text,
+              "kind,time,package,name,value,payload,file\n"
+              "header,,,,\"product_id: \"\"test_id\"\" software_version: \"\"test_rev\"\" "
+              "software_variant: \"\"test_var\"\" device_id: \"\"2543c433\"\" timezone: -5400 "
+              "group_id: \"\"field-trial\"\"\",|"
+              "event,2010-01-01T06:00:00.007Z,app,\"a,\"\"b\"\"\",,\\x0A\\xFF\\\\|"
+              "event,-1 ms,app,\" \",,|"
+              "counter,253402300800000 ms,app,c,-5,|"
+              "static,1970-01-01T00:00:00.000Z,app,s,\"=x, y\",|");
+}
+
+void expect_parts(const std::string& text, const std::vector<std::string>& parts, bool present) {
+    for (const std::string& part : parts) {
+        EXPECT_EQ(text.find(part) != std::string::npos, present) << part << '\n' << text;
+    }
+}
+
+TEST_F(report_views, of_people_say_who_when_and_what) {
+    std::string report = header_text + static_text("mode", std::string(61, 'm'));
+    for (int kind = 0; kind < 12; ++kind) {
+        const std::string number = std::to_string(kind);
+        for (int i = 0; i <= kind; ++i) report += event_text("kind" + number, 1262325600000, "ab");
+        report += counter_text("count" + number, kind, 1262329500000 - kind);
+    }
+    const std::string text = show_records(gzip(records_of(report)), report_format::summary);
+    expect_parts(
+        text,
+        {"kiv_7\n", "test_id", "test_rev", "2543c433", "field-trial", "UTC-01:30",
+         "1970-01-01 00:00:00 to 2010-01-01 07:05:00", "78 events, 12 counters, 1 static values",
+         " compressed\n", "(10 of 12)", "  12  app kind11", "24 bytes, 2010-01-01 06:00:00",
+         "  11  app count11", "  0  app count0", std::string(60, 'm') + "...\n"},
+        true);
+    // The two rarest events and the counters that are neither large nor recent are left out.
+    expect_parts(text, {"app kind0", "app kind1 ", "app count5", "app count6", "total"}, false);
+}
+
+// Of a directory, reports only, in the order of their numbers.
+TEST_F(report_views, of_several_files_end_with_the_total) {
+    const auto report = [](const std::string& name, int64_t value) {
+        return gzip(records_of(header_text + event_text(name, 1262325600000 + value, "ab") +
+                               counter_text("c", value, value) + static_text("s", name)));
+    };
+    write("kiv_2", report("two", 5));
+    write("kiv_10", report("ten", 9));
+    write("kiv_1", report("two", 1));
+    for (const char* other :
+         {"kiv_", "kiv_x", "kiv_-1", "kiv_01", "kiv_1x", "kiv_disabled", "x_1"}) {
+        write(other, "no report");
+    }
+    const std::string text = show(path_list{directory}, {report_format::summary});
+    const size_t total = text.find("\ntotal of 3 files\n");
+    ASSERT_NE(total, std::string::npos) << text;
+    EXPECT_LT(text.find("kiv_1\n"), text.find("kiv_2\n"));
+    EXPECT_LT(text.find("kiv_2\n"), text.find("kiv_10\n"));
+    expect_parts(text.substr(total),
+                 {"3 events, 3 counters, 3 static values", "  2  app two",
+                  "4 bytes, 2010-01-01 06:00:00", "  9  app c", "  ten\n"},
+                 true);
+    expect_parts(text.substr(total), {"test_id", "  5  app c", "  two\n"}, false);
+}
+
+// The tables have room for so many probes; what is beyond is counted, and nothing else lost.
+TEST_F(report_views, of_people_take_bounded_room) {
+    kiv::Report report = report_of(header_text);
+    for (int i = 0; i < 50'003; ++i) {
+        *report.add_events() = report_of(event_text("e" + std::to_string(i), 1)).events(0);
+    }
+    *report.add_events() = report_of(event_text("e7", 1)).events(0);
+    expect_parts(
+        show_records(report.SerializeAsString(), report_format::summary),
+        {"50004 events", "3 records are of probes beyond", " (10 of 50000)", "  2  app e7 "}, true);
+}
+
+class pictures : public report_views {
+ protected:
+    // The picture of these events, which a reader of XML takes.
+    std::string draw(const kiv::Report& report) {
+        const std::string picture = directory / "events.svg";
+        (void)show(path_list{write("kiv_7", report.SerializePartialAsString())},
+                   {report_format::summary, {}, picture});
+        const outcome checked =
+            run("python3 -c 'import sys, xml.dom.minidom as x; x.parse(sys.argv[1])' " + picture);
+        EXPECT_EQ(checked.status, 0) << checked.output;
+        return read_file(picture);
+    }
+};
+
+TEST_F(pictures, show_the_packages_with_the_most_events_and_the_others_together) {
+    kiv::Report report;
+    const auto add = [&report](const std::string& package, int number, int64_t time) {
+        while (number-- > 0) {
+            kiv::Event& event = *report.add_events();
+            event = report_of(event_text("n", time)).events(0);
+            event.set_package(package);
+        }
+    };
+    constexpr int64_t start = 1262304000000;  // 2010-01-01
+    add("<&\"\x1b\xff\xef\xbf\xbf>", 50, start + 3 * 60'000 - 1);
+    for (int package = 0; package < 1200; ++package) add("p" + std::to_string(package), 1, start);
+    for (int package = 292; package < 299; ++package)
+        add("p" + std::to_string(package - 200), 9, start);
+    add("unset clock", 3, 1000);
+    add("unset clock", 1, INT64_MAX);
+    std::string svg = draw(report);
+    expect_parts(svg,
+                 {"&lt;&amp;&quot;\\x1B\\xFF\\xEF\\xBF\\xBF&gt; (50)", "p92 (10)", "p98 (10)",
+                  "other (1193)", ">2010-01-01<", ">00:02<", "1313 events, times in UTC;",
+                  "4 with times before"},
+                 true);
+    expect_parts(svg, {"unset clock", "p91"}, false);
+
+    // However far apart the events are, none is lost and the picture stays small.
+    report.Clear();
+    for (int64_t time = 946684800000; time < 4102444800000; time += 999'999'999) add("a", 1, time);
+    for (int64_t time = 4102444799999; time > 946684800000; time -= 999'999'999) add("b", 1, time);
+    svg = draw(report);
+    expect_parts(svg, {"a (3156)", "b (3156)", "6312 events"}, true);
+    EXPECT_LT(svg.size(), 30'000u);
+    report.Clear();
+    expect_parts(draw(report_of(header_text)), {"0 events"}, true);
+}
+
+}  // namespace
+}  // namespace kivd
