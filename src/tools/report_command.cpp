@@ -58,7 +58,7 @@ class report_shower {
 
     void finish() {
         progress_.clear();
-        const std::string problem = view_.finish();
+        std::string problem = view_.finish();
         out_.flush();
         if (problem.empty()) return;
         err_ << "kivtool: " << problem << '\n';
@@ -88,7 +88,7 @@ class report_shower {
         }
         if (!is_started) return reader.problem();
         progress_.clear();
-        const std::string problem = view_.finish_file(reader);
+        std::string problem = view_.finish_file(reader);
         if (reader.problem().empty()) return problem;
         return reader.problem() + (problem.empty() ? "" : "; " + problem);
     }
@@ -110,7 +110,7 @@ int run_report_command(const std::vector<std::string>& paths, const report_optio
                        std::ostream& out, std::ostream& err) {
     unique_pkey key;
     if (options.key_path) {
-        const std::string problem = read_key(*options.key_path, key_half::private_half, key);
+        std::string problem = read_key(*options.key_path, key_half::private_half, key);
         if (!problem.empty()) {
             err << "kivtool: " << problem << '\n';
             return 1;

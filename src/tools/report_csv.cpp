@@ -13,7 +13,7 @@ namespace kivd {
 namespace {
 
 std::string csv_time(int64_t ms) {
-    const std::string seconds = time_text(ms, "%Y-%m-%dT%H:%M:%S");
+    std::string seconds = time_text(ms, "%Y-%m-%dT%H:%M:%S");
     if (seconds.ends_with("ms")) return seconds;
     char rest[8];
     snprintf(rest, sizeof rest, ".%03dZ", static_cast<int>(ms % 1000));

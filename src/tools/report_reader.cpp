@@ -131,8 +131,8 @@ class report_layer {
     }
 
     // Where the data ends within a record, what ended the data is the reason.
-    size_t stop_cut(std::string reason) {
-        return stop(bytes_.problem().empty() ? std::move(reason) : bytes_.problem());
+    size_t stop_cut(const std::string& reason) {
+        return stop(bytes_.problem().empty() ? reason : bytes_.problem());
     }
 
     unpacked_bytes bytes_;
