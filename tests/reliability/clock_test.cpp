@@ -62,6 +62,7 @@ TEST_F(clock_steps, timed_saves_go_on_after_every_step) {
 TEST_F(clock_steps, a_jump_forward_makes_the_save_due_at_once) {
     daemon_process daemon = start({{"-C", "-s", "86400"}});
     request({"CI p before 1"});
+    EXPECT_TRUE(daemon.wait_idle());
     set_clock(year);
     request({"CI p after 1"});
     EXPECT_TRUE(wait_until([] { return is_saved("after"); }));
