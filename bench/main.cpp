@@ -30,12 +30,13 @@ struct section {
     void (*measure)(const setup&);
 };
 constexpr section sections[] = {
-    {"events", measure_events},     {"large_events", measure_large_events},
-    {"counters", measure_counters}, {"flush", measure_flush},
-    {"save", measure_save},         {"compaction", measure_compaction},
-    {"filters", measure_filters},   {"intake", measure_intake},
-    {"sealing", measure_sealing},   {"latency", measure_latency},
-    {"client", measure_client},     {"footprint", measure_footprint},
+    {"events", measure_events},       {"large_events", measure_large_events},
+    {"counters", measure_counters},   {"flush", measure_flush},
+    {"save", measure_save},           {"compaction", measure_compaction},
+    {"filters", measure_filters},     {"intake", measure_intake},
+    {"sealing", measure_sealing},     {"growth", measure_growth},
+    {"latency", measure_latency},     {"client", measure_client},
+    {"footprint", measure_footprint},
 };
 
 int print_usage() {

@@ -15,6 +15,7 @@ void measure_compaction(const setup& s);
 void measure_filters(const setup& s);
 void measure_intake(const setup& s);
 void measure_sealing(const setup& s);
+void measure_growth(const setup& s);
 void measure_latency(const setup& s);
 void measure_client(const setup& s);
 void measure_footprint(const setup& s);
