@@ -21,6 +21,7 @@ static_assert(std::atomic<int>::is_always_lock_free, "the signal handler writes 
 
 bool stop_init() {
     stop_event = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+    if (is_stop_requested()) request_stop();  // before there was an event to signal
     return stop_event >= 0;
 }
 

@@ -12,6 +12,7 @@
 #include "daemon/error/log_and_raise.h"
 #include "daemon/stop.h"
 #include "kernel.pb.h"
+#include "support/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {
@@ -123,6 +124,17 @@ TEST_F(kernel_bridge, its_set_up_says_what_fails_but_for_a_silent_kernel) {
                                  "already in use]."}));
     EXPECT_EQ(send_pid_to_kernel(netlink_.get()), ECONNREFUSED);
     EXPECT_EQ(take_log(), lines());
+}
+
+TEST_F(kernel_bridge, its_wait_for_a_message_ends_with_the_stop) {
+    EXPECT_TRUE(stop_init());
+    std::thread bridge([this] {
+        while (!is_stop_requested()) (void)receive_kernel_message(netlink_.get(), daemon_);
+    });
+    EXPECT_TRUE(send(std::string(16, ' ') + "CI kernel count 1"));
+    EXPECT_TRUE(wait_until([this] { return !next_packet().empty(); }));
+    request_stop();
+    bridge.join();
 }
 
 // Everything at once: messages, errors from both threads, forks, and a daemon that reads nothing.

@@ -1,8 +1,6 @@
-// Events under full load, and under the hardest end.
-#include <atomic>
+// Events under the hardest end.
 #include <csignal>
 #include <random>
-#include <thread>
 
 #include "daemon_test.h"
 
@@ -17,62 +15,9 @@ std::vector<std::string> payloads_of(const kiv::Report& report) {
     return payloads;
 }
 
-void append(std::vector<std::string>& to, const std::vector<std::string>& more) {
-    to.insert(to.end(), more.begin(), more.end());
-}
-
 std::string numbered(int number, size_t size) {
     std::string text = std::to_string(number);
     return text.insert(0, size - text.size(), ' ');
-}
-
-// Takes reports away as they appear, until it is told that there will be no more.
-class collector {
- public:
-    ~collector() { finish(); }
-    std::vector<std::string> finish() {
-        last_ = true;
-        if (thread_.joinable()) thread_.join();
-        return std::move(payloads_);
-    }
-    int reports() const { return reports_; }
-
- private:
-    void run() {
-        for (bool last = false; !last;) {
-            last = last_;
-            for (const auto& [number, path] : report_paths()) {
-                append(payloads_, payloads_of(parse(gunzip_file(path))));
-                std::filesystem::remove(path);
-                ++reports_;
-            }
-        }
-    }
-
-    std::vector<std::string> payloads_;
-    std::atomic<int> reports_ = 0;
-    std::atomic<bool> last_ = false;
-    std::thread thread_{[this] { run(); }};
-};
-
-TEST_F(lossless, a_producer_at_full_speed_and_a_collector_see_every_event_once_and_in_order) {
-    constexpr int count = 60000;
-    daemon_process daemon = start();
-    collector collector;
-    {
-        const unique_fd producer = connect_client(socket_kind::datagram);
-        for (int i = 0; i < count; ++i) {
-            ASSERT_TRUE(send_text(producer.get(), "EV load event " + numbered(i, 64)));
-        }
-        ASSERT_TRUE(wait_taken(producer.get()));
-    }
-    EXPECT_EQ(daemon.stop(), 0);  // when the last report is done
-    EXPECT_EQ(errors(daemon), 0U) << daemon.log();
-    std::vector<std::string> payloads = collector.finish();
-    EXPECT_GT(collector.reports(), 10);
-    append(payloads, payloads_of(parse(read_file("private/events"))));
-    ASSERT_EQ(payloads.size(), size_t{count});
-    for (int i = 0; i < count; ++i) ASSERT_EQ(payloads[static_cast<size_t>(i)], numbered(i, 64));
 }
 
 // Killed at different points of a rotation; an answered IA says that what came before it is kept.
