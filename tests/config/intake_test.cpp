@@ -82,7 +82,7 @@ TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {
     EXPECT_EQ(part("a", "x"), "as it is");
 }
 
-TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
+TEST_F(intake, a_damaged_list_gives_no_part_the_file_of_another) {
     for (const std::string& counter :
          {""s, "kivd\0_last_id\0-5\0000\0\0\n"s, "kivd\0_last_id\0x\0001\0\0\n"s}) {
         write_file("private/config_list.txt", "a\0x\0007\0001\0\0\nb\0y\0z\0\0\n"s + counter);
@@ -91,6 +91,12 @@ TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
         EXPECT_EQ(read_file("private/conf_7.bin") + read_file("private/conf_8.bin"), "oldnew");
         EXPECT_EQ(part("kivd", "_last_id"), "none");
     }
+    // Out of order, and two with one file.
+    write_file("private/config_list.txt",
+               "b\0y\0008\0001\0\0\na\0x\0007\0001\0\0\nc\0z\0007\0001\0\0\n"s);
+    restart();
+    EXPECT_EQ(part("a", "x") + part("b", "y") + part("c", "z"), "nonenewnone");
+
     write_file("private/config_list.txt", "kivd\0_last_id\0002147483647\0000\0\0\n"s);
     restart();
     ASSERT_TRUE(take(config_file({{"c", "z", "one too many"}})));
