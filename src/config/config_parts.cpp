@@ -57,14 +57,16 @@ bool is_last_id(const probe_key& key) { return compare_probes(&last_id_key, &key
 
 void* parse_record(const char* record, const char* terminator, void* /*context*/) {
     std::array<const char*, 4> fields;
-    if (!split_record(record, terminator, fields)) {
-        if (fields.back() != nullptr) {
-            __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to parse config line.");
-        }
-        return nullptr;
+    const bool is_complete = split_record(record, terminator, fields);
+    const probe_key key = {fields[0], fields[1]};
+    const int32_t id = is_complete ? parse_saturated(fields[2]) : 0;
+    if (id >= 1 || (is_complete && is_last_id(key))) {
+        return make_item(key, id, parse_saturated(fields[3]));
     }
-    return make_item({fields[0], fields[1]}, parse_saturated(fields[2]),
-                     parse_saturated(fields[3]));
+    if (fields.back() != nullptr) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to parse config line.");
+    }
+    return nullptr;
 }
 
 int write_record(FILE* file, const void* element, void* /*context*/) {
@@ -77,6 +79,44 @@ int write_record(FILE* file, const void* element, void* /*context*/) {
     if (writer.finish()) return 1;
     (void)log_and_raise(tag, "Failed to write to configuration list file.");
     return 0;
+}
+
+// The id of a part; 0 for the counter, which has the id of one.
+int32_t id_of(const void* element) {
+    const auto& item = *static_cast<const config_item*>(element);
+    return is_last_id(item.key) ? 0 : item.id;
+}
+
+// Drops each item that is equal to a neighbour, and that one too.
+void drop_equal_items(auto equal) {
+    sorted_list& list = *config_list_p;
+    uint32_t kept = 0;
+    bool equals_last = false;
+    for (uint32_t i = 0; i < list.count; ++i) {
+        void* const element = list.elements[i];
+        const bool equals_next = i + 1 < list.count && equal(element, list.elements[i + 1]);
+        if (equals_last || equals_next) {
+            const auto& key = static_cast<const config_item*>(element)->key;
+            __android_log_print(ANDROID_LOG_ERROR, tag, "Dropped config line <%s::%s>.",
+                                key.package, key.name);
+            free(element);
+        } else {
+            list.elements[kept++] = element;
+        }
+        equals_last = equals_next;
+    }
+    list.count = kept;
+}
+
+// A list file that was damaged may have items that share an id, so that nobody knows whose file it
+// is, or that are not found where they stand. A part that is dropped gets a new id when it comes
+// with a configuration.
+void repair_list() {
+    const auto items = [] { return std::span(config_list_p->elements, config_list_p->count); };
+    std::ranges::sort(items(), {}, id_of);
+    drop_equal_items([](const void* a, const void* b) { return id_of(a) == id_of(b); });
+    std::ranges::sort(items(), [](void* a, void* b) { return compare_probes(a, b) < 0; });
+    drop_equal_items([](const void* a, const void* b) { return compare_probes(a, b) == 0; });
 }
 
 int32_t highest_id() {
@@ -135,6 +175,7 @@ void load_config_list() {
     config_list_p = list_create(32, 16, compare_probes, nullptr);
     if (config_list_p == nullptr) fatal_error("OOM, while creating config_list_p");
     (void)list_load(*config_list_p, paths::config_list, parse_record, nullptr);
+    repair_list();
     repair_last_id();
 }
 

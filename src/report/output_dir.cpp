@@ -4,6 +4,8 @@
 #include <sys/statfs.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -47,11 +49,33 @@ std::optional<int32_t> report_number(const char* name) {
     return number ? std::optional(static_cast<int32_t>(*number)) : std::nullopt;
 }
 
+struct report_entry {
+    int32_t number;
+    uint64_t size;
+};
+
 struct directory_state {
     uint64_t total_size = 0;
     int32_t highest = 0;
-    int32_t lowest = INT32_MAX;
-    bool any_report = false;
+    // The reports with the lowest numbers, in their order. There may be tens of thousands in all,
+    // too many to look at each of them for every one that is deleted.
+    std::array<report_entry, 256> oldest;
+    size_t oldest_count = 0;
+
+    void add(const report_entry& report) {
+        total_size += report.size;
+        highest = std::max(highest, report.number);
+        if (oldest_count < oldest.size()) {
+            ++oldest_count;
+        } else if (oldest.back().number <= report.number) {
+            return;
+        }
+        auto* const last = oldest.begin() + oldest_count - 1;
+        auto* const place = std::ranges::upper_bound(oldest.begin(), last, report.number, {},
+                                                     &report_entry::number);
+        std::move_backward(place, last, last + 1);
+        *place = report;
+    }
 };
 
 bool scan_output_dir(directory_state& state) {
@@ -63,16 +87,14 @@ bool scan_output_dir(directory_state& state) {
                                 strerror(errno));
             return;
         }
-        state.total_size += static_cast<uint64_t>(status.st_size);
-        const std::optional<int32_t> number = report_number(name);
-        if (!number) {
-            __android_log_print(ANDROID_LOG_WARN, tag, "Bad file in our %s directory: %s",
-                                paths::output_dir, name);
+        const auto size = static_cast<uint64_t>(status.st_size);
+        if (const std::optional<int32_t> number = report_number(name)) {
+            state.add({*number, size});
             return;
         }
-        state.any_report = true;
-        if (*number > state.highest) state.highest = *number;
-        if (*number < state.lowest) state.lowest = *number;
+        state.total_size += size;
+        __android_log_print(ANDROID_LOG_WARN, tag, "Bad file in our %s directory: %s",
+                            paths::output_dir, name);
     });
     if (!complete) {
         (void)log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
@@ -95,8 +117,25 @@ uint32_t size_budget() {
     return output_size_budget(get_limits().max_output_dir_size, get_limits().max_report_size);
 }
 
+bool is_room_enough(const directory_state& state) {
+    return is_free_space_enough() && size_budget() > state.total_size;
+}
+
 void log_deleted(const char* log_tag, const char* path) {
     __android_log_print(ANDROID_LOG_INFO, log_tag, "Deleting %s from output directory", path);
+}
+
+// Deletes the oldest reports until there is room, or until one is not there any more: a collector
+// takes them too. False when that is the first one.
+bool delete_oldest(directory_state& state) {
+    for (size_t i = 0; i < state.oldest_count; ++i) {
+        if (i > 0 && is_room_enough(state)) return true;
+        const report_path oldest(state.oldest[i].number);
+        if (unlink(oldest.text) != 0) return i > 0;
+        log_deleted(tag, oldest.text);
+        state.total_size -= state.oldest[i].size;
+    }
+    return true;
 }
 
 void delete_all_entries() {
@@ -117,13 +156,11 @@ int32_t prune_dir() {
     for (;;) {
         directory_state state;
         if (!scan_output_dir(state)) return -1;
-        if (is_free_space_enough() && size_budget() > state.total_size) return state.highest;
-        if (!state.any_report) {
+        if (is_room_enough(state)) return state.highest;
+        if (state.oldest_count == 0) {
             return log_and_raise(tag, "Failed to prune files from output directory");
         }
-        const report_path oldest(state.lowest);
-        if (unlink(oldest.text) != 0) return -1;
-        log_deleted(tag, oldest.text);
+        if (!delete_oldest(state)) return -1;
     }
 }
 

@@ -82,7 +82,24 @@ TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {
     EXPECT_EQ(part("a", "x"), "as it is");
 }
 
-TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
+TEST_F(intake, names_are_texts_and_not_paths) {
+    const std::vector<config_part> parts = {{"..", "../../x", "1"},
+                                            {"", "", "2"},
+                                            {"a/b", "line\n\n", "3"},
+                                            {"p\0q"s, "n\0"s, "4"},
+                                            {std::string(500, 'p'), std::string(500, 'n'), "5"}};
+    ASSERT_TRUE(take(config_file(parts)));
+    for (const int round : {1, 2}) {
+        for (const config_part& each : parts) {
+            EXPECT_EQ(part(each.package.c_str(), each.name.c_str()), each.payload) << round;
+        }
+        for (const char id : "12345"s) EXPECT_TRUE(exists("private/conf_"s + id + ".bin"));
+        EXPECT_EQ(std::distance(fs::directory_iterator("private"), {}), 7);  // list and state, too
+        restart();
+    }
+}
+
+TEST_F(intake, a_damaged_list_gives_no_part_the_file_of_another) {
     for (const std::string& counter :
          {""s, "kivd\0_last_id\0-5\0000\0\0\n"s, "kivd\0_last_id\0x\0001\0\0\n"s}) {
         write_file("private/config_list.txt", "a\0x\0007\0001\0\0\nb\0y\0z\0\0\n"s + counter);
@@ -91,6 +108,12 @@ TEST_F(intake, a_list_that_lost_its_counter_gives_out_no_id_twice) {
         EXPECT_EQ(read_file("private/conf_7.bin") + read_file("private/conf_8.bin"), "oldnew");
         EXPECT_EQ(part("kivd", "_last_id"), "none");
     }
+    // Out of order, and two with one file.
+    write_file("private/config_list.txt",
+               "b\0y\0008\0001\0\0\na\0x\0007\0001\0\0\nc\0z\0007\0001\0\0\n"s);
+    restart();
+    EXPECT_EQ(part("a", "x") + part("b", "y") + part("c", "z"), "nonenewnone");
+
     write_file("private/config_list.txt", "kivd\0_last_id\0002147483647\0000\0\0\n"s);
     restart();
     ASSERT_TRUE(take(config_file({{"c", "z", "one too many"}})));
@@ -141,7 +164,6 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
         {"\x12\xff\xff\xff\xff\x0fxy", {extract_failure("gz"), unpack_failure}},
         {std::string(204800, '\x12'), {unpack_failure}},
         {config_file("\x1f\x8b\x08"), {read_failure}},
-        {config_file(good.substr(0, good.size() / 2)), {read_failure}},
         {config_file(good.substr(0, good.size() - 1)), {read_failure}},
         {config_file(two_members), {read_failure}},
         {config_file(flipped), {read_failure}},
@@ -168,21 +190,13 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
     EXPECT_EQ(part("a", "x"), "new");
 }
 
-TEST_F(intake, a_signed_file_is_taken_whole_and_unchanged_or_not_at_all) {
+TEST_F(intake, with_a_key_only_what_it_has_signed_is_taken) {
     make_keys("config");
     make_keys("other");
     set_config_key_dir("./");
     const std::string data = gzip(pack({{"a", "x", "signed"}}));
     const std::string file = config_file(data, sign(data, "config"));
     const auto before = in_force();
-    for (size_t i = 0; i < file.size(); ++i) {
-        SCOPED_TRACE(i);
-        EXPECT_FALSE(take(file.substr(0, i)));
-        std::string changed = file;
-        changed[i] = static_cast<char>(changed[i] ^ (1 << i % 8));
-        EXPECT_FALSE(take(changed));
-        ASSERT_EQ(in_force(), before);
-    }
     const std::string signatures[] = {std::string(1, '\0'), std::string(1025, 'x'),
                                       sign(data, "other"), sign(data + ".", "config")};
     for (const std::string& signature : signatures) {

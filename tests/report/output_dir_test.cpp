@@ -1,5 +1,7 @@
 #include "report/output_dir.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 
 #include "config/limits.h"
@@ -47,6 +49,8 @@ TEST_F(output_dir, the_lowest_numbers_go_until_there_is_room) {
         {{"kiv_12abc", "kiv_3"}, 101, 12, {"kiv_12abc"}},
         {{"kiv_12abc", "kiv_13"}, 101, -1, {"kiv_12abc", "kiv_13"}},  // there is no kiv_12
         {{"kiv_ 5"}, 100, -1, {"kiv_ 5"}},
+        {{"kiv_007"}, 100, -1, {"kiv_007"}},
+        {{"kiv_0x10"}, 100, -1, {"kiv_0x10"}},
         {{"kiv_99999999999"}, 101, 1215752191, {"kiv_99999999999"}},
         {{"kiv_2147483647"}, 101, 2147483647, {"kiv_2147483647"}},
     };
@@ -58,12 +62,29 @@ TEST_F(output_dir, the_lowest_numbers_go_until_there_is_room) {
     }
 }
 
+TEST_F(output_dir, a_great_many_go_in_their_order) {
+    lines all;
+    for (int number = 700; number > 0; --number) all.push_back("kiv_" + std::to_string(number));
+    prepare(all, 3001);
+    (void)take_log();
+    EXPECT_EQ(prune_dir(), 700);
+    const lines log = take_log();
+    ASSERT_EQ(log.size(), 670U);
+    for (size_t i = 0; i < log.size(); ++i) {
+        EXPECT_EQ(log[i], "I kivd-compactor: Deleting output/kiv_" + std::to_string(i + 1) +
+                              " from output directory");
+    }
+}
+
 TEST_F(output_dir, only_reports_in_the_directory_are_removed) {
     write_file("precious", "x");
     prepare({}, 5);  // enough for the file, but not for the link
     fs::create_symlink("../precious", "output/kiv_4");
     EXPECT_EQ(prune_dir(), 0);
     EXPECT_TRUE(exists("precious") && !exists("output/kiv_4"));
+    prepare({"kiv_2"}, 100);
+    EXPECT_EQ(mkfifo("output/kiv_1", 0600), 0);
+    EXPECT_EQ(prune_dir(), 0);
     fs::create_directory("output/kiv_3");
     EXPECT_EQ(prune_dir(), -1);
 }

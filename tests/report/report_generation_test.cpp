@@ -2,9 +2,11 @@
 
 #include "report/header_record.h"
 #include "report/state_file.h"
+#include "security/key_paths.h"
 #include "store/counter_store.h"
 #include "store/event_store.h"
 #include "store/static_store.h"
+#include "support/config_package.h"
 #include "support/scratch_directory.h"
 #include "util/clock.h"
 #include "util/paths.h"
@@ -82,6 +84,28 @@ TEST_F(report_generation, a_failed_compactor_leaves_its_data_and_no_report) {
     EXPECT_TRUE(fs::remove(paths::compacted_data) && fs::is_empty("output"));
     EXPECT_EQ(compact_report(), 0);
     EXPECT_TRUE(exists("output/kiv_1"));
+}
+
+TEST_F(report_generation, a_report_that_cannot_be_sealed_whole_does_not_appear) {
+    make_keys("report");
+    set_report_key_dir("./");
+    set_output_compression(false);
+    (void)events_add("p", "e", std::string(5000, 'x'));
+    EXPECT_EQ(events_flush(), 0);
+    const auto size = fs::file_size(paths::flushed_data);
+    const std::pair<rlim_t, const char*> limits[] = {
+        {size + 100, "E kivd/crypto: encrypt_file(): fwrite() failed, File too large"},
+        {100, "E kivd-compactor: Failed to compact file"},
+    };
+    for (const auto& [limit, message] : limits) {
+        limit_file_size(limit);
+        EXPECT_EQ(compact_report(), -1);
+        EXPECT_EQ(take_log().back(), message);
+        EXPECT_TRUE(fs::is_empty("output"));
+    }
+    limit_file_size(RLIM_INFINITY);
+    EXPECT_EQ(compact_report(), 0);
+    EXPECT_TRUE(exists("output/kiv_1") && !exists(paths::flushed_data));
 }
 
 }  // namespace

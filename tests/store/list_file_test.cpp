@@ -33,21 +33,6 @@ class list_file : public scratch_directory {
     sorted_list* list = nullptr;
 };
 
-TEST_F(list_file, a_cut_file_gives_its_whole_records) {
-    const std::string records[] = {"first" + end, end, "third" + end};
-    std::string whole;
-    for (uint32_t count = 0; count < 3; ++count) {
-        for (size_t cut = 0; cut < records[count].size(); ++cut) {
-            const bool readable = cut < 3;  // so few stray bytes don't matter
-            EXPECT_EQ(load(whole + records[count].substr(0, cut)), std::pair(int{readable}, count))
-                << cut;
-            EXPECT_EQ(take_log().size(), readable ? 0U : 1U);
-        }
-        whole += records[count];
-    }
-    EXPECT_EQ(load(whole), std::pair(1, 3U));
-}
-
 TEST_F(list_file, records_and_files_have_their_limits) {
     const std::string longest = std::string(1021, 'x') + end;
     std::string many;

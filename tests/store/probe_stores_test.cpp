@@ -26,19 +26,23 @@ class probe_stores : public scratch_directory {
     }
 };
 
-TEST_F(probe_stores, sums_wrap_at_64_bits_and_keep_their_sign) {
+TEST_F(probe_stores, numbers_wrap_at_64_bits_and_keep_their_sign) {
     write_file(paths::counters,
                "p\0max\0001\0001\0009223372036854775807\0\0\n"s
-               "p\0min\0001\0001\000-9223372036854775808\0\0\n"s);
+               "p\0min\0001\0001\000-9223372036854775808\0\0\n"s
+               "p\0odd\0\0\xFF\0004x\0\0\n"s
+               "p\0z\0001\0001\000999999999999999999999999999999\0\0\n"s);
     restart();
     counters_update("p", "max", 1, counter_mode::increment);
     counters_update("p", "min", -1, counter_mode::increment);
+    counters_update("p", "odd", 0, counter_mode::increment);
+    counters_update("p", "z", 0, counter_mode::increment);
     counters_update("p", "a", 5, counter_mode::increment);
     counters_update("p", "a", INT32_MIN, counter_mode::set);
     save_and_restart();
     EXPECT_EQ(reported(0),
               "P1; a=-2147483648; max=-9223372036854775808; "
-              "min=9223372036854775807; ");
+              "min=9223372036854775807; odd=112; z=5076944270305263615; ");
 }
 
 TEST_F(probe_stores, any_number_of_probes_is_found_again_in_order) {

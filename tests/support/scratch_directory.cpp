@@ -35,6 +35,10 @@ void release_all() {
 
 }  // namespace
 
+directory_in_memory::directory_in_memory() {
+    if (access("/dev/shm", W_OK) == 0) setenv("TEST_TMPDIR", "/dev/shm/", 0);
+}
+
 scratch_directory::scratch_directory() {
     directory = testing::TempDir() + "kivd-XXXXXX";
     EXPECT_NE(mkdtemp(directory.data()), nullptr);
