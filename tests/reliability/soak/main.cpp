@@ -27,20 +27,12 @@ double seconds() {
     return std::chrono::duration<double>(now).count();
 }
 
-// True each time that a figure has grown by `step`.
-class every {
- public:
-    every(double step, double start) : step_(step), next_(start + step) {}
-    bool operator()(double figure) {
-        if (figure < next_) return false;
-        next_ = figure + step_;
-        return true;
-    }
-
- private:
-    double step_;
-    double next_;
-};
+// Whether a figure has reached `next`, which then is `step` further on.
+bool is_due(double figure, double& next, double step) {
+    if (figure < next) return false;
+    next = figure + step;
+    return true;
+}
 
 class soak : public daemon_test {
  protected:
@@ -97,16 +89,16 @@ class soak : public daemon_test {
         };
         const point first = reached(sending);
         point last = first;
-        every flush(requests_per_flush, first.requests);
-        every save(requests_per_save, first.requests);
-        every second(1, first.seconds);
-        every minute(60, first.seconds);
+        double flush = first.requests;
+        double save = first.requests;
+        double look = first.seconds;
+        double line = first.seconds + 60;
         sending.send([&] {
             const auto sent = static_cast<double>(sending.total());
-            if (flush(sent)) send_text(control.get(), "FL");
-            if (save(sent)) send_text(control.get(), "FS");
-            EXPECT_TRUE(!second(seconds()) || daemon_.descriptors() <= descriptor_limit);
-            if (minute(seconds())) {
+            if (is_due(sent, flush, requests_per_flush)) send_text(control.get(), "FL");
+            if (is_due(sent, save, requests_per_save)) send_text(control.get(), "FS");
+            EXPECT_TRUE(!is_due(seconds(), look, 1) || daemon_.descriptors() <= descriptor_limit);
+            if (is_due(seconds(), line, 60)) {
                 const point now = reached(sending);
                 print_stretch(std::exchange(last, now), now, take_times());
                 asking.emplace();
