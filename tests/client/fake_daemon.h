@@ -111,8 +111,8 @@ class control_server {
     }
     ~control_server() { shutdown(socket_.fd(), SHUT_RDWR); }  // ends the accept
 
-    // The requests of all connections so far.
-    std::vector<std::string> take_requests() {
+    // The requests of all connections so far, a blank before each.
+    std::string take_requests() {
         const std::scoped_lock lock(mutex_);
         return std::exchange(requests_, {});
     }
@@ -133,7 +133,7 @@ class control_server {
         const std::string request(text, static_cast<size_t>(size));
         {
             const std::scoped_lock lock(mutex_);
-            requests_.push_back(request);
+            requests_ += ' ' + request;
         }
         auto answer = answer_(request);
         if (!answer) return false;
@@ -144,7 +144,7 @@ class control_server {
     bound_socket socket_;
     answer_function answer_;
     std::mutex mutex_;
-    std::vector<std::string> requests_;
+    std::string requests_;
     std::jthread thread_;  // last: it uses the others
 };
 

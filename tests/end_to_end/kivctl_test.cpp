@@ -1,6 +1,5 @@
 // kivctl with the real daemon, where a stand-in would not do.
 #include "debug_port.h"
-#include "kiv.h"
 
 namespace kivd {
 namespace {
@@ -90,21 +89,6 @@ TEST_F(debug_watch, tells_why_there_is_nothing_to_see) {
         EXPECT_EQ(watcher.wait_exit(), c.status);
         EXPECT_NE(watcher.log().find(c.text), std::string::npos) << watcher.log();
     }
-}
-
-class diagnostics_files : public daemon_test {};
-
-// The daemon cuts the numbers that it answers with to the length of the request.
-TEST_F(diagnostics_files, with_the_longest_numbers_are_found) {
-    daemon_process daemon = start();
-    EXPECT_TRUE(std::filesystem::create_directory("private/qz"));
-    write_file("private/qz/qz_2147483646", "plain");
-    kiv_handle* const handle = kiv_create_from_path(directory.c_str());
-    EXPECT_EQ(kiv_next_file(handle, 0), 2147483646);
-    kiv_destroy(handle);
-    daemon_process list(KIVCTL_PATH, {{"--base", directory, "files", "list"}});
-    EXPECT_EQ(list.wait_exit(), 0) << list.log();
-    EXPECT_EQ(list.output(), "2147483646  5 bytes\n");
 }
 
 }  // namespace

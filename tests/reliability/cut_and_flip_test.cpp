@@ -14,7 +14,6 @@
 #include "config/filters.h"
 #include "config/intake.h"
 #include "config/limits.h"
-#include "config/settings.h"
 #include "daemon/error/daemon_error.h"
 #include "diag/diag_store.h"
 #include "diag/file_export.h"
@@ -36,7 +35,6 @@ namespace kivd {
 namespace {
 
 constexpr char diag_file[] = "private/qz/qz_2";
-constexpr char settings_part[] = "private/conf_3.bin";
 constexpr size_t terminator_size = 3;  // of a record in a list file
 
 // A file in its pieces: records, lines, or all of it in one.
@@ -303,19 +301,6 @@ void expect_filter(const damage& d) {
     EXPECT_EQ(read_file(filter_paths[static_cast<size_t>(kind)]), join(all, all.size()));
 }
 
-pieces make_settings() {
-    EXPECT_TRUE(take(config_file(sample_parts())));
-    return {read_file(settings_part)};
-}
-
-void expect_settings(const damage& /*d*/) {
-    apply_settings();
-    const limits applied = get_limits();
-    EXPECT_LE(applied.max_report_size, applied.max_output_dir_size);
-    apply_settings();
-    EXPECT_EQ(memcmp(&applied, &get_limits(), sizeof applied), 0);
-}
-
 // All that a configuration decides.
 using decisions = std::map<std::string, std::string>;
 decisions in_force() {
@@ -452,17 +437,11 @@ void expect_state(const damage& d) {
 
 // The last one is what is left of some others when they are torn in two.
 pieces make_header_info() {
-    return {"revision: 1.4.2\n",
-            "variant: european\n",
-            "type: user\n",
-            "timezone: -5400\n",
-            "device id: 2543c433-e716\n",
-            "cdf_id: 1234_R6D\n",
-            "serial num: ABCD\n",
-            "device imei: 1234567890\n",
-            "group id: field-a\n",
-            "group id: lab\n",
-            "id: P100\n"};
+    return split(
+        "revision: 1.4.2\nvariant: european\ntype: user\ntimezone: -5400\n"
+        "device id: 2543c433-e716\ncdf_id: 1234_R6D\nserial num: ABCD\n"
+        "device imei: 1234567890\ngroup id: field-a\ngroup id: lab\nid: P100\n",
+        "\n");
 }
 
 std::string load_header_info() {
@@ -497,7 +476,6 @@ const struct kept_file {
     {paths::static_data_filter, make_filter<filter_kind::static_data>,
      expect_filter<filter_kind::static_data>},
     {paths::event_filter, make_filter<filter_kind::events>, expect_filter<filter_kind::events>},
-    {settings_part, make_settings, expect_settings},
     {paths::state, make_state, expect_state},
     {paths::header_info, make_header_info, expect_header_info},
     {paths::config_file, make_unsigned, expect_unsigned},

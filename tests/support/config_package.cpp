@@ -33,13 +33,13 @@ std::string pack(const std::vector<config_part>& parts) {
     return package.SerializeAsString();
 }
 
-std::string gzip(const std::string& bytes) {
+std::string gzip(std::string_view bytes, int level) {
     z_stream stream = {};
-    EXPECT_EQ(deflateInit2(&stream, 9, Z_DEFLATED, 16 + MAX_WBITS, 8, Z_DEFAULT_STRATEGY), Z_OK);
+    EXPECT_EQ(deflateInit2(&stream, level, Z_DEFLATED, 16 + MAX_WBITS, 8, Z_DEFAULT_STRATEGY),
+              Z_OK);
     std::string compressed(deflateBound(&stream, bytes.size()) + 32, '\0');
-    std::string input = bytes;
-    stream.next_in = reinterpret_cast<Bytef*>(input.data());
-    stream.avail_in = static_cast<uInt>(input.size());
+    stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
+    stream.avail_in = static_cast<uInt>(bytes.size());
     stream.next_out = reinterpret_cast<Bytef*>(compressed.data());
     stream.avail_out = static_cast<uInt>(compressed.size());
     EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "config.pb.h"
@@ -20,8 +21,8 @@ config_part own_part(const std::string& name, const std::string& text);
 
 // A packed kiv.config.ConfigPackage.
 std::string pack(const std::vector<config_part>& parts);
-// One gzip member.
-std::string gzip(const std::string& bytes);
+// One gzip member; of level 0 its bytes are stored.
+std::string gzip(std::string_view bytes, int level = 9);
 // The file, without a signature when there is none.
 std::string config_file(const std::string& compressed_data, const std::string& signature = "");
 inline std::string config_file(const std::vector<config_part>& parts) {

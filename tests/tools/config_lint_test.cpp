@@ -1,7 +1,6 @@
 #include "tools/config_lint.h"
 
 #include <google/protobuf/stubs/logging.h>
-#include <google/protobuf/text_format.h>
 
 #include <random>
 #include <span>
@@ -99,102 +98,94 @@ TEST_F(config_lint, of_filters_knows_what_the_daemon_refuses_or_forgets) {
 }
 
 TEST_F(config_lint, of_filters_knows_how_much_the_daemon_reads_back) {
-    const auto filter_of = [](const char* type, int items, size_t last_package) {
-        std::string text = std::string("event_filter { type: ") + type;
-        for (int i = 1; i < items; ++i)
-            text += " item { package: 'p' name: '" + std::to_string(i) + "' }";
-        text += " item { package: '" + std::string(last_package, 'q') + "' name: 'n' } }";
-        kiv::config::FilterConfig config;
-        EXPECT_TRUE(google::protobuf::TextFormat::ParseFromString(text, &config));
-        return config.SerializeAsString();
-    };
+    constexpr auto include = kiv::config::Filter::INCLUDE, exclude = kiv::config::Filter::EXCLUDE;
     const struct {
-        const char* type;
+        kiv::config::Filter::Type type;
         int items;
         size_t package;
         bool is_read_back;
     } cases[] = {
-        {"INCLUDE", 19999, 1, true},  {"INCLUDE", 20000, 1, false}, {"EXCLUDE", 19998, 1, true},
-        {"EXCLUDE", 19999, 1, false}, {"INCLUDE", 1, 1019, true},   {"INCLUDE", 1, 1020, false},
+        {include, 19999, 1, true},  {include, 20000, 1, false}, {exclude, 19998, 1, true},
+        {exclude, 19999, 1, false}, {include, 1, 1019, true},   {include, 1, 1020, false},
     };
     for (const auto& each : cases) {
-        SCOPED_TRACE(std::string(each.type) + std::to_string(each.items));
-        const std::string payload = filter_of(each.type, each.items, each.package);
-        const std::string found = found_in_filters(payload);
-        EXPECT_EQ(found.empty(), each.is_read_back) << found;
-        EXPECT_EQ(take(payload).outlives_restart, each.is_read_back);
+        kiv::config::FilterConfig config;
+        config.mutable_event_filter()->set_type(each.type);
+        for (int i = 0; i < each.items; ++i) {
+            auto& item = *config.mutable_event_filter()->add_item();
+            item.set_package(std::string(each.package, 'p'));
+            item.set_name(std::to_string(i));
+        }
+        const std::string found = found_in_filters(config.SerializeAsString());
+        EXPECT_EQ(found.empty(), each.is_read_back) << each.items << found;
+        EXPECT_EQ(take(config.SerializeAsString()).outlives_restart, each.is_read_back);
     }
 }
 
 TEST(config_lint_findings, say_where_and_what_the_daemon_does) {
     const std::string filters = "\x0a\x02\x08\x02";  // excludes nothing
-    const std::string long_name(1000, 'n');
+    const std::string filter_part = "kivd:FilterConfig", settings = "kivd:Settings";
+    const std::string n1006(1006, 'n'), nul(1, '\0');
     const struct {
         std::vector<std::pair<std::string, std::string>> parts;  // "package:name", payload
         std::string found;                                       // empty: nothing
     } cases[] = {
         {{}, ""},
         {{{"p:n", ""}}, ""},
-        {{{"p:" + long_name + "nnnnnn", ""}}, ""},  // 1007 bytes in all
-        {{{"p:" + long_name + "nnnnnnn", ""}}, "...: package and name make a record of up to 1025"},
-        {{{"p:" + long_name + std::string(16, 'n'), ""}},
-         "make a record of 1025 bytes; the daemon"},
+        {{{"p:" + n1006, ""}}, ""},  // 1007 bytes in all
+        {{{"p:" + n1006 + "n", ""}}, "...: package and name make a record of up to 1025"},
+        {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "make a record of 1025 bytes; the daemon"},
         {{{"p:", ""}}, "f: error: p:: its name is empty"},
         {{{":n", ""}}, "f: error: :n: its package is empty"},
         {{{"p:n m", ""}}, "f: warning: p:n m: its name holds a blank"},
-        {{{"p:n" + std::string(1, '\0'), ""}}, "f: error: p:n\\x00: its name holds a NUL"},
-        {{{"p:n" + std::string(1, '\0'), ""}, {"p:n", ""}}, "f: error: p:n: is given twice"},
+        {{{"p:n" + nul, ""}}, "f: error: p:n\\x00: its name holds a NUL"},
+        {{{"p:n" + nul, ""}, {"p:n", ""}}, "f: error: p:n: is given twice"},
         {{{"kivd:_last_id", ""}}, "error: kivd:_last_id: is the daemon's own name"},
         {{{"shop:_last_id", ""}}, ""},
         {{{"kivd:Setings", ""}}, "error: kivd:Setings: the daemon does not know it, is Settings"},
         {{{"kivd:runactionsonce", ""}}, "is RunActionsOnce meant?"},
         {{{"kivd:Menu", ""}}, "warning: kivd:Menu: the daemon does not know it"},
-        {{{"kivd:Settings", "\x08\x80\x80\xc0\x02"}}, ""},  // 5242880, the other's default
-        {{{"kivd:Settings", "\x08\x81\x80\xc0\x02"}},
+        {{{settings, "\x08\x80\x80\xc0\x02"}}, ""},  // 5242880, the other's default
+        {{{settings, "\x08\x81\x80\xc0\x02"}},
          "max_report_size, 5242881, is above max_output_dir_size, 5242880 unless given; the "
          "daemon"},
-        {{{"kivd:Settings", "\x10\xff\xff\x18"}},
+        {{{settings, "\x10\xff\xff\x18"}},
          "409600 unless given, is above max_output_dir_size, 409599;"},
-        {{{"kivd:Settings", "\x08"}},
-         "error: kivd:Settings: cannot be decoded; the daemon returns"},
-        {{{"kivd:RunActions", "\x08"}},
-         "error: kivd:RunActions: cannot be decoded; the daemon leaves"},
-        {{{"kivd:Settings", "\x18\x01"}, {"kivd:RunActionsOnce", "\x08\x01"}},
+        {{{settings, "\x08"}}, "error: kivd:Settings: cannot be decoded; the daemon returns"},
+        {{{"kivd:RunActions", "\x08"}}, "kivd:RunActions: cannot be decoded; the daemon leaves"},
+        {{{settings, "\x18\x01"}, {"kivd:RunActionsOnce", "\x08\x01"}},
          "error: kivd:Settings: permanently_disable together with remove_reports"},
-        {{{"kivd:Settings", "\x18\x01"}, {"kivd:RunActionsOnce", std::string("\x08\0", 2)}}, ""},
+        {{{settings, "\x18\x01"}, {"kivd:RunActionsOnce", "\x08" + nul}}, ""},
+        {{{filter_part, ""}},
+         "f: warning: kivd:FilterConfig: has no event_filter; the daemon keeps"},
+        {{{filter_part, "\x0a"}},
+         "cannot decode the part, resets all filters and keeps everything"},
+        {{{filter_part, "\x0a\x02\x08\x03"}},
+         "event_filter: its type, 3, is neither INCLUDE nor EXCLUDE; the daemon"},
+        {{{filter_part, "\x0a" + nul}}, "event_filter: lacks its type; the daemon cannot decode"},
+        {{{filter_part, filters + "\x12\x02\x08\x01"}},
+         "counter_filter: includes nothing; the daemon keeps no counters"},
+        {{{filter_part,
+           "\x0a\x09\x08\x02\x12\x05\x0a\x03"
+           "a\xff\x20"}},
+         "item 1 (a\\xFF  ): lacks its name; the daemon cannot"},
+        {{{filter_part,
+           "\x0a\x0c\x08\x02\x12\x08\x0a\x03"
+           "a b\x12\x01n"}},
+         "warning: kivd:FilterConfig event_filter item 1 (a b n)"},
     };
     for (const auto& each : cases) {
         std::vector<part_content> parts;
-        parts.push_back({"kivd", "FilterConfig", filters, "f", nullptr});
         for (const auto& [id, payload] : each.parts) {
             const size_t colon = id.find(':');
             parts.push_back({id.substr(0, colon), id.substr(colon + 1), payload, "f", nullptr});
         }
+        if (each.parts.empty() || each.parts[0].first != filter_part) {
+            parts.push_back({"kivd", "FilterConfig", filters, "f", nullptr});
+        }
         const std::string found = found_in(parts);
         EXPECT_TRUE(each.found.empty() ? found.empty() : says(found, each.found))
             << found << "\nnot " << each.found;
-    }
-
-    const struct {
-        std::string payload, found;
-    } raw[] = {
-        {"", "f: warning: kivd:FilterConfig: has no event_filter; the daemon keeps all events"},
-        {"\x0a", "cannot decode the part, resets all filters and keeps everything"},
-        {"\x0a\x02\x08\x03",
-         "event_filter: its type, 3, is neither INCLUDE nor EXCLUDE; the daemon"},
-        {std::string("\x0a\0", 2), "event_filter: lacks its type; the daemon cannot decode"},
-        {filters + "\x12\x02\x08\x01",
-         "counter_filter: includes nothing; the daemon keeps no counters"},
-        {"\x0a\x09\x08\x02\x12\x05\x0a\x03"
-         "a\xff\x20",
-         "item 1 (a\\xFF  ): lacks its name; the daemon cannot"},
-        {"\x0a\x0c\x08\x02\x12\x08\x0a\x03"
-         "a b\x12\x01n",
-         "warning: kivd:FilterConfig event_filter item 1 (a b n)"},
-    };
-    for (const auto& each : raw) {
-        const std::string found = found_in_filters(each.payload);
-        EXPECT_TRUE(says(found, each.found)) << found << "\nnot " << each.found;
     }
 
     std::vector<part_content> many;

@@ -4,15 +4,18 @@
 #include <google/protobuf/stubs/logging.h>
 #include <google/protobuf/text_format.h>
 #include <gtest/gtest.h>
-#include <zlib.h>
 
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <sstream>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "report.pb.h"
+#include "support/config_package.h"
+#include "tools/report_command.h"
 
 namespace kivd {
 
@@ -48,21 +51,6 @@ inline std::string static_text(const std::string& name, const std::string& value
     return "statics { package: 'app' name: '" + name + "' value: '" + value + "' timestamp: 0 }";
 }
 
-inline std::string gzip(std::string_view data, int level = 9) {
-    z_stream stream{};
-    EXPECT_EQ(deflateInit2(&stream, level, Z_DEFLATED, 16 + MAX_WBITS, 8, Z_DEFAULT_STRATEGY),
-              Z_OK);
-    std::string packed(deflateBound(&stream, data.size()), '\0');
-    stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(data.data()));
-    stream.avail_in = static_cast<uInt>(data.size());
-    stream.next_out = reinterpret_cast<Bytef*>(packed.data());
-    stream.avail_out = static_cast<uInt>(packed.size());
-    EXPECT_EQ(deflate(&stream, Z_FINISH), Z_STREAM_END);
-    packed.resize(stream.total_out);
-    deflateEnd(&stream);
-    return packed;
-}
-
 // A test with a directory of its own.
 class report_files : public testing::Test {
  protected:
@@ -72,6 +60,16 @@ class report_files : public testing::Test {
         directory = name;
     }
     ~report_files() override { std::filesystem::remove_all(directory); }
+
+    struct shown {
+        int status;
+        std::string out, err;
+    };
+    static shown show(const std::vector<std::string>& paths, const report_options& options) {
+        std::ostringstream out, err;
+        const int status = run_report_command(paths, options, out, err);
+        return {status, out.str(), err.str()};
+    }
 
     std::string write(const std::string& name, std::string_view bytes) {
         const std::string path = directory / name;
