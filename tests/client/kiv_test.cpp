@@ -152,9 +152,9 @@ TEST_F(libkiv, a_full_queue_drops_and_counts_and_takes_again_once_there_is_room)
 TEST_F(libkiv, threads_and_forked_children_lose_nothing_and_keep_their_order) {
     constexpr int thread_count = 8, events_each = 500, child_count = 20;
     kiv_set_wait(handle.get(), 20'000);
-    std::vector<std::jthread> threads;
-    for (int i = 0; i < thread_count; ++i) {
-        threads.emplace_back([this, package = "p" + std::to_string(i)] {
+    std::vector<std::jthread> threads(thread_count);
+    for (std::jthread& thread : threads) {
+        thread = std::jthread([this, package = "p" + std::to_string(&thread - threads.data())] {
             for (int count = 0; count < events_each; ++count) {
                 EXPECT_EQ(send_counted(handle.get(), package, count), 0);
             }

@@ -158,8 +158,8 @@ void expect_list(const damage& d, std::string (*load_and_save)()) {
         if (!d.spares(i, terminator_size) || saved.find(record) != std::string::npos) continue;
         // A part whose id or name the one that was hit has now.
         const std::string key = record.c_str() + "::"s + (record.c_str() + record.find('\0') + 1);
-        const lines dropped = {"E kivd-conf: Dropped config line <" + key + ">."};
-        EXPECT_NE(std::ranges::search(log, dropped).begin(), log.end()) << key;
+        EXPECT_NE(std::ranges::find(log, "E kivd-conf: Dropped config line <" + key + ">."),
+                  log.end());
     }
     if (d.is_cut) {
         EXPECT_TRUE(saved == d.before() + d.whole.back() || (saved + d.before()).empty());

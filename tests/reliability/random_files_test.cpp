@@ -46,14 +46,14 @@ class random_files : directory_in_memory, public daemon_test {
         std::filesystem::rename("private", "sound");
     }
 
-    size_t below(size_t limit) { return limit > 0 ? random_() % limit : 0; }
+    size_t below(size_t limit) { return limit > 0 ? random() % limit : 0; }
 
     void spoil(const std::string& path) {
         std::string bytes = read_file(path);
         switch (below(8)) {
             case 0:
                 bytes.resize(below(5000));
-                for (char& byte : bytes) byte = static_cast<char>(random_());
+                for (char& byte : bytes) byte = static_cast<char>(random());
                 break;
             case 1:
                 bytes.resize(below(bytes.size()));
@@ -73,13 +73,13 @@ class random_files : directory_in_memory, public daemon_test {
                 return;
             default:
                 for (size_t i = below(8); i > 0 && !bytes.empty(); --i) {
-                    bytes[below(bytes.size())] = static_cast<char>(random_());
+                    bytes[below(bytes.size())] = static_cast<char>(random());
                 }
         }
         write_file(path, bytes);
     }
 
-    std::minstd_rand random_;  // the same each time
+    std::minstd_rand random;  // the same each time
 };
 
 TEST_F(random_files, never_keep_it_from_serving) {
