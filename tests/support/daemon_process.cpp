@@ -45,11 +45,11 @@ void become(const start_options& options, char* const* arguments, int output, in
     _exit(127);
 }
 
-std::string read_from_start(int fd) {
+std::string read_from(int fd, size_t start) {
     std::string text;
     std::array<char, 16384> piece;
     for (ssize_t n = 1; n > 0;) {
-        n = pread(fd, piece.data(), piece.size(), static_cast<off_t>(text.size()));
+        n = pread(fd, piece.data(), piece.size(), static_cast<off_t>(start + text.size()));
         if (n > 0) text.append(piece.data(), static_cast<size_t>(n));
     }
     return text;
@@ -87,6 +87,8 @@ daemon_process::daemon_process(const std::string& program, const start_options& 
         arguments.push_back(const_cast<char*>(each.c_str()));
     }
     arguments.push_back(nullptr);
+    // Its children log, too: where two of them share a position, one line would end up in another.
+    (void)fcntl(log_.get(), F_SETFL, O_APPEND);
     pid_ = fork();
     if (pid_ == 0) become(options, arguments.data(), output_.get(), log_.get());
 }
@@ -137,12 +139,12 @@ int daemon_process::stop() {
     return wait_exit();
 }
 
-std::string daemon_process::output() const { return read_from_start(output_.get()); }
+std::string daemon_process::output() const { return read_from(output_.get(), 0); }
 
-std::string daemon_process::log() const { return read_from_start(log_.get()); }
+std::string daemon_process::log(size_t from) const { return read_from(log_.get(), from); }
 
 bool daemon_process::wait_log(std::string_view text, size_t from) const {
-    return wait_until([&] { return log().find(text, from) != std::string::npos; });
+    return wait_until([&] { return log(from).find(text) != std::string::npos; });
 }
 
 size_t daemon_process::count_in_log(std::string_view text) const {

@@ -45,7 +45,7 @@ class daemon_process {
     [[nodiscard]] int stop();  // SIGTERM, then as above
 
     [[nodiscard]] std::string output() const;
-    [[nodiscard]] std::string log() const;
+    [[nodiscard]] std::string log(size_t from = 0) const;
     [[nodiscard]] bool wait_log(std::string_view text, size_t from = 0) const;
     [[nodiscard]] size_t count_in_log(std::string_view text) const;
 
