@@ -44,6 +44,15 @@ TEST_F(datagrams, each_is_handled_in_order_and_up_to_its_limit) {
     EXPECT_EQ(contents(next_report()), "P1; e1 ; e2 ; e3 ; n=5; ");
 }
 
+// Which the socket asks the kernel for before it has a name.
+TEST_F(datagrams, without_credentials_have_no_permission) {
+    for (const char* packet : {"DC 0", "EV p n"}) send(packet);
+    receive_dgram_client(handler);
+    EXPECT_EQ(take_log(), lines{"W kivd: setDataCollectionEnable (DC) request denied due to "
+                                "permission!"});
+    EXPECT_EQ(contents(next_report()), "P1; n ; ");
+}
+
 TEST_F(datagrams, attached_descriptors_never_become_ours) {
     const int on = 1;
     EXPECT_EQ(setsockopt(handler.fd, SOL_SOCKET, SO_PASSCRED, &on, sizeof on), 0);

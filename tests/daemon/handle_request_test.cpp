@@ -43,13 +43,7 @@ TEST_F(handle_request, values_and_payloads_are_what_follows_the_name) {
                                            " ; c=-2; d=2147483647; z=0; s:  night\t ; t: a; ");
 }
 
-TEST_F(handle_request, what_lacks_an_argument_is_named_and_dropped) {
-    for (const char* packet :
-         {"PA", "CI p n ", "SD p n ", "DC", "RM ", "SN", "IM", "SG", "DG", "RG n"}) {
-        EXPECT_EQ(ask(packet).substr(0, 8), "E kivd: ") << packet;
-    }
-    EXPECT_TRUE(is_data_collection_enabled());
-    while (!next_packet().empty()) continue;
+TEST_F(handle_request, what_is_refused_becomes_an_event_and_a_count) {
     (void)ask("XY z");
     EXPECT_EQ(next_packet(), "EV kiv DaemonError " + doc_example("log.md", "hex", "daemon-error"));
     EXPECT_EQ(next_packet(), "CI kiv Cnt_DaemonError 1");

@@ -73,8 +73,6 @@ TEST_F(diagnostics, are_kept_over_restarts_and_fetched_until_they_are_switched_o
     // What does not fit into the request is cut, to nothing if need be.
     EXPECT_EQ(ask(connect_client(packets).get(), "FN 750 0"), "1");
     EXPECT_EQ(ask(connect_client(packets).get(), "FN "), "-");
-    request({"FN"});
-    EXPECT_EQ(ask(connect_client(packets).get(), "FG 750"), "FAIL");
 
     request({"DC 0"});
     EXPECT_FALSE(exists("private/qz"));

@@ -1,0 +1,350 @@
+// What hostile clients do, as lists of steps, and what has to hold after each of them: the daemon
+// serves the others, and has kept neither descriptors nor memory.
+#pragma once
+
+#include <fcntl.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+
+#include <chrono>
+#include <concepts>
+#include <csignal>
+#include <cstring>
+#include <iostream>
+#include <set>
+#include <sstream>
+#include <thread>
+#include <tuple>
+
+#include "end_to_end/daemon_test.h"
+
+namespace kivd {
+
+// Sanitizers keep memory that is freed, and end the process when there is none.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool sanitized = true;
+#else
+constexpr bool sanitized = false;
+#endif
+
+// How a client's packets travel; on the stream socket either behind their headers, or as the bytes
+// that they are.
+enum class way : uint8_t { datagram, packets, framed, bytes };
+
+// One client at its work.
+struct attack {
+    daemon_process& daemon;
+    way via;
+    size_t log_start;
+    unique_fd client{};  // connected by the first step that needs it, and again after a hang-up
+    std::vector<unique_fd> others{};
+    std::vector<unique_fd> kept{};  // whatever it holds until its end
+    bool daemon_held = false;
+
+    int fd() {
+        if (!client.ok()) client = connect_client(std::min(socket_kind(via), socket_kind::stream));
+        return client.get();
+    }
+    [[nodiscard]] std::string packet(const std::string& text) const {
+        return via == way::framed ? framed(text) : text;
+    }
+    [[nodiscard]] bool has_logged(const std::string& text) const {
+        return daemon.log(log_start).find(text) != std::string::npos;
+    }
+};
+
+// A text is a step too: a packet, sent when the daemon has taken the one before.
+class step {
+ public:
+    step(std::string text)
+        : act_([text = std::move(text)](attack& a) {
+              EXPECT_TRUE(a.daemon_held || wait_taken(a.fd()));
+              EXPECT_TRUE(send_text(a.fd(), a.packet(text))) << strerror(errno);
+          }) {}
+    step(const char* text) : step(std::string(text)) {}
+    template <std::invocable<attack&> action>
+    step(action act) : act_(std::move(act)) {}
+    void operator()(attack& a) const { act_(a); }
+
+ private:
+    std::function<void(attack&)> act_;
+};
+using steps = std::vector<step>;
+
+inline void take(attack& a, const steps& all) {
+    for (const step& each : all) each(a);
+}
+
+inline step repeat(int count, steps all) {
+    return [=](attack& a) {
+        for (int i = 0; i < count; ++i) take(a, all);
+    };
+}
+
+// As fast as it goes. A # is the number of the packet, of seven digits and counted down.
+inline step flood(int count, std::string text) {
+    return [=](attack& a) {
+        const size_t mark = text.find('#');
+        std::string packet = text;
+        for (int i = count; i > 0; --i) {
+            if (mark != std::string::npos) {
+                packet.replace(mark, packet.size() - text.size() + 1, std::to_string(10000000 + i),
+                               1, 7);
+            }
+            ASSERT_TRUE(send_text(a.fd(), a.packet(packet))) << strerror(errno);
+        }
+    };
+}
+
+inline const step arrive = [](attack& a) { EXPECT_GE(a.fd(), 0); };
+inline const step hang_up = [](attack& a) { a.client.reset(); };
+inline const step keep = [](attack& a) { a.kept.push_back(std::move(a.client)); };
+inline const step release = [](attack& a) { a.kept.clear(); };
+
+// What is sent in between queues up and comes to the daemon at once.
+inline const step hold = [](attack& a) {
+    a.daemon_held = true;
+    a.daemon.send_signal(SIGSTOP);
+    siginfo_t stopped;
+    EXPECT_EQ(
+        waitid(P_PID, static_cast<id_t>(a.daemon.pid()), &stopped, WSTOPPED | WEXITED | WNOWAIT),
+        0);
+};
+inline const step let_go = [](attack& a) {
+    a.daemon_held = false;
+    a.daemon.send_signal(SIGCONT);
+};
+
+inline step half_close(int how) {
+    return [how](attack& a) { EXPECT_EQ(shutdown(a.fd(), how), 0); };
+}
+
+inline step out_of_band(char byte) {
+    return [byte](attack& a) { EXPECT_EQ(send(a.fd(), &byte, 1, MSG_OOB), 1); };
+}
+
+// All replies so far, which come one by one or together.
+inline step hears(std::string replies) {
+    return [=](attack& a) {
+        std::string heard;
+        for (size_t before = 1; heard.size() < replies.size() && before != heard.size();) {
+            before = heard.size();
+            heard += receive_text(a.fd());
+        }
+        EXPECT_EQ(heard, replies);
+    };
+}
+
+inline const step is_hung_up_on = [](attack& a) {
+    char byte = 0;
+    EXPECT_EQ(recv(a.fd(), &byte, 1, 0), 0);
+    a.client.reset();
+};
+
+inline step is_logged(std::string text) {
+    return [=](attack& a) { EXPECT_TRUE(wait_until([&] { return a.has_logged(text); })) << text; };
+}
+
+// They are connected from the first time on.
+inline const step others_ask = [](attack& a) {
+    if (a.others.empty()) {
+        for (const auto kind : {socket_kind::packets, socket_kind::stream}) {
+            a.others.push_back(connect_client(kind));
+        }
+    }
+    EXPECT_TRUE(send_text(a.others[0].get(), "IA") && send_text(a.others[1].get(), "HD 2 IA"));
+};
+inline const step others_are_answered = [](attack& a) {
+    for (const unique_fd& each : a.others) EXPECT_EQ(receive_text(each.get()), "1");
+};
+inline const step others_are_served = repeat(1, {others_ask, others_are_answered});
+
+inline const step daemon_is_idle = [](attack& a) { EXPECT_TRUE(a.daemon.wait_idle()); };
+
+template <class value>
+std::string bytes_of(const value& from) {
+    return {reinterpret_cast<const char*>(&from), sizeof from};
+}
+
+// Sends a packet with something attached to it, unless the kernel refuses that: 0 or the error.
+inline int send_with(attack& a, int type, const std::string& data, const std::string& text) {
+    std::string packet = a.packet(text);
+    std::vector<char> control(CMSG_SPACE(data.size()));
+    iovec piece = {packet.data(), packet.size()};
+    const msghdr message = {nullptr, 0, &piece, 1, control.data(), control.size(), 0};
+    *CMSG_FIRSTHDR(&message) = {CMSG_LEN(data.size()), SOL_SOCKET, type};
+    data.copy(reinterpret_cast<char*>(CMSG_DATA(CMSG_FIRSTHDR(&message))), data.size());
+    return sendmsg(a.fd(), &message, MSG_NOSIGNAL) < 0 ? errno : 0;
+}
+
+inline step attach(int type, std::string data, std::string text, int refusal) {
+    return [=](attack& a) {
+        const int error = send_with(a, type, data, text);
+        EXPECT_TRUE(error == 0 || error == refusal) << strerror(error);
+    };
+}
+
+// Takes a descriptor, good for reading only, out of a reply and keeps it.
+inline const step gets_descriptor = [](attack& a) {
+    char text[2];
+    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))];
+    iovec piece = {text, sizeof text};
+    msghdr message = {nullptr, 0, &piece, 1, control, sizeof control, 0};
+    ASSERT_EQ(recvmsg(a.fd(), &message, MSG_CMSG_CLOEXEC), 2);
+    ASSERT_NE(CMSG_FIRSTHDR(&message), nullptr);
+    int descriptor = -1;
+    memcpy(&descriptor, CMSG_DATA(CMSG_FIRSTHDR(&message)), sizeof descriptor);
+    a.kept.emplace_back(descriptor);
+    EXPECT_EQ(fcntl(descriptor, F_GETFL) & O_ACCMODE, O_RDONLY);
+};
+
+// As a user who has no permission and was never anybody else. To the kernel that is a matter of one
+// thread; the library would change them all.
+constexpr uid_t stranger = 65534;
+inline step as_stranger(steps all) {
+    return [=](attack& a) {
+        std::thread([&] {
+            EXPECT_EQ(syscall(SYS_setresuid, stranger, stranger, stranger), 0);
+            take(a, all);
+        }).join();
+        (void)prctl(PR_SET_DUMPABLE, 1);  // or sanitizers could not look at this process any more
+    };
+}
+
+inline std::string maybe(const std::string& text) { return "?" + text; }
+
+struct behaviour {
+    const char* name;
+    std::vector<way> ways;
+    steps what;
+    // Parts of all warnings and errors that it leads to, with N for a client's number; `maybe` for
+    // one that depends on the moment.
+    std::vector<std::string> logged = {};
+    std::string reply = {};
+    int64_t may_keep_kib = 1024;  // more where the daemon is to remember something
+};
+
+// Lets clients loose on one daemon.
+template <class test>
+class besieged : public test {
+ protected:
+    // Each behaviour on each of its ways.
+    void withstand(const start_options& options, const std::vector<behaviour>& behaviours) {
+        begin(options);
+        for (const behaviour& each : behaviours) {
+            for (const way via : each.ways) {
+                withstand(each, via);
+                if (testing::Test::HasFailure()) return;  // what follows would only wait
+            }
+        }
+        end(options);
+    }
+
+ private:
+    // Has everything open and in memory that stays from the first use on.
+    void begin(const start_options& options) {
+        (void)setenv("TSAN_OPTIONS", "report_thread_leaks=0", 0);  // a child has lost the bridge's
+        daemon_ = this->start(options);
+        attack a{daemon_, way::datagram, 0};
+        take(a, {hold, repeat(10, {std::string(31176, 'X'), hang_up}), let_go});
+        expect_service("the start");
+        descriptors_ = daemon_.descriptors();
+        anonymous_kib_ = first_kib_ = daemon_.anonymous_kib();
+    }
+
+    void withstand(const behaviour& each, way via) {
+        SCOPED_TRACE(testing::Message() << each.name << ", way " << static_cast<int>(via));
+        attack a{daemon_, via, daemon_.log().size()};
+        take(a, each.what);
+        if (a.client.ok() && via != way::datagram) {
+            take(a, {hears(each.reply), via == way::bytes ? "HD 2 IA" : "IA", hears("1")});
+        }
+        a.client.reset();
+        a.others.clear();
+        expect_service(each.name);
+        expect_nothing_kept(each.may_keep_kib);
+        expect_logged(each.logged, a.log_start);
+        ++behaviours_;
+    }
+
+    // In order, leaving nothing that somebody could not read.
+    void end(const start_options& options) {
+        std::cout << behaviours_ << " behaviours, slowest answer "
+                  << slowest_ / std::chrono::microseconds(1) << " us after '" << slowest_after_
+                  << "', " << daemon_.anonymous_kib() - first_kib_ << " KiB more\n";
+        request({"FL"});
+        EXPECT_TRUE(daemon_.wait_idle());
+        EXPECT_EQ(daemon_.stop(), 0) << daemon_.log();
+        EXPECT_GT(everything_kept().events_size(), 0);
+        daemon_ = this->start(options);
+        EXPECT_EQ(errors(daemon_), 0U) << daemon_.log();
+    }
+
+    // False too if a report was due just then, and took the event along.
+    bool takes_event() {
+        const std::string mark = "alive " + std::to_string(++marks_) + ";";
+        EXPECT_TRUE(send_text(connect_client(socket_kind::datagram).get(), "EV p alive " + mark));
+        const auto is_kept = [&] {
+            return read_file("private/events").find(mark) != std::string::npos;
+        };
+        return wait_until(is_kept, promised.count());
+    }
+
+    void expect_service(const char* after) {
+        for (const way via : {way::packets, way::framed}) {
+            const auto start = std::chrono::steady_clock::now();
+            attack other{daemon_, via, 0};
+            take(other, {"IA", hears("1")});
+            const auto took = std::chrono::steady_clock::now() - start;
+            EXPECT_LE(took, promised);
+            if (took > slowest_) std::tie(slowest_, slowest_after_) = std::tie(took, after);
+        }
+        EXPECT_TRUE(takes_event() || takes_event());
+    }
+
+    void expect_nothing_kept(int64_t may_keep_kib) {
+        EXPECT_TRUE(wait_until([this] { return daemon_.descriptors() == descriptors_; }))
+            << daemon_.descriptors() << " descriptors instead of " << descriptors_;
+        if (sanitized) return;
+        EXPECT_LT(daemon_.anonymous_kib(), anonymous_kib_ + may_keep_kib);
+        if (may_keep_kib > 1024) anonymous_kib_ = daemon_.anonymous_kib();
+    }
+
+    // These and nothing else, but for the end of a flood of errors.
+    void expect_logged(const std::vector<std::string>& texts, size_t start) {
+        std::set<std::string> logged;
+        std::istringstream log(daemon_.log(start));
+        std::string date, time, pid, tid, level, text;
+        while (log >> date >> time >> pid >> tid >> level && std::getline(log, text)) {
+            if (level == "I" || text.ends_with(" to prevent flooding.")) continue;
+            if (const size_t client = text.find("lient "); client != std::string::npos) {
+                const size_t number = client + strlen("lient ");
+                text.replace(number, text.find_first_not_of("0123456789", number) - number, "N");
+            }
+            logged.insert(level + text);
+        }
+        for (const std::string& each : texts) {
+            const bool optional = each.starts_with("?");
+            const auto is_this = [part = each.substr(optional ? 1 : 0)](const std::string& line) {
+                return line.find(part) != std::string::npos;
+            };
+            EXPECT_TRUE(std::erase_if(logged, is_this) > 0 || optional) << "not logged: " << each;
+        }
+        for (const std::string& line : logged) ADD_FAILURE() << "logged: " << line.substr(0, 200);
+    }
+
+    static constexpr std::chrono::milliseconds promised{1000};
+
+    daemon_process daemon_;
+    size_t descriptors_ = 0;
+    int64_t anonymous_kib_ = 0;
+    int64_t first_kib_ = 0;
+    int behaviours_ = 0;
+    int marks_ = 0;
+    std::chrono::steady_clock::duration slowest_{};
+    const char* slowest_after_ = "";
+};
+
+}  // namespace kivd
