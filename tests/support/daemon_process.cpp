@@ -87,6 +87,8 @@ daemon_process::daemon_process(const std::string& program, const start_options& 
         arguments.push_back(const_cast<char*>(each.c_str()));
     }
     arguments.push_back(nullptr);
+    // Its children log, too: where two of them share a position, one line would end up in another.
+    (void)fcntl(log_.get(), F_SETFL, O_APPEND);
     pid_ = fork();
     if (pid_ == 0) become(options, arguments.data(), output_.get(), log_.get());
 }
