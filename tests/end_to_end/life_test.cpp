@@ -91,47 +91,33 @@ TEST_F(life, disable_marker_keeps_it_waiting_for_its_end) {
     EXPECT_TRUE(exists("output/kiv_disabled"));
 }
 
-TEST_F(life, what_was_kept_survives_a_stop_and_a_kill) {
-    std::string device_id;
-    for (const int signal : {SIGTERM, SIGKILL}) {
-        SCOPED_TRACE(signal);
-        daemon_process daemon = start();
-        request({"CI p counter 5", "SD p static some text", "EV p event \0payload"s, "SG group"});
-        device_id = ask(connect_client(socket_kind::packets).get(), "GD");
-        EXPECT_EQ(device_id.size(), 36U);
-        if (signal == SIGTERM) {
-            expect_clean_stop(daemon);
-        } else {
-            request({"FS"});
-            write_file("private/kivd.state_tmp", "cut of");  // as a kill may leave them
-            write_file("private/counters.txt_", "cut of");
-            daemon.send_signal(signal);
-            EXPECT_EQ(daemon.wait_exit(), 128 + signal);
-            EXPECT_TRUE(exists("kiv_co"));
-        }
+TEST_F(life, what_was_kept_survives_a_stop) {
+    daemon_process daemon = start();
+    request({"CI p counter 5", "SD p static some text", "EV p event \0payload"s, "SG group"});
+    const std::string device_id = ask(connect_client(socket_kind::packets).get(), "GD");
+    EXPECT_EQ(device_id.size(), 36U);
+    expect_clean_stop(daemon);
 
-        // That data are collected comes from the state file.
-        daemon = start({});
-        EXPECT_EQ(ask(connect_client(socket_kind::packets).get(), "GD"), device_id);
-        request({"FL"});
-        const kiv::Report report = wait_report(1);
-        EXPECT_EQ(report.header().device_id(), device_id);
-        ASSERT_EQ(report.counters_size(), 1);
-        EXPECT_EQ(report.counters(0).value(), 5);
-        ASSERT_EQ(report.statics_size(), 1);
-        EXPECT_EQ(report.statics(0).value(), "some text");
-        ASSERT_EQ(report.events_size(), 1);
-        EXPECT_EQ(report.events(0).payload(), "\0payload"s);
-        request({"EV p event now with the group", "FL"});
-        const kiv::Report next = wait_report(2);
-        ASSERT_EQ(next.header().group_id_size(), 1);
-        EXPECT_EQ(next.header().group_id(0), "group");
-        EXPECT_EQ(next.counters_size() + next.statics_size(), 0);
+    // That data are collected comes from the state file.
+    daemon = start({});
+    EXPECT_EQ(ask(connect_client(socket_kind::packets).get(), "GD"), device_id);
+    request({"FL"});
+    const kiv::Report report = wait_report(1);
+    EXPECT_EQ(report.header().device_id(), device_id);
+    ASSERT_EQ(report.counters_size(), 1);
+    EXPECT_EQ(report.counters(0).value(), 5);
+    ASSERT_EQ(report.statics_size(), 1);
+    EXPECT_EQ(report.statics(0).value(), "some text");
+    ASSERT_EQ(report.events_size(), 1);
+    EXPECT_EQ(report.events(0).payload(), "\0payload"s);
+    request({"EV p event now with the group", "FL"});
+    const kiv::Report next = wait_report(2);
+    ASSERT_EQ(next.header().group_id_size(), 1);
+    EXPECT_EQ(next.header().group_id(0), "group");
+    EXPECT_EQ(next.counters_size() + next.statics_size(), 0);
 
-        expect_clean_stop(daemon);
-        EXPECT_EQ(errors(daemon), 0U) << daemon.log();
-        remove_everything_kept();
-    }
+    expect_clean_stop(daemon);
+    EXPECT_EQ(errors(daemon), 0U) << daemon.log();
 }
 
 // The compactor hangs on a pipe in the place of its own file until the test reads it.
