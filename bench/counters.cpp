@@ -11,6 +11,7 @@
 #include "bench/load.h"
 #include "bench/measure.h"
 #include "bench/sections.h"
+#include "config/filters.h"
 #include "daemon/request/handle_request.h"
 #include "report/state_file.h"
 #include "store/counter_store.h"
@@ -69,6 +70,7 @@ double daemon_round(const setup& s, unsigned counters, unsigned datagrams) {
 // Time from a packet in the receive buffer to the incremented counter, in us, without any socket.
 double time_in_process(unsigned counters, unsigned increments) {
     counters_init();
+    (void)load_filters();
     set_data_collection(true);
     const std::vector<std::string> packets = increment_packets(counters);
     static char buffer[packet_limit + 1];

@@ -101,9 +101,14 @@ recording read_recording() {
 }
 
 bool was_injected() {
-    const std::string trace = read_file(trace_file);
-    return trace.find("INJECTED") != std::string::npos ||
-           trace.find("killed by SIGKILL") != std::string::npos;
+    constexpr int tracer_limit_ms = 2000;  // it writes when the daemon may have ended already
+    return wait_until(
+        [] {
+            const std::string trace = read_file(trace_file);
+            return trace.find("INJECTED") != std::string::npos ||
+                   trace.find("killed by SIGKILL") != std::string::npos;
+        },
+        tracer_limit_ms);
 }
 
 void end_injection(const daemon_process& daemon) {
