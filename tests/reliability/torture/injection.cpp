@@ -73,7 +73,8 @@ std::vector<std::string> inject_arguments(const recording& all, const traced_cal
     }
     if (!injected.lasting) when[hit.name] = std::to_string(hit.number);
     for (const auto& [name, numbers] : when) {
-        const std::string what = "inject=" + name + ":" + injected.what + ":when=" + numbers;
+        std::string what = "inject=";
+        what.append(name).append(":").append(injected.what).append(":when=").append(numbers);
         arguments.insert(arguments.end(), {"-e", what});
     }
     return arguments;

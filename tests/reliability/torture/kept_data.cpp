@@ -85,6 +85,7 @@ records read_report(const std::string& path) {
     const std::string bytes = gunzip_file(sealed ? "../unsealed" : path);
     records read = read_records(bytes);
     read.whole = read.whole && report.ParseFromString(bytes);
+    read.sealed = sealed;
     return read;
 }
 

@@ -19,6 +19,7 @@ std::string event_record(const char* package, int id, size_t size);
 struct records {
     std::vector<int> ids;
     bool whole = true;
+    bool sealed = false;
 };
 
 struct kept_data {

@@ -9,7 +9,6 @@
 #include <thread>
 
 #include "reliability/torture/kept_data.h"
-#include "report.pb.h"
 #include "settings.pb.h"
 #include "support/config_package.h"
 #include "support/scratch_directory.h"
@@ -17,6 +16,7 @@
 namespace kivd {
 namespace {
 
+using namespace std::string_literals;
 using enum socket_kind;
 
 // clang-format off
@@ -35,33 +35,32 @@ const exchange steps[life_steps] = {
 constexpr size_t first_sealed_step = 4;
 constexpr size_t almost_full = 204600;  // a diagnostics file that the next event fills
 
-// Sends events until the daemon is gone, in between all else, and asks now and then whether it
-// lives.
-struct load_client {
-    void run() {
-        const unique_fd fd = connect_client(kind);
-        const auto send = [&](const std::string& request) {
-            return send_text(fd.get(), kind == stream ? framed(request) : request);
-        };
-        for (bool sent_all = true; sent_all;) {
-            sent_all = send(event_request(plain_package, end++, random() % 2000));
-            for (const auto& [request, odds] :
-                 {std::pair("CI p count 1", 50), std::pair("FL", 200), std::pair("FS", 200)}) {
-                if (sent_all && random() % odds == 0) sent_all = send(request);
-            }
-            if (!sent_all || kind == datagram || random() % 8 != 0) continue;
-            sent_all = send("IA") && receive_text(fd.get()) == "1";
-            if (sent_all) acknowledged = end;
-        }
-    }
-
-    socket_kind kind;
-    std::minstd_rand random;
-    int begin;                 // its first id
-    std::atomic<int> end;      // behind its last
-    int acknowledged = begin;  // behind the last that has to be there
-    std::jthread thread{[this] { run(); }};
+// Its events have the ids from `begin` to before `end`; those before `acknowledged` have to be
+// there.
+struct sender {
+    explicit sender(int first) : begin(first), end(first), acknowledged(first) {}
+    const int begin;
+    std::atomic<int> end;
+    int acknowledged;
 };
+
+// Until the daemon is gone. Sends all else in between, and asks now and then whether it lives.
+void send_load(socket_kind kind, std::minstd_rand random, sender& own) {
+    const unique_fd fd = connect_client(kind);
+    const auto send = [&](const std::string& request) {
+        return send_text(fd.get(), kind == stream ? framed(request) : request);
+    };
+    for (bool sent = true; sent;) {
+        sent = send(event_request(plain_package, own.end++, random() % 2000));
+        for (const auto& [request, odds] :
+             {std::pair("CI p count 1", 50U), std::pair("FL", 200U), std::pair("FS", 200U)}) {
+            if (sent && random() % odds == 0) sent = send(request);
+        }
+        if (!sent || kind == datagram || random() % 8 != 0) continue;
+        sent = send("IA") && receive_text(fd.get()) == "1";
+        if (sent) own.acknowledged = own.end;
+    }
+}
 
 void kill_with_children(const daemon_process& daemon) {
     const std::string process = "/proc/" + std::to_string(daemon.pid());
@@ -75,12 +74,11 @@ void kill_with_children(const daemon_process& daemon) {
 }
 
 // Up to some point all is there that was sent, and nothing behind it.
-void check_prefix(const load_client& client, const std::set<int>& there) {
-    int id = client.begin;
+void check_prefix(const sender& own, const std::set<int>& there) {
+    int id = own.begin;
     while (there.contains(id)) ++id;
-    EXPECT_GE(id, client.acknowledged);
-    const auto next = there.lower_bound(id);
-    EXPECT_TRUE(next == there.end() || *next >= client.end) << *next << " without " << id;
+    EXPECT_GE(id, own.acknowledged);
+    while (++id < own.end) EXPECT_FALSE(there.contains(id)) << id << " without those before it";
 }
 
 }  // namespace
@@ -109,13 +107,9 @@ void make_place(journal& noted) {
         write_file("private/" + std::string(name), "cut of");
     }
     write_file("private/qz/qz_1", event_record(diag_package, 1, almost_full));
-    kiv::Report header;
-    header.mutable_header()->set_product_id("product");
-    header.mutable_header()->set_software_version("");
-    header.mutable_header()->set_software_variant("");
-    header.mutable_header()->set_device_id("");
+    const std::string header = "\x0a\x08\x0a\0\x12\0\x1a\0\x22\0"s;
     const std::string event = event_record(plain_package, 2, 100);
-    write_file("private/events", header.SerializePartialAsString() + event + event.substr(0, 20));
+    write_file("private/events", header + event + event.substr(0, 20));
     noted.last_id = 2;
     noted.sent = {1, 2};
     noted.logged = {1};
@@ -127,41 +121,42 @@ void live(daemon_process& daemon, journal& noted, const std::function<void(size_
     for (size_t step = 0; step < life_steps; ++step) {
         SCOPED_TRACE("step " + std::to_string(step));
         before_step(step);
-        if (step == first_sealed_step) install_report_key();
+        if (step == first_sealed_step) install_report_key(noted);
         if (!carry_out(steps[step], daemon, noted)) return;
     }
 }
 
 daemon_process kill_under_load(std::minstd_rand random, journal& noted) {
-    int begin[] = {ids_of_a_sender, 2 * ids_of_a_sender, 3 * ids_of_a_sender, 4 * ids_of_a_sender};
+    int first[] = {ids_of_a_sender, 2 * ids_of_a_sender, 3 * ids_of_a_sender, 4 * ids_of_a_sender};
     daemon_process daemon = start_again(noted);
     for (int kills = 0; kills < kills_under_load; ++kills) {
         SCOPED_TRACE("kill " + std::to_string(kills));
-        std::list<load_client> clients;
-        for (const socket_kind kind : {datagram, packets, packets, stream}) {
-            const int first = begin[clients.size()];
-            clients.emplace_back(kind, std::minstd_rand(random()), first, first);
+        std::list<sender> senders(std::begin(first), std::end(first));
+        {
+            std::list<std::jthread> threads;
+            const socket_kind kinds[] = {datagram, packets, packets, stream};
+            for (const socket_kind* kind = kinds; sender & own : senders) {
+                threads.emplace_back(send_load, *kind++, std::minstd_rand(random()), std::ref(own));
+            }
+            const int enough = static_cast<int>(random() % 1500);
+            EXPECT_TRUE(wait_until([&] {
+                int sent = 0;
+                for (const sender& own : senders) sent += own.end - own.begin;
+                return sent >= enough;
+            }));
+            std::this_thread::sleep_for(std::chrono::microseconds(random() % 2000));
+            if (random() % 2 == 0) kill_with_children(daemon);
+            daemon.send_signal(SIGKILL);
         }
-        const auto enough = static_cast<int>(random() % 1500);
-        EXPECT_TRUE(wait_until([&] {
-            int sent = 0;
-            for (const load_client& client : clients) sent += client.end - client.begin;
-            return sent >= enough;
-        }));
-        std::this_thread::sleep_for(std::chrono::microseconds(random() % 2000));
-        if (random() % 2 == 0) kill_with_children(daemon);
-        daemon.send_signal(SIGKILL);
         EXPECT_EQ(daemon.wait_exit(), 128 + SIGKILL);
-        for (load_client& client : clients) client.thread.join();
         wait_orphans();
-
-        for (size_t i = 0; const load_client& client : clients) {
-            begin[i++] = client.end;
-            for (int id = client.begin; id < client.end; ++id) noted.sent.insert(id);
-            for (int id = client.begin; id < client.acknowledged; ++id) noted.kept.insert(id);
+        for (int* next = first; const sender& own : senders) {
+            for (*next = own.begin; *next < own.end; ++*next) noted.sent.insert(*next);
+            for (int id = own.begin; id < own.acknowledged; ++id) noted.kept.insert(id);
+            ++next;
         }
         const std::set<int> there = check_files(noted);
-        for (const load_client& client : clients) check_prefix(client, there);
+        for (const sender& own : senders) check_prefix(own, there);
         daemon = start_again(noted);
     }
     return daemon;

@@ -18,10 +18,11 @@ struct journal {
     int last_id = 0;
     int64_t last_value = 0;  // of the counter and the static value
     int64_t saved_value = 0;
-    std::set<int> sent;    // may be there, once
-    std::set<int> kept;    // acknowledged
-    std::set<int> logged;  // acknowledged, in the diagnostics
-    std::set<int> seen;    // there before a flush that replaces, or deletes to make room
+    std::set<int> sent;               // may be there, once
+    std::set<int> kept;               // acknowledged
+    std::set<int> logged;             // acknowledged, in the diagnostics
+    std::set<int> seen;               // there before a flush that replaces, or deletes to make room
+    size_t plain_reports = SIZE_MAX;  // the first ones, before there was a report key
     bool configured = false;
     std::string device_id;
 
@@ -38,7 +39,8 @@ size_t errors(const daemon_process& daemon);
 void wait_children(const daemon_process& daemon);
 // Until the last process that a killed daemon left behind has ended.
 void wait_orphans();
-void install_report_key();
+// Reports are sealed from now on.
+void install_report_key(journal& noted);
 
 // Events and values, then a request if there is one, then IA.
 struct exchange {
@@ -58,5 +60,8 @@ void note_seen(journal& noted);
 daemon_process start_again(journal& noted);
 // That all it is asked for succeeds, and that it stops without anything temporary left.
 void check_service_and_stop(daemon_process& daemon, journal& noted);
+
+// Both.
+void check_restart(journal& noted);
 
 }  // namespace kivd
