@@ -35,6 +35,12 @@ void measure_latency(const setup& s) {
     const unique_fd bare_connection = connect_control(bare_directory.path());
     const unique_fd connection = connect_control(directory.path());
 
+    // On one processor: to wake another one out of its sleep takes longer than all else, and
+    // whether that is needed is the scheduler's choice.
+    const pinned_thread client_pinned(0, 0);
+    const pinned_thread server_pinned(server.pid(), 0);
+    const pinned_thread daemon_pinned(daemon.process.pid(), 0);
+
     samples bare;
     samples real;
     samples unused;
