@@ -48,7 +48,9 @@ struct sender {
 void send_load(socket_kind kind, std::minstd_rand random, sender& own) {
     const unique_fd fd = connect_client(kind);
     const auto send = [&](const std::string& request) {
-        return send_text(fd.get(), kind == stream ? framed(request) : request);
+        // On a stream, what is read together is dropped together.
+        if (kind == stream) return send_text(fd.get(), framed(request)) && wait_taken(fd.get());
+        return send_text(fd.get(), request);
     };
     for (bool sent = true; sent;) {
         sent = send(event_request(plain_package, own.end++, random() % 2000));

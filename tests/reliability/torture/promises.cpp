@@ -20,7 +20,7 @@ const std::regex described_at_start(
     "kivd-conf: (Failed to (open /system/etc/kivd.conf|(unpack|verify) configuration)|Corrupt file)"
     "|kivd-util: Failed to read file: Success|kivd-error: Tried to generate error probe data");
 const std::regex lasting_file(
-    "events|flushed_data|counters\\.txt|sdata\\.txt|kivd\\.state|header_info\\.conf"
+    "events|counters\\.txt|sdata\\.txt|kivd\\.state|header_info\\.conf"
     "|config_list\\.txt|conf_[0-9]+\\.bin|filters\\.txt|qz|qz_compressed");
 
 void append(std::vector<int>& to, const std::vector<int>& more) {
