@@ -1,5 +1,6 @@
 #include "config/intake.h"
 
+#include <algorithm>
 #include <map>
 
 #include "config/config_parts.h"
@@ -53,6 +54,25 @@ class intake : public scratch_directory {
 std::string part(const char* package, const char* name) {
     const auto bytes = read_whole_fd(get_config_fd(package, name));
     return bytes ? std::string(bytes->data.get(), bytes->data.get() + bytes->size) : "none";
+}
+
+TEST_F(intake, collectors_that_cannot_be_told_keep_no_configuration_out) {
+    const auto told_of = [](const std::string& what) {
+        const lines log = take_log();
+        return std::ranges::count_if(
+            log, [&](const std::string& line) { return line.find(what) != std::string::npos; });
+    };
+    const char* const request = "output/config_request";
+    fs::remove(request);
+    fs::create_symlink("/dev/full", request);
+    ASSERT_TRUE(take(config_file({{"a", "x", "1"}})));
+    EXPECT_EQ(told_of("E kivd-conf: Config request write "), 2);
+    fs::remove(request);
+    fs::create_directory(request);
+    ASSERT_TRUE(take(config_file({{"a", "x", "2"}})));
+    EXPECT_EQ(told_of("E kivd-conf: Failed to open configuration request output/config_request <"),
+              1);
+    EXPECT_EQ(part("a", "x"), "2");
 }
 
 TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {

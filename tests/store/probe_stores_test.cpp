@@ -74,6 +74,13 @@ TEST_F(probe_stores, the_expired_are_left_out_of_the_files_only) {
     EXPECT_EQ(reported(1003001), "P1; s2: x; ");  // what was set again to the same has not changed
     restart();
     EXPECT_EQ(reported(0), "test_id; c2=1; s1: x; ");
+
+    get_limits().expire_counters_age = 0;  // never
+    set_test_clock(1000000);
+    counters_update("p", "c3", 1, counter_mode::set);
+    counters_save();
+    restart();
+    EXPECT_EQ(reported(0), "test_id; c2=1; c3=1; s1: x; ");
 }
 
 TEST_F(probe_stores, malformed_records_cost_no_others) {
