@@ -14,7 +14,7 @@
 #include "config/filters.h"
 #include "daemon/request/handle_request.h"
 #include "report/state_file.h"
-#include "store/counter_store.h"
+#include "store/counters.h"
 
 namespace kivd::bench {
 

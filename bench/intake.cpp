@@ -12,7 +12,7 @@
 #include "bench/measure.h"
 #include "bench/plain_file.h"
 #include "bench/sections.h"
-#include "config/config_file.h"
+#include "intake/config_file.h"
 
 namespace kivd::bench {
 

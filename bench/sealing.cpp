@@ -15,7 +15,7 @@
 #include "bench/measure.h"
 #include "bench/plain_file.h"
 #include "bench/sections.h"
-#include "report/header_record.h"
+#include "record/header_record.h"
 #include "report/report_sealing.h"
 #include "security/key_paths.h"
 #include "security/seal.h"

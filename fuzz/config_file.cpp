@@ -2,9 +2,9 @@
 #include <algorithm>
 
 #include "config/config_parts.h"
-#include "config/intake.h"
 #include "config/limits.h"
 #include "fuzz/harness.h"
+#include "intake/intake.h"
 #include "report/state_file.h"
 #include "util/paths.h"
 

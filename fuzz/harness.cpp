@@ -19,13 +19,13 @@
 #include "config/config_parts.h"
 #include "config/filters.h"
 #include "config/limits.h"
-#include "daemon/error/daemon_error.h"
 #include "diag/diag_store.h"
-#include "report/header_record.h"
+#include "record/header_record.h"
 #include "report/state_file.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "runtime/daemon_error.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -86,7 +86,7 @@ void require(bool holds, const char* what_went_wrong) {
 }
 
 void clear_files() {
-    qz_set_active(0);  // a directory of its own
+    diag_set_active(0);  // a directory of its own
     for (const char* directory : directories) clear_directory(directory);
 }
 
@@ -116,16 +116,16 @@ void reset_state() {
 started_modules::started_modules() : open_descriptors_(count_open_descriptors()) {
     reset_state();
     counters_init();
-    sdata_init();
+    static_data_init();
     pack_report_header();
     load_config_list();
     (void)load_filters();
 }
 
 started_modules::~started_modules() {
-    counters_free();
-    sdata_free();
-    free_header();
+    counters_release();
+    static_data_release();
+    release_header();
     release_filters();
     release_config_list();
     if (events_pending()) (void)events_flush();  // which closes the file

@@ -1,7 +1,7 @@
 // The identity that is given by hand, in private/header_info.conf.
 #include "fuzz/harness.h"
+#include "record/header_record.h"
 #include "report.pb-c.h"
-#include "report/header_record.h"
 #include "report/identity.h"
 #include "report/state_file.h"
 #include "util/paths.h"
@@ -31,10 +31,10 @@ int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         const started_modules modules;
         header = updated_header();
         require(updated_header() == header, "a second look at the same file changes the header");
-        config_save();
+        state_save();
     }
     const started_modules modules;
-    config_load();
+    state_load();
     require(updated_header() == header, "a restart changes the header");
     return 0;
 }

@@ -6,10 +6,10 @@
 
 #include "config/config_parts.h"
 #include "config/filters.h"
+#include "format/probe_key.h"
 #include "fuzz/harness.h"
-#include "store/counter_store.h"
-#include "store/probe_key.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/static_data.h"
 #include "util/clock.h"
 #include "util/paths.h"
 
@@ -28,11 +28,11 @@ void save_counters() {
 }
 
 void save_static_data() {
-    sdata_set("fuzz", "touched", "before");
+    static_data_set("fuzz", "touched", "before");
     stop_clock();
-    sdata_set("fuzz", "touched", "after");
+    static_data_set("fuzz", "touched", "after");
     stop_clock();
-    sdata_save();
+    static_data_save();
 }
 
 struct list_kind {

@@ -25,7 +25,7 @@ void check_kept(input_bytes input) {
 
 int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     kivd::reset_state();
-    if (kivd::qz_log_message_check({reinterpret_cast<const char*>(data), size})) {
+    if (kivd::is_kept_log_message({reinterpret_cast<const char*>(data), size})) {
         kivd::check_kept({data, size});
     }
     return 0;

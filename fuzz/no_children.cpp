@@ -2,8 +2,8 @@
 // process with sanitizers takes longer than most inputs do, and no input may start a program.
 #include <cerrno>
 
-#include "daemon/error/child_process.h"
 #include "fuzz/harness.h"
+#include "runtime/child_process.h"
 
 namespace kivd {
 

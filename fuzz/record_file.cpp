@@ -1,5 +1,5 @@
 // Mending of record files.
-#include "report/record_file.h"
+#include "record/record_file.h"
 
 #include "fuzz/harness.h"
 

@@ -12,7 +12,7 @@
 #include "daemon/net/packet_buffer.h"
 #include "daemon/request/handle_request.h"
 #include "fuzz/harness.h"
-#include "report/record_file.h"
+#include "record/record_file.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -47,7 +47,7 @@ class datagram_message {
 std::string ask(int fd, std::string_view packet, const msghdr* message) {
     const auto block = std::make_unique<char[]>(packet.size() + 1 + max_reply_size);
     packet.copy(block.get(), packet.size());
-    const size_t size = handle_request(fd, {block.get(), packet.size()}, message);
+    const size_t size = handle_request(fd, {block.get(), packet.size()}, message).size;
     require(size <= max_reply_size, "a reply is too long");
     return {block.get(), size};
 }

@@ -10,8 +10,8 @@ namespace {
 // The file as the next stop would leave it, but for the line that tells the time.
 std::string load_and_save() {
     reset_state();
-    config_load();
-    config_save();
+    state_load();
+    state_save();
     std::string saved = read_file(paths::state);
     const size_t start = saved.find("shutdown-time:");
     require(start != std::string::npos, "nothing was saved");

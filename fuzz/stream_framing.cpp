@@ -12,7 +12,7 @@
 #include <cstring>
 #include <vector>
 
-#include "daemon/event_loop.h"
+#include "daemon/loop/event_loop.h"
 #include "daemon/net/connections.h"
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/wait.h"

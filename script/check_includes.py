@@ -1,9 +1,11 @@
 #!/usr/bin/env python3
-"""Fails when the modules of a source folder include each other in a circle.
+"""Fails when the modules of a source tree, or its folders, include each other in a circle.
 
-A module is the header and the source files of one name ("store/sorted_list.h" and
-"store/sorted_list.cpp"); it stands above every module whose header one of its files includes. With
-no circle the modules form a ladder, and each can be read and tested on those below it alone.
+A module is the header and the source files of one name ("list/sorted_list.h" and
+"list/sorted_list.cpp"); it stands above every module whose header one of its files includes. A
+folder stands above every folder whose modules one of its own modules includes; what lies in a folder
+inside it counts for that one alone. With no circle both form a ladder, and each can be read and
+tested on those below it alone.
 """
 
 import pathlib
@@ -33,8 +35,21 @@ def read_modules(root):
     return modules
 
 
+def folders_of(modules):
+    """Gives, for each folder, the folders it includes and the file that does."""
+    folders = {}
+    for name, included in modules.items():
+        folder = str(pathlib.PurePosixPath(name).parent)
+        above = folders.setdefault(folder, {})
+        for target, file in included.items():
+            below = str(pathlib.PurePosixPath(target).parent)
+            if below != folder:
+                above.setdefault(below, file)
+    return folders
+
+
 def find_circle(modules):
-    """Gives one circle as a list of modules whose last is its first again, or None."""
+    """Gives one circle as a list of names whose last is its first again, or None."""
     finished = set()
 
     def visit(name, path):
@@ -63,13 +78,16 @@ def main():
     modules = read_modules(root)
     if not modules:
         sys.exit(f"{root} holds no source files")
-    circle = find_circle(modules)
-    if circle:
-        print("The includes run in a circle:", file=sys.stderr)
-        for upper, lower in zip(circle, circle[1:]):
-            print(f"  {upper} includes {lower} (in {modules[upper][lower]})", file=sys.stderr)
-        sys.exit(1)
-    print(f"{len(modules)} modules, {sum(map(len, modules.values()))} includes, no circle")
+    folders = folders_of(modules)
+    for kind in (modules, folders):
+        circle = find_circle(kind)
+        if circle:
+            print("The includes run in a circle:", file=sys.stderr)
+            for upper, lower in zip(circle, circle[1:]):
+                print(f"  {upper} includes {lower} (in {kind[upper][lower]})", file=sys.stderr)
+            sys.exit(1)
+    includes = sum(map(len, modules.values()))
+    print(f"{len(modules)} modules in {len(folders)} folders, {includes} includes, no circle")
 
 
 if __name__ == "__main__":

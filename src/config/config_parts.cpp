@@ -8,12 +8,12 @@
 #include <cstdio>
 #include <cstdlib>
 
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/log_and_raise.h"
+#include "format/probe_key.h"
+#include "list/list_file.h"
+#include "list/sorted_list.h"
 #include "platform/android_log.h"
-#include "store/list_file.h"
-#include "store/probe_key.h"
-#include "store/sorted_list.h"
+#include "runtime/daemon_error.h"
+#include "runtime/log_and_raise.h"
 #include "util/numbers.h"
 #include "util/paths.h"
 
@@ -33,7 +33,7 @@ struct config_item {
     int32_t in_use;  // 1 while in force
 };
 
-constinit sorted_list* config_list_p = nullptr;
+constinit sorted_list* parts = nullptr;
 
 struct part_path {
     explicit part_path(int32_t id) { snprintf(text, sizeof text, paths::config_part_format, id); }
@@ -41,7 +41,7 @@ struct part_path {
 };
 
 config_item* find_item(const probe_key& key) {
-    return static_cast<config_item*>(list_find(*config_list_p, &key));
+    return static_cast<config_item*>(list_find(*parts, &key));
 }
 
 void* make_item(const probe_key& key, int32_t id, int32_t in_use) {
@@ -89,7 +89,7 @@ int32_t id_of(const void* element) {
 
 // Drops each item that is equal to a neighbour, and that one too.
 void drop_equal_items(auto equal) {
-    sorted_list& list = *config_list_p;
+    sorted_list& list = *parts;
     uint32_t kept = 0;
     bool equals_last = false;
     for (uint32_t i = 0; i < list.count; ++i) {
@@ -112,7 +112,7 @@ void drop_equal_items(auto equal) {
 // is, or that are not found where they stand. A part that is dropped gets a new id when it comes
 // with a configuration.
 void repair_list() {
-    const auto items = [] { return std::span(config_list_p->elements, config_list_p->count); };
+    const auto items = [] { return std::span(parts->elements, parts->count); };
     std::ranges::sort(items(), {}, id_of);
     drop_equal_items([](const void* a, const void* b) { return id_of(a) == id_of(b); });
     std::ranges::sort(items(), [](void* a, void* b) { return compare_probes(a, b) < 0; });
@@ -121,9 +121,8 @@ void repair_list() {
 
 int32_t highest_id() {
     int32_t highest = 0;
-    list_foreach<config_item>(*config_list_p, [&highest](const config_item& item) {
-        highest = std::max(highest, item.id);
-    });
+    list_foreach<config_item>(
+        *parts, [&highest](const config_item& item) { highest = std::max(highest, item.id); });
     return highest;
 }
 
@@ -132,9 +131,9 @@ void repair_last_id() {
     if (config_item* const last = find_item(last_id_key)) {
         last->id = highest_id();
         last->in_use = 0;
-    } else if (config_list_p->count > 0) {
+    } else if (parts->count > 0) {
         void* added = make_item(last_id_key, highest_id(), 0);
-        if (added != nullptr) (void)list_add(*config_list_p, added);
+        if (added != nullptr) (void)list_add(*parts, added);
     }
 }
 
@@ -145,7 +144,7 @@ int32_t take_new_id() {
     }
     void* first = make_item(last_id_key, 1, 0);
     if (first == nullptr) return 0;
-    if (list_add(*config_list_p, first) == 1) return 1;
+    if (list_add(*parts, first) == 1) return 1;
     free(first);
     return 0;
 }
@@ -155,7 +154,7 @@ config_item* add_item(const probe_key& key) {
     if (id < 1) return nullptr;
     void* added = make_item(key, id, 1);
     if (added == nullptr) return nullptr;
-    if (list_add(*config_list_p, added) == 1) return static_cast<config_item*>(added);
+    if (list_add(*parts, added) == 1) return static_cast<config_item*>(added);
     (void)log_and_raise(tag, "Failed to add new config item: list_add.");
     free(added);
     return nullptr;
@@ -172,14 +171,14 @@ void write_part(int32_t id, std::span<const uint8_t> payload) {
 }  // namespace
 
 void load_config_list() {
-    config_list_p = list_create(32, 16, compare_probes, nullptr);
-    if (config_list_p == nullptr) fatal_error("OOM, while creating config_list_p");
-    (void)list_load(*config_list_p, paths::config_list, parse_record, nullptr);
+    parts = list_create(32, 16, compare_probes, nullptr);
+    if (parts == nullptr) fatal_error("OOM, while creating config_list_p");
+    (void)list_load(*parts, paths::config_list, parse_record, nullptr);
     repair_list();
     repair_last_id();
 }
 
-void release_config_list() { list_destroy(config_list_p); }
+void release_config_list() { list_destroy(parts); }
 
 unique_fd get_config_fd(const char* package, const char* name) {
     const config_item* const item = find_item({package, name});
@@ -194,7 +193,7 @@ std::optional<file_bytes> read_own_part(const char* name) {
 }
 
 void retire_config_parts() {
-    list_foreach<config_item>(*config_list_p, [](config_item& item) { item.in_use = 0; });
+    list_foreach<config_item>(*parts, [](config_item& item) { item.in_use = 0; });
 }
 
 void store_config_part(const char* package, const char* name, std::span<const uint8_t> payload) {
@@ -211,11 +210,11 @@ void store_config_part(const char* package, const char* name, std::span<const ui
 }
 
 bool save_config_list() {
-    return list_save(*config_list_p, paths::config_list, write_record, nullptr) != 0;
+    return list_save(*parts, paths::config_list, write_record, nullptr) != 0;
 }
 
 void delete_retired_parts() {
-    list_foreach<config_item>(*config_list_p, [](const config_item& item) {
+    list_foreach<config_item>(*parts, [](const config_item& item) {
         if (item.in_use == 0 && !is_last_id(item.key)) (void)unlink(part_path(item.id).text);
     });
 }

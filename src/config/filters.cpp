@@ -11,11 +11,11 @@
 
 #include "config.pb-c.h"
 #include "config/config_parts.h"
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/log_and_raise.h"
-#include "store/list_file.h"
-#include "store/probe_key.h"
-#include "store/sorted_list.h"
+#include "format/probe_key.h"
+#include "list/list_file.h"
+#include "list/sorted_list.h"
+#include "runtime/daemon_error.h"
+#include "runtime/log_and_raise.h"
 #include "util/paths.h"
 
 namespace kivd {

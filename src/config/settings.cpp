@@ -4,9 +4,9 @@
 
 #include "config/config_parts.h"
 #include "config/limits.h"
-#include "daemon/error/log_and_raise.h"
-#include "daemon/stop.h"
 #include "platform/android_log.h"
+#include "runtime/log_and_raise.h"
+#include "runtime/stop.h"
 #include "settings.pb-c.h"
 #include "util/paths.h"
 

@@ -10,13 +10,13 @@
 #include <cstring>
 
 #include "config/limits.h"
-#include "daemon/error/daemon_error.h"
+#include "daemon/loop/save_clock.h"
 #include "daemon/net/delays.h"
 #include "daemon/option_names.h"
-#include "daemon/save_clock.h"
 #include "platform/android_log.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "runtime/daemon_error.h"
 #include "security/debug_encrypt.h"
 #include "security/key_paths.h"
 #include "security/verify_config_command.h"

@@ -12,32 +12,32 @@
 #include <cstring>
 
 #include "config/config_parts.h"
-#include "config/config_request.h"
 #include "config/filters.h"
-#include "config/intake.h"
 #include "config/limits.h"
-#include "config/run_actions.h"
 #include "daemon/debug/debug_interface.h"
-#include "daemon/error/child_process.h"
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/give_up.h"
-#include "daemon/event_loop.h"
 #include "daemon/kernel/kernel_bridge.h"
+#include "daemon/loop/event_loop.h"
+#include "daemon/loop/save_clock.h"
 #include "daemon/net/client_sockets.h"
 #include "daemon/options.h"
-#include "daemon/save_clock.h"
-#include "daemon/stop.h"
 #include "diag/diag_store.h"
+#include "intake/config_request.h"
+#include "intake/intake.h"
+#include "intake/run_actions.h"
 #include "platform/android_log.h"
-#include "report/header_record.h"
+#include "record/header_record.h"
+#include "record/record_file.h"
 #include "report/identity.h"
 #include "report/output_dir.h"
-#include "report/record_file.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "runtime/child_process.h"
+#include "runtime/daemon_error.h"
+#include "runtime/give_up.h"
+#include "runtime/stop.h"
 #include "security/key_paths.h"
-#include "store/counter_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/static_data.h"
 #include "util/clock.h"
 #include "util/file_io.h"
 #include "util/paths.h"
@@ -168,9 +168,9 @@ void load_everything() {
     daemon_error_init(paths::working_dir);
     rescue_event_file(paths::events, record_header::expected);
     counters_init();
-    sdata_init();
+    static_data_init();
     init_header(get_header_record());
-    config_load();
+    state_load();
     (void)prune_dir();
     ensure_device_id();
     update_header_info();
@@ -181,9 +181,9 @@ void load_everything() {
 }
 
 void release_all() {
-    counters_free();
-    sdata_free();
-    free_header();
+    counters_release();
+    static_data_release();
+    release_header();
     release_filters();
     release_config_list();
 }
@@ -192,10 +192,10 @@ void shut_down() {
     join_kernel_bridge();
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting down...");
     counters_save();
-    sdata_save();
-    config_save();
+    static_data_save();
+    state_save();
     wait_for_compactor();  // a restart must not meet a file half written
-    qz_wait_for_compressor();
+    diag_wait_for_compressor();
     // The lock file goes last: as soon as it is gone a new daemon may make sockets of its own.
     remove_client_sockets();
     (void)unlink(paths::lock_file);
@@ -222,7 +222,7 @@ int run_daemon(int argc, char** argv) {
     create_client_sockets();
     if (given.debug_interface) {
         __android_log_print(ANDROID_LOG_INFO, tag, "kivddi (kivd debug interface) Enabled.");
-        di_start();
+        debug_start();
     }
     mark_saved();
     run_actions();

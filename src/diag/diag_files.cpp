@@ -11,8 +11,8 @@
 #include <string_view>
 #include <utility>
 
-#include "daemon/error/log_and_raise.h"
 #include "platform/android_log.h"
+#include "runtime/log_and_raise.h"
 #include "util/directory.h"
 #include "util/file_io.h"
 #include "util/paths.h"
@@ -80,12 +80,12 @@ void delete_all_diag_entries() {
     });
 }
 
-unique_fd qz_file_open(int32_t number) {
+unique_fd open_diag_file(int32_t number) {
     unique_fd compressed = open_regular(diag_path('y', number).text);
     return compressed.ok() ? std::move(compressed) : open_regular(diag_path('z', number).text);
 }
 
-int32_t qz_file_next(int32_t number) {
+int32_t next_diag_file(int32_t number) {
     (void)scan_diag_files(exported);
     const int64_t next = int64_t{number} + 1;
     if (exported.lowest > exported.highest || exported.highest < next) return -1;

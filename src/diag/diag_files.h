@@ -31,11 +31,11 @@ void delete_diag_files(int32_t from, int32_t to);
 void delete_all_diag_entries();
 
 // The file of that number to read, compressed if it is so; not ok when there is none.
-[[nodiscard]] unique_fd qz_file_open(int32_t number);
+[[nodiscard]] unique_fd open_diag_file(int32_t number);
 
 // The number of the file behind `number`: the lowest there is when that comes before it. -1 when
 // there is none. Numbers between the lowest and the highest count as files, whether or not they are
 // there.
-[[nodiscard]] int32_t qz_file_next(int32_t number);
+[[nodiscard]] int32_t next_diag_file(int32_t number);
 
 }  // namespace kivd

@@ -11,14 +11,14 @@
 #include <iterator>
 #include <string_view>
 
-#include "daemon/error/child_process.h"
-#include "daemon/error/log_and_raise.h"
 #include "diag/diag_files.h"
-#include "diag/gzip_file.h"
 #include "diag/log_message.h"
 #include "platform/android_log.h"
-#include "report/event_record.h"
-#include "report/record_file.h"
+#include "record/event_record.h"
+#include "record/gzip_file.h"
+#include "record/record_file.h"
+#include "runtime/child_process.h"
+#include "runtime/log_and_raise.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -37,10 +37,10 @@ struct selection {
 constexpr selection selections[] = {
     {"devicemonitor.powerstat", "ShutDown", nullptr},
     {"devicemonitor.powerstat", "BootComplete", nullptr},
-    {"kiv.system_logging", "LogMessage", qz_log_message_check},
+    {"kiv.system_logging", "LogMessage", is_kept_log_message},
 };
 
-constinit int32_t qz_active = 0;
+constinit int32_t active = 0;
 constinit pid_t compressor_pid = -1;
 
 // Null when the store does not want such events.
@@ -51,7 +51,7 @@ const selection* find_selection(std::string_view package, std::string_view name)
     return found != std::end(selections) ? found : nullptr;
 }
 
-bool qz_select(const char* package, const char* name, std::span<const char> payload) {
+bool is_selected(const char* package, const char* name, std::span<const char> payload) {
     const selection* const found = find_selection(package, name);
     if (found == nullptr) return false;
     return found->check == nullptr || payload.empty() || found->check(payload);
@@ -70,7 +70,7 @@ unique_fd open_current(int32_t number) {
 void compress(int32_t number) {
     const diag_path plain('z', number);
     const diag_path compressed('y', number);
-    if (fu_gzip_file(plain.text, paths::diag_compressed, gzip_level::best) != 0 &&
+    if (gzip_file(plain.text, paths::diag_compressed, gzip_level::best) != 0 &&
         rename(paths::diag_compressed, compressed.text) == 0) {
         delete_diag_file(plain);
     } else {
@@ -82,7 +82,7 @@ void start_compressor(int32_t number) {
     if (compressor_pid >= 0) {
         __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report. Waiting...");
     }
-    qz_wait_for_compressor();
+    diag_wait_for_compressor();
     __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report...");
     compressor_pid = fork_child(child_kind::worker);
     if (compressor_pid < 0) (void)log_and_raise(tag, "Failed to fork compactor thread.");
@@ -96,7 +96,7 @@ void start_compressor(int32_t number) {
 // Lets the files go that are too old by now; gives the number of the next one.
 int32_t make_room(const diag_numbers& numbers) {
     if (numbers.highest == INT32_MAX) {
-        qz_wait_for_compressor();  // or its file would come back
+        diag_wait_for_compressor();  // or its file would come back
         delete_diag_files(INT32_MIN, INT32_MAX);
         return 1;
     }
@@ -107,7 +107,7 @@ int32_t make_room(const diag_numbers& numbers) {
 }
 
 // The file that takes the next event.
-unique_fd qz_get_write_fd() {
+unique_fd open_write_file() {
     diag_numbers numbers;
     if (!scan_diag_files(numbers)) {
         (void)log_and_raise(tag, "qz_file_statdir() failed: %s", strerror(errno));
@@ -126,7 +126,7 @@ unique_fd qz_get_write_fd() {
 }
 
 void switch_off() {
-    qz_wait_for_compressor();  // it would leave another file
+    diag_wait_for_compressor();  // it would leave another file
     delete_all_diag_entries();
     if (rmdir(paths::diag_dir) == 0 || errno == ENOENT) return;
     (void)log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s",
@@ -154,23 +154,23 @@ void switch_on() {
 
 }  // namespace
 
-void qz_set_active(int32_t value) {
-    qz_active = value;
+void diag_set_active(int32_t value) {
+    active = value;
     value != 0 ? switch_on() : switch_off();
 }
 
-void qz_add_event(const char* package, const char* name, std::span<const char> payload) {
-    if (qz_active == 0 || !qz_select(package, name, payload)) return;
-    const unique_fd file = qz_get_write_fd();
+void diag_add_event(const char* package, const char* name, std::span<const char> payload) {
+    if (active == 0 || !is_selected(package, name, payload)) return;
+    const unique_fd file = open_write_file();
     if (file.ok()) (void)write_event_record(file.get(), package, name, payload, tag);
 }
 
-bool qz_wants_probe(const char* package, const char* name) {
-    return qz_active == 1 && find_selection(package, name) != nullptr;
+bool diag_wants_probe(const char* package, const char* name) {
+    return active == 1 && find_selection(package, name) != nullptr;
 }
 
-uint32_t qz_space_reserve() { return qz_active != 0 ? qz_reserved_space : 0; }
+uint32_t diag_space_reserve() { return active != 0 ? diag_reserved_space : 0; }
 
-void qz_wait_for_compressor() { wait_for_child(compressor_pid); }
+void diag_wait_for_compressor() { wait_for_child(compressor_pid); }
 
 }  // namespace kivd

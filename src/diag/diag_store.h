@@ -8,24 +8,24 @@
 
 namespace kivd {
 
-inline constexpr uint32_t qz_reserved_space = 327680;  // bytes that stay free while it is active
+inline constexpr uint32_t diag_reserved_space = 327680;  // bytes that stay free while it is active
 
 // 0 switches the store off and deletes all that it has kept; any other value switches it on.
 // Failures have been logged and raised.
-void qz_set_active(int32_t value);
+void diag_set_active(int32_t value);
 
 // Keeps the event if the store is active and wants it. Failures have been logged and raised; the
 // event is then lost here.
-void qz_add_event(const char* package, const char* name, std::span<const char> payload);
+void diag_add_event(const char* package, const char* name, std::span<const char> payload);
 
 // Whether events of that name can be wanted. Says no while the store is switched on by a value
 // other than 1.
-[[nodiscard]] bool qz_wants_probe(const char* package, const char* name);
+[[nodiscard]] bool diag_wants_probe(const char* package, const char* name);
 
 // Bytes that have to stay free on the file system for it.
-[[nodiscard]] uint32_t qz_space_reserve();
+[[nodiscard]] uint32_t diag_space_reserve();
 
 // Waits until no compressor runs.
-void qz_wait_for_compressor();
+void diag_wait_for_compressor();
 
 }  // namespace kivd

@@ -1,7 +1,7 @@
 #include "diag/file_export.h"
 
-#include "daemon/error/log_and_raise.h"
 #include "diag/diag_files.h"
+#include "runtime/log_and_raise.h"
 #include "util/numbers.h"
 
 namespace kivd {
@@ -12,20 +12,20 @@ constexpr int32_t diag_file_set = 750;
 
 }  // namespace
 
-int32_t fu_file_iterator_next(const char* set, const char* number) {
+int32_t next_exported_file(const char* set, const char* number) {
     if (set == nullptr || number == nullptr) {
         return log_and_raise(tag, "File iterator next, null parameters found.");
     }
-    return parse_saturated(set) == diag_file_set ? qz_file_next(parse_saturated(number)) : -1;
+    return parse_saturated(set) == diag_file_set ? next_diag_file(parse_saturated(number)) : -1;
 }
 
-unique_fd fu_file_get(const char* set, const char* number) {
+unique_fd open_exported_file(const char* set, const char* number) {
     if (set == nullptr || number == nullptr) {
         (void)log_and_raise(tag, "File get, null parameters found.");
         return unique_fd();
     }
     if (parse_saturated(set) != diag_file_set) return unique_fd();
-    return qz_file_open(parse_saturated(number));
+    return open_diag_file(parse_saturated(number));
 }
 
 }  // namespace kivd

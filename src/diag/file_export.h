@@ -10,9 +10,9 @@ namespace kivd {
 
 // The number of the file behind that one, -1 when there is none. Missing (null) texts have been
 // logged and raised.
-[[nodiscard]] int32_t fu_file_iterator_next(const char* set, const char* number);
+[[nodiscard]] int32_t next_exported_file(const char* set, const char* number);
 
 // A file to read; not ok when there is none. Missing texts as above.
-[[nodiscard]] unique_fd fu_file_get(const char* set, const char* number);
+[[nodiscard]] unique_fd open_exported_file(const char* set, const char* number);
 
 }  // namespace kivd

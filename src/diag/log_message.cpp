@@ -6,7 +6,7 @@
 #include <optional>
 #include <string_view>
 
-#include "daemon/error/log_and_raise.h"
+#include "runtime/log_and_raise.h"
 #include "system_logging.pb-c.h"
 #include "util/protobuf_message.h"
 
@@ -93,7 +93,7 @@ bool is_decodable(bytes message, int depth) {
 
 }  // namespace
 
-bool qz_log_message_check(std::span<const char> payload) {
+bool is_kept_log_message(std::span<const char> payload) {
     const bytes encoded(reinterpret_cast<const uint8_t*>(payload.data()), payload.size());
     const auto message =
         is_decodable(encoded, 0)

@@ -8,6 +8,6 @@ namespace kivd {
 // Whether the payload is a kiv.system_logging.LogMessage about an application that crashed or
 // stopped responding, or about a call that failed. One that cannot be decoded, has no tag or is
 // nested more than 64 levels deep has been logged and raised.
-[[nodiscard]] bool qz_log_message_check(std::span<const char> payload);
+[[nodiscard]] bool is_kept_log_message(std::span<const char> payload);
 
 }  // namespace kivd

@@ -4,7 +4,7 @@
 
 #include <cstdint>
 
-#include "report/header_record.h"
+#include "record/header_record.h"
 
 namespace kivd {
 

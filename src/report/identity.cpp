@@ -5,12 +5,12 @@
 #include <cstdio>
 #include <cstring>
 
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/log_and_raise.h"
-#include "report/header_record.h"
+#include "record/header_record.h"
 #include "report/header_sources.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "runtime/daemon_error.h"
+#include "runtime/log_and_raise.h"
 #include "util/clock.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -74,11 +74,11 @@ void rebuild_header(header_record& record) {
 
     if (!is_changed(candidate, previous)) return;
     if (previous.product_id.is_known() && previous.device_id.is_known()) (void)generate_report();
-    config_save();
+    state_save();
 }
 
 void announce_group_ids() {
-    config_save();
+    state_save();
     update_header_info();
 }
 
@@ -107,7 +107,7 @@ void ensure_device_id() {
     if (fgets(line, sizeof line, file.get()) == nullptr) return;
     line[std::max(strlen(line), size_t{1}) - 1] = '\0';  // the line end
     record.device_id.set(line);
-    config_save();
+    state_save();
 }
 
 void get_device_id(device_id_buffer& buffer) {

@@ -14,10 +14,10 @@
 #include <string_view>
 
 #include "config/limits.h"
-#include "daemon/error/log_and_raise.h"
-#include "daemon/stop.h"
 #include "diag/diag_store.h"
 #include "platform/android_log.h"
+#include "runtime/log_and_raise.h"
+#include "runtime/stop.h"
 #include "util/directory.h"
 #include "util/paths.h"
 #include "util/text_scan.h"
@@ -108,7 +108,7 @@ bool is_free_space_enough() {
         (void)log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
         return false;
     }
-    const uint64_t needed = compaction_space(get_limits().max_report_size) + qz_space_reserve();
+    const uint64_t needed = compaction_space(get_limits().max_report_size) + diag_space_reserve();
     const uint64_t available = static_cast<uint64_t>(status.f_bsize) * status.f_bavail;
     return needed <= available && (status.f_files == 0 || status.f_ffree >= free_inodes_min);
 }

@@ -7,19 +7,19 @@
 #include <cerrno>
 #include <cstring>
 
-#include "daemon/error/child_process.h"
-#include "daemon/error/log_and_raise.h"
-#include "diag/gzip_file.h"
 #include "platform/android_log.h"
+#include "record/gzip_file.h"
+#include "record/record_file.h"
 #include "report/header_sources.h"
 #include "report/output_dir.h"
-#include "report/record_file.h"
 #include "report/report_sealing.h"
 #include "report/state_file.h"
+#include "runtime/child_process.h"
+#include "runtime/log_and_raise.h"
 #include "security/key_paths.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "util/clock.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -44,7 +44,7 @@ int flush_stores() {
     record_appender report(fd.get(), static_cast<uint64_t>(size));
     const int64_t flush_time = now_ms();
     counters_write_report(report, get_last_flush());
-    sdata_write_report(report, get_last_flush());
+    static_data_write_report(report, get_last_flush());
     set_last_flush(flush_time);
     return 0;
 }
@@ -77,13 +77,13 @@ int generate_report() {
 
 bool has_data_to_report() {
     return has_header_info() || counters_pending(get_last_flush()) ||
-           sdata_pending(get_last_flush()) || events_pending();
+           static_data_pending(get_last_flush()) || events_pending();
 }
 
 int compact_report() {
     const int32_t highest = prune_dir();
     if (highest < 0) return log_and_raise(tag, "Corrupt output directory - will not do anything.");
-    if (fu_gzip_file(paths::flushed_data, paths::compacted_data, compression) == 0) {
+    if (gzip_file(paths::flushed_data, paths::compacted_data, compression) == 0) {
         return log_and_raise(tag, "Failed to compact file");
     }
     if (report_key_available() && seal_compacted_data() != 0) return -1;

@@ -10,9 +10,9 @@
 #include <cstring>
 #include <span>
 
-#include "daemon/error/log_and_raise.h"
-#include "report/header_record.h"
-#include "report/record_format.h"
+#include "format/record_format.h"
+#include "record/header_record.h"
+#include "runtime/log_and_raise.h"
 #include "security/seal.h"
 #include "util/file_io.h"
 #include "util/paths.h"

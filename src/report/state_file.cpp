@@ -7,8 +7,8 @@
 #include <string_view>
 
 #include "config/limits.h"
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/log_and_raise.h"
+#include "runtime/daemon_error.h"
+#include "runtime/log_and_raise.h"
 #include "util/clock.h"
 #include "util/file_io.h"
 #include "util/numbers.h"
@@ -163,7 +163,7 @@ void write_lines(FILE* file) {
 
 }  // namespace
 
-void config_load() {
+void state_load() {
     const unique_file file = open_to_read(paths::state);
     if (!file) {
         if (errno == ENOENT) return;
@@ -175,7 +175,7 @@ void config_load() {
     while (fgets(line, sizeof line, file.get()) != nullptr) read_line(line);
 }
 
-void config_save() {
+void state_save() {
     unique_file file(fopen(paths::state_new, "we"));
     if (!file) {
         (void)log_and_raise(tag, "Failed to create new configuration file: %s", strerror(errno));

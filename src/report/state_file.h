@@ -5,7 +5,7 @@
 #include <array>
 #include <cstdint>
 
-#include "report/header_record.h"
+#include "record/header_record.h"
 
 namespace kivd {
 
@@ -14,10 +14,10 @@ using config_checksum = std::array<uint8_t, 20>;
 
 // Reads the file into the values that it has lines for. A missing file is fine; another failure to
 // open it has been logged and raised.
-void config_load();
+void state_load();
 
 // Replaces the file. Failures have been logged and raised; the old file is then still there.
-void config_save();
+void state_save();
 
 // The time of the last report flush, in ms: what changed then or later belongs to the next report.
 [[nodiscard]] int64_t get_last_flush();

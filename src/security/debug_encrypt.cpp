@@ -7,7 +7,7 @@
 #include <cstring>
 #include <span>
 
-#include "daemon/error/log_and_raise.h"
+#include "runtime/log_and_raise.h"
 #include "security/seal.h"
 #include "util/file_io.h"
 #include "util/unique_fd.h"

@@ -7,7 +7,7 @@
 #include <cstring>
 #include <utility>
 
-#include "daemon/error/log_and_raise.h"
+#include "runtime/log_and_raise.h"
 #include "security/key_paths.h"
 #include "util/file_io.h"
 

@@ -7,7 +7,7 @@
 #include <cstdio>
 #include <memory>
 
-#include "daemon/error/log_and_raise.h"
+#include "runtime/log_and_raise.h"
 #include "security/key_paths.h"
 #include "util/file_io.h"
 #include "util/unique_fd.h"

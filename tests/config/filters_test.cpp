@@ -1,10 +1,10 @@
 #include "config/filters.h"
 
-#include "config/intake.h"
+#include "intake/intake.h"
 #include "settings.pb.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "support/config_package.h"
 #include "support/scratch_directory.h"
 
@@ -115,7 +115,7 @@ TEST_F(filters, each_store_asks_its_own) {
     for (const char* name : {"e", "c", "s"}) {
         (void)events_add("p", name, std::string_view("data"));
         counters_update("p", name, 1, counter_mode::set);
-        sdata_set("p", name, "value");
+        static_data_set("p", name, "value");
     }
     EXPECT_EQ(contents(next_report()), "P1; c data; s data; e=1; s=1; c: value; e: value; ");
 

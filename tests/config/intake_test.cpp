@@ -1,4 +1,4 @@
-#include "config/intake.h"
+#include "intake/intake.h"
 
 #include <algorithm>
 #include <map>

@@ -1,4 +1,4 @@
-#include "daemon/error/child_process.h"
+#include "runtime/child_process.h"
 
 #include <fcntl.h>
 #include <sys/wait.h>
@@ -7,8 +7,8 @@
 #include <atomic>
 #include <thread>
 
-#include "daemon/error/daemon_error.h"
-#include "daemon/error/log_and_raise.h"
+#include "runtime/daemon_error.h"
+#include "runtime/log_and_raise.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

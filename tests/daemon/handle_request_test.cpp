@@ -1,7 +1,7 @@
 #include "daemon/request/handle_request.h"
 
-#include "daemon/error/daemon_error.h"
 #include "report/state_file.h"
+#include "runtime/daemon_error.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {
@@ -19,7 +19,7 @@ class handle_request : public scratch_directory {
         const size_t size = packet.size();
         packet.resize(size + 65);
         std::string answer =
-            packet.substr(0, kivd::handle_request(ends_[0], {packet.data(), size}, nullptr));
+            packet.substr(0, kivd::handle_request(ends_[0], {packet.data(), size}, nullptr).size);
         for (const std::string& line : take_log()) answer += line;
         return answer;
     }

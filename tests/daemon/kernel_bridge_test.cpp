@@ -8,10 +8,10 @@
 #include <cstring>
 #include <thread>
 
-#include "daemon/error/child_process.h"
-#include "daemon/error/log_and_raise.h"
-#include "daemon/stop.h"
 #include "kernel.pb.h"
+#include "runtime/child_process.h"
+#include "runtime/log_and_raise.h"
+#include "runtime/stop.h"
 #include "support/daemon_process.h"
 #include "support/scratch_directory.h"
 

@@ -17,7 +17,7 @@ using kiv::system_logging::LogMessage;
 
 class diag_store : public scratch_directory {
  protected:
-    ~diag_store() override { qz_wait_for_compressor(); }
+    ~diag_store() override { diag_wait_for_compressor(); }
 };
 
 std::string log_message(const std::string& tag, const std::string& text = "") {
@@ -42,14 +42,14 @@ std::string nested_message(int depth) {
 }
 
 void add(const std::string& package, const std::string& name, const std::string& payload) {
-    qz_add_event(package.c_str(), name.c_str(), payload);
+    diag_add_event(package.c_str(), name.c_str(), payload);
 }
 
 constexpr char log_package[] = "kiv.system_logging";
 
 // What is in the file with that number, as a client gets it.
 std::string file(int number) {
-    const unique_fd fd = fu_file_get("750", std::to_string(number).c_str());
+    const unique_fd fd = open_exported_file("750", std::to_string(number).c_str());
     return fd.ok() ? read_file("/proc/self/fd/" + std::to_string(fd.get())) : "none";
 }
 
@@ -74,7 +74,7 @@ TEST_F(diag_store, keeps_the_few_kinds_of_events_that_it_is_for) {
     add(log_package, "LogMessage", log_message("am_crash"));
     EXPECT_FALSE(exists("private/qz"));  // off
 
-    qz_set_active(1);
+    diag_set_active(1);
     const struct {
         std::string package, name, payload;
         bool kept;
@@ -110,19 +110,19 @@ TEST_F(diag_store, keeps_the_few_kinds_of_events_that_it_is_for) {
     }
     EXPECT_EQ(stored(), expected);
 
-    EXPECT_TRUE(qz_wants_probe(log_package, "LogMessage"));
-    EXPECT_FALSE(qz_wants_probe(log_package, "Other"));
-    EXPECT_EQ(qz_space_reserve(), 327680U);
-    qz_set_active(2);
-    EXPECT_FALSE(qz_wants_probe(log_package, "LogMessage"));
-    EXPECT_EQ(qz_space_reserve(), 327680U);
-    qz_set_active(0);
+    EXPECT_TRUE(diag_wants_probe(log_package, "LogMessage"));
+    EXPECT_FALSE(diag_wants_probe(log_package, "Other"));
+    EXPECT_EQ(diag_space_reserve(), 327680U);
+    diag_set_active(2);
+    EXPECT_FALSE(diag_wants_probe(log_package, "LogMessage"));
+    EXPECT_EQ(diag_space_reserve(), 327680U);
+    diag_set_active(0);
     EXPECT_FALSE(exists("private/qz"));
-    EXPECT_EQ(qz_space_reserve(), 0U);
+    EXPECT_EQ(diag_space_reserve(), 0U);
 }
 
 TEST_F(diag_store, full_files_are_compressed_and_only_the_newest_stay) {
-    qz_set_active(1);
+    diag_set_active(1);
     write_file("private/qz/notes.txt", "");
     const std::string event = log_message("am_crash", std::string(30000, 'x'));
     std::string last;
@@ -132,7 +132,7 @@ TEST_F(diag_store, full_files_are_compressed_and_only_the_newest_stay) {
         }
         last = file(number);
         add(log_package, "LogMessage", event);
-        qz_wait_for_compressor();
+        diag_wait_for_compressor();
         const std::string plain = "private/qz/qz_" + std::to_string(number);
         EXPECT_FALSE(exists(plain));
         write_file("compressed", file(number));
@@ -146,12 +146,12 @@ TEST_F(diag_store, full_files_are_compressed_and_only_the_newest_stay) {
           "W kivd-qz: Unexpected file in private/qz/ directory: notes.txt"}) {
         EXPECT_NE(std::ranges::find(log, line), log.end()) << line;
     }
-    qz_set_active(0);
+    diag_set_active(0);
     EXPECT_FALSE(exists("private/qz"));
 }
 
 TEST_F(diag_store, numbers_start_again_when_they_have_run_out) {
-    qz_set_active(1);
+    diag_set_active(1);
     write_file("private/qz/qz_2147483647", std::string(204800, 'x'));
     write_file("private/qz/qz_-3", "");
     write_file("private/qz/qy_5.tmp", "");  // counts as 5
@@ -161,7 +161,7 @@ TEST_F(diag_store, numbers_start_again_when_they_have_run_out) {
 
 TEST_F(diag_store, has_the_documented_bytes_and_says_what_it_cannot_do) {
     enable_test_mode();
-    qz_set_active(1);
+    diag_set_active(1);
     add(log_package, "LogMessage", log_message("am_anr"));
     EXPECT_EQ(file(1), doc_example("files.md", "hex", "diagnostics-file"));
 
@@ -170,12 +170,12 @@ TEST_F(diag_store, has_the_documented_bytes_and_says_what_it_cannot_do) {
     add(log_package, "LogMessage", log_message("am_anr"));
     EXPECT_EQ(take_log().back(), "E kivd-qz: qz_file_statdir() failed: No such file or directory");
     write_file("private/qz", "");
-    qz_set_active(1);
+    diag_set_active(1);
     EXPECT_EQ(take_log(), lines({"E kivd-qz: qz_rescue_event_file: qz_file_statdir() failed: "
                                  "Not a directory"}));
     fs::remove("private/qz");
     fs::create_directories("private/qz/directory");
-    qz_set_active(0);
+    diag_set_active(0);
     EXPECT_EQ(take_log(),
               lines({"E kivd-qz: Failed to delete private/qz/directory, <Is a directory>",
                      "E kivd-qz: Failed to remove Lumora Diagnostics output directory: "
@@ -183,7 +183,7 @@ TEST_F(diag_store, has_the_documented_bytes_and_says_what_it_cannot_do) {
 }
 
 TEST_F(diag_store, clients_walk_the_files_by_number) {
-    const auto next = [](const char* number) { return fu_file_iterator_next("750", number); };
+    const auto next = [](const char* number) { return next_exported_file("750", number); };
     EXPECT_EQ(next("0"), -1);  // before any was there
     fs::create_directory("private/qz");
     EXPECT_EQ(next("0"), -1);
@@ -196,12 +196,12 @@ TEST_F(diag_store, clients_walk_the_files_by_number) {
     };
     for (const auto& [number, expected] : steps) EXPECT_EQ(next(number), expected) << number;
     EXPECT_EQ(file(4) + file(5) + file(6) + file(7), "qy_4qy_5qz_6none");
-    EXPECT_EQ(fcntl(fu_file_get("750", "4").get(), F_GETFL) & O_ACCMODE, O_RDONLY);
-    EXPECT_EQ(fu_file_iterator_next("751", "0"), -1);
-    EXPECT_FALSE(fu_file_get("751", "4").ok());
+    EXPECT_EQ(fcntl(open_exported_file("750", "4").get(), F_GETFL) & O_ACCMODE, O_RDONLY);
+    EXPECT_EQ(next_exported_file("751", "0"), -1);
+    EXPECT_FALSE(open_exported_file("751", "4").ok());
     EXPECT_EQ(take_log(), lines());
-    EXPECT_EQ(fu_file_iterator_next("750", nullptr), -1);
-    EXPECT_FALSE(fu_file_get(nullptr, nullptr).ok());
+    EXPECT_EQ(next_exported_file("750", nullptr), -1);
+    EXPECT_FALSE(open_exported_file(nullptr, nullptr).ok());
     EXPECT_EQ(take_log(), lines({"E kivd-fu: File iterator next, null parameters found.",
                                  "E kivd-fu: File get, null parameters found."}));
 }

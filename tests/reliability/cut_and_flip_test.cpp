@@ -12,20 +12,20 @@
 
 #include "config/config_parts.h"
 #include "config/filters.h"
-#include "config/intake.h"
 #include "config/limits.h"
-#include "daemon/error/daemon_error.h"
 #include "diag/diag_store.h"
 #include "diag/file_export.h"
+#include "intake/intake.h"
+#include "record/record_file.h"
 #include "report/header_sources.h"
-#include "report/record_file.h"
 #include "report/state_file.h"
+#include "runtime/daemon_error.h"
 #include "security/key_paths.h"
 #include "security/seal.h"
 #include "settings.pb.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "support/config_package.h"
 #include "support/scratch_directory.h"
 #include "util/clock.h"
@@ -124,27 +124,27 @@ void expect_events(const damage& d) {
 
 void add_shutdown(const std::string& payload) {
     set_clock();
-    qz_add_event("devicemonitor.powerstat", "ShutDown", payload);
+    diag_add_event("devicemonitor.powerstat", "ShutDown", payload);
 }
 
 pieces make_diagnostics() {
-    qz_set_active(1);
+    diag_set_active(1);
     for (int i = 0; i < 7; ++i) add_shutdown(std::string(30000, 'x'));  // the first file is full
     pieces all;
     grow(all, diag_file, add_shutdown);
-    qz_wait_for_compressor();
+    diag_wait_for_compressor();
     return all;
 }
 
 void expect_diagnostics(const damage& d) {
-    qz_set_active(1);
+    diag_set_active(1);
     const std::string kept = read_file(diag_file);
     expect_whole_records(d, kept);
     add_shutdown("last");
-    qz_set_active(1);
+    diag_set_active(1);
     EXPECT_EQ(read_file(diag_file), kept + d.whole.back());
-    EXPECT_EQ(fu_file_iterator_next("750", "1"), 2);
-    EXPECT_EQ(fu_file_iterator_next("750", "2"), -1);
+    EXPECT_EQ(next_exported_file("750", "1"), 2);
+    EXPECT_EQ(next_exported_file("750", "2"), -1);
 }
 
 // List files. What a start reads, the next save writes. The last record of a sample is there after
@@ -172,7 +172,7 @@ void expect_list(const damage& d, std::string (*load_and_save)()) {
 }
 
 std::string load_and_save_counters() {
-    counters_free();
+    counters_release();
     counters_init();
     set_clock();
     counters_update("z", "last", 0, counter_mode::increment);
@@ -193,23 +193,23 @@ pieces make_counters() {
 }
 
 std::string load_and_save_values() {
-    sdata_free();
-    sdata_init();
-    sdata_set("z", "last", "no");
+    static_data_release();
+    static_data_init();
+    static_data_set("z", "last", "no");
     set_clock();
-    sdata_set("z", "last", "yes");
+    static_data_set("z", "last", "yes");
     set_clock();
-    sdata_save();
+    static_data_save();
     return read_file(paths::static_data);
 }
 
 pieces make_values() {
     set_clock();
-    sdata_set("app", "mode", "night, auto");
-    sdata_set("app", "text", "two\nlines\n");
-    sdata_set("app", "long", std::string(300, '\xC3').c_str());
-    sdata_set("b", "n", "1");
-    sdata_save();
+    static_data_set("app", "mode", "night, auto");
+    static_data_set("app", "text", "two\nlines\n");
+    static_data_set("app", "long", std::string(300, '\xC3').c_str());
+    static_data_set("b", "n", "1");
+    static_data_save();
     return split(load_and_save_values(), "\0\0\n"s);
 }
 
@@ -410,8 +410,8 @@ std::string load_and_save_state() {
     set_data_collection(false);
     set_error_nr(0);
     set_error_time(0);
-    config_load();
-    config_save();
+    state_load();
+    state_save();
     std::string saved = read_file(paths::state);
     const size_t start = saved.find("shutdown-time:");
     return saved.erase(start, saved.find('\n', start) + 1 - start);
@@ -421,8 +421,8 @@ pieces make_state() {
     write_file(paths::state, doc_example("files.md", "text", "state-file") + "group_id: second\n");
     set_config_checksum({1, 2, 3});
     get_limits().expire_sdata_age = UINT32_MAX;
-    config_load();
-    config_save();
+    state_load();
+    state_save();
     return split(read_file(paths::state), "\n");
 }
 
@@ -494,7 +494,7 @@ class cut_and_flip : directory_in_memory, public scratch_directory {
     ~cut_and_flip() override { begin_anew(); }
 
     void begin_anew() {
-        qz_set_active(0);
+        diag_set_active(0);
         clear_config_key_path();
         for (const char* name : {paths::private_dir, paths::output_dir, paths::input_dir}) {
             fs::remove_all(name);

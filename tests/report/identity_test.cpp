@@ -1,10 +1,10 @@
 #include "report/identity.h"
 
+#include "record/header_record.h"
 #include "report.pb.h"
-#include "report/header_record.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
-#include "store/event_store.h"
+#include "store/events.h"
 #include "support/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "util/paths.h"

@@ -1,4 +1,4 @@
-#include "report/record_file.h"
+#include "record/record_file.h"
 
 #include <fcntl.h>
 #include <unistd.h>

@@ -1,11 +1,11 @@
 #include "report/report_generation.h"
 
-#include "report/header_record.h"
+#include "record/header_record.h"
 #include "report/state_file.h"
 #include "security/key_paths.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "support/config_package.h"
 #include "support/scratch_directory.h"
 #include "util/clock.h"
@@ -27,11 +27,11 @@ TEST_F(report_generation, all_files_have_the_documented_bytes) {
     set_test_clock(start + 2);
     counters_update("app", "starts", -7, counter_mode::increment);
     set_test_clock(start + 4);
-    for (int i = 0; i < 2; ++i) sdata_set("app", "mode", "night, auto");
+    for (int i = 0; i < 2; ++i) static_data_set("app", "mode", "night, auto");
     set_test_clock(start + 4);
     (void)events_add("a", "b", {});
     counters_save();
-    sdata_save();
+    static_data_save();
     EXPECT_EQ(read_file(paths::counters), doc_example("files.md", "hex", "counters-file"));
     EXPECT_EQ(read_file(paths::static_data), doc_example("files.md", "hex", "sdata-file"));
 

@@ -16,8 +16,8 @@ class state_file : public scratch_directory {
         init_header(get_header_record());
         set_config_checksum({});
         write_file(paths::state, text);
-        config_load();
-        config_save();
+        state_load();
+        state_save();
         return read_file(paths::state);
     }
 };
@@ -69,10 +69,10 @@ TEST_F(state_file, a_failed_save_keeps_the_old_file) {
     const std::string old = reloaded("product: old\n");
     get_header_record().product_id.set("new");
     fs::create_directory(paths::state_new);
-    config_save();
+    state_save();
     EXPECT_EQ(read_file(paths::state), old);
     fs::remove(paths::state_new);
-    config_save();
+    state_save();
     EXPECT_NE(read_file(paths::state).find("product: new\n"), std::string::npos);
 }
 

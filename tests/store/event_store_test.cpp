@@ -1,7 +1,7 @@
-#include "store/event_store.h"
+#include "store/events.h"
 
 #include "config/limits.h"
-#include "report/record_file.h"
+#include "record/record_file.h"
 #include "support/scratch_directory.h"
 #include "util/clock.h"
 #include "util/paths.h"

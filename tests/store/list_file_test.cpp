@@ -1,4 +1,4 @@
-#include "store/list_file.h"
+#include "list/list_file.h"
 
 #include "support/scratch_directory.h"
 

@@ -3,8 +3,8 @@
 
 #include "config/limits.h"
 #include "report/state_file.h"
-#include "store/counter_store.h"
-#include "store/static_store.h"
+#include "store/counters.h"
+#include "store/static_data.h"
 #include "support/scratch_directory.h"
 #include "util/clock.h"
 #include "util/paths.h"
@@ -16,7 +16,7 @@ class probe_stores : public scratch_directory {
  protected:
     void save_and_restart() {
         counters_save();
-        sdata_save();
+        static_data_save();
         restart();
     }
     // What a report since then holds.
@@ -63,12 +63,12 @@ TEST_F(probe_stores, the_expired_are_left_out_of_the_files_only) {
     get_limits().expire_counters_age = get_limits().expire_sdata_age = 100;
     set_test_clock(1000);
     for (const char* name : {"c1", "c2"}) counters_update("p", name, 1, counter_mode::set);
-    for (const char* name : {"s1", "s2"}) sdata_set("p", name, "x");
-    sdata_set("p", "s1", "x");  // at 1005
+    for (const char* name : {"s1", "s2"}) static_data_set("p", name, "x");
+    static_data_set("p", "s1", "x");  // at 1005
     set_test_clock(1100);
     counters_save();  // what is from 1001 or before
     set_test_clock(1103);
-    sdata_save();  // from 1004
+    static_data_save();  // from 1004
     EXPECT_EQ(reported(0), "P1; c1=1; c2=1; s1: x; s2: x; ");
     EXPECT_EQ(reported(1002000), "P1; c2=1; s1: x; s2: x; ");
     EXPECT_EQ(reported(1003001), "P1; s2: x; ");  // what was set again to the same has not changed
@@ -100,20 +100,20 @@ TEST_F(probe_stores, a_change_is_saved_once_and_after_a_failure_again) {
     fs::create_symlink("/dev/full", "private/counters.txt_");
     fs::create_symlink("/dev/full", "private/sdata.txt_");
     counters_update("p", "n", 1, counter_mode::set);
-    sdata_set("p", "n", "x");
+    static_data_set("p", "n", "x");
     for (const bool saved : {false, true, false}) {
         counters_save();
-        sdata_save();
+        static_data_save();
         EXPECT_EQ(fs::remove(paths::counters), saved);
         EXPECT_EQ(fs::remove(paths::static_data), saved);
-        sdata_set("p", "n", "x");  // no change
+        static_data_set("p", "n", "x");  // no change
     }
 }
 
 TEST_F(probe_stores, long_values_are_left_out_of_reports_and_cut_in_the_file) {
     const std::string value(493, 'v');  // 19 bytes short of a record of 512
-    sdata_set("p", "a", (value + "v").c_str());
-    sdata_set("p", "b", value.c_str());
+    static_data_set("p", "a", (value + "v").c_str());
+    static_data_set("p", "b", value.c_str());
     EXPECT_EQ(reported(0), "P1; b: " + value + "; ");
     save_and_restart();
     EXPECT_EQ(reported(0),

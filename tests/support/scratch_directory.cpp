@@ -12,13 +12,13 @@
 #include "config/config_parts.h"
 #include "config/filters.h"
 #include "config/limits.h"
-#include "daemon/error/daemon_error.h"
 #include "report.pb.h"
 #include "report/identity.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
-#include "store/counter_store.h"
-#include "store/static_store.h"
+#include "runtime/daemon_error.h"
+#include "store/counters.h"
+#include "store/static_data.h"
 #include "support/daemon_process.h"
 
 namespace kivd {
@@ -26,9 +26,9 @@ namespace {
 
 void release_all() {
     wait_for_compactor();
-    counters_free();
-    sdata_free();
-    free_header();
+    counters_release();
+    static_data_release();
+    release_header();
     release_filters();
     release_config_list();
 }
@@ -64,9 +64,9 @@ void scratch_directory::restart() {
     release_all();
     init_settings();
     counters_init();
-    sdata_init();
+    static_data_init();
     init_header(get_header_record());
-    config_load();
+    state_load();
     ensure_device_id();
     update_header_info();
     load_config_list();

@@ -2,12 +2,12 @@
 #include <sstream>
 
 #include "config.pb.h"
+#include "kivtool/config/config_build.h"
+#include "kivtool/config/config_show.h"
 #include "sample_reports.h"
 #include "support/daemon_process.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"
-#include "tools/config_build.h"
-#include "tools/config_show.h"
 
 namespace kivd {
 namespace {

@@ -1,4 +1,4 @@
-#include "tools/config_lint.h"
+#include "kivtool/config/config_lint.h"
 
 #include <google/protobuf/stubs/logging.h>
 

@@ -1,4 +1,4 @@
-#include "tools/report_command.h"
+#include "kivtool/report/report_command.h"
 
 #include "sample_reports.h"
 #include "support/outside_tools.h"

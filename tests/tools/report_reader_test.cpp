@@ -1,4 +1,4 @@
-#include "tools/report_reader.h"
+#include "kivtool/report/report_reader.h"
 
 #include <filesystem>
 #include <vector>

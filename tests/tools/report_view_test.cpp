@@ -1,13 +1,13 @@
-#include "tools/report_view.h"
+#include "kivtool/report/report_view.h"
 
 #include <google/protobuf/util/json_util.h>
 
 #include <sstream>
 
+#include "kivtool/report/report_command.h"
 #include "sample_reports.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"
-#include "tools/report_command.h"
 
 namespace kivd {
 namespace {

@@ -13,9 +13,9 @@
 #include <string_view>
 #include <vector>
 
+#include "kivtool/report/report_command.h"
 #include "report.pb.h"
 #include "support/config_package.h"
-#include "tools/report_command.h"
 
 namespace kivd {
 

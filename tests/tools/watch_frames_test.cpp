@@ -1,4 +1,4 @@
-#include "tools/watch_frames.h"
+#include "kivctl/watch_frames.h"
 
 #include <gtest/gtest.h>
 

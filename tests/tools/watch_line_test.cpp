@@ -1,4 +1,4 @@
-#include "tools/watch_line.h"
+#include "kivctl/watch_line.h"
 
 #include <gtest/gtest.h>
 

@@ -8,11 +8,11 @@
 #include <cerrno>
 #include <cstring>
 
-#include "daemon/error/give_up.h"
-#include "daemon/event_loop.h"
-#include "daemon/net/turn_away.h"
+#include "daemon/loop/event_loop.h"
+#include "daemon/loop/turn_away.h"
+#include "format/record_format.h"
 #include "platform/android_log.h"
-#include "report/record_format.h"
+#include "runtime/give_up.h"
 
 namespace kivd {
 namespace {
@@ -22,11 +22,11 @@ constexpr uint16_t port = 2305;
 constexpr int listen_backlog = 5;
 constexpr size_t frame_size = 31196;  // of the largest request packet
 
-void di_accept(event_handler& handler);
-void di_client_readable(event_handler& handler);
+void accept_debug_client(event_handler& handler);
+void read_debug_client(event_handler& handler);
 
-constinit event_handler listener = {di_accept, -1};
-constinit event_handler client = {di_client_readable, -1};
+constinit event_handler listener = {accept_debug_client, -1};
+constinit event_handler client = {read_debug_client, -1};
 
 void close_client() {
     if (client.fd < 0) return;
@@ -36,7 +36,7 @@ void close_client() {
 }
 
 // A new client takes the place of the one before.
-void di_accept(event_handler& handler) {
+void accept_debug_client(event_handler& handler) {
     const int fd = accept4(handler.fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
     if (fd < 0 && errno != EAGAIN) turn_away_client(handler.fd);
     close_client();
@@ -44,14 +44,14 @@ void di_accept(event_handler& handler) {
     if (fd >= 0 && event_loop_add(client) != 0) close_client();
 }
 
-void di_client_readable(event_handler& handler) {
+void read_debug_client(event_handler& handler) {
     char unwanted[10];
     if (recv(handler.fd, unwanted, sizeof unwanted, MSG_DONTWAIT) == 0) close_client();
 }
 
 }  // namespace
 
-void di_start() {
+void debug_start() {
     listener.fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     if (listener.fd < 0) give_up(tag, "Failed to create di-socket: %s", strerror(errno));
     sockaddr_in address = {};
@@ -65,7 +65,7 @@ void di_start() {
     }
 }
 
-void di_mirror_request(std::span<const char> packet) {
+void debug_mirror_request(std::span<const char> packet) {
     if (client.fd < 0) return;
     static constinit std::array<uint8_t, frame_size> frame = {};
     const size_t size = pack_debug_frame(frame, reinterpret_cast<const uint8_t*>(packet.data()),

@@ -8,9 +8,9 @@
 namespace kivd {
 
 // Listens on port 2305 of every interface. Ends the process when that fails.
-void di_start();
+void debug_start();
 
 // Sends the packet to the client, if there is one.
-void di_mirror_request(std::span<const char> packet);
+void debug_mirror_request(std::span<const char> packet);
 
 }  // namespace kivd

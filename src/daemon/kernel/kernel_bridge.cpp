@@ -17,10 +17,10 @@
 #include <span>
 #include <string_view>
 
-#include "daemon/error/log_and_raise.h"
 #include "daemon/kernel/process_kill.h"
-#include "daemon/stop.h"
 #include "platform/android_log.h"
+#include "runtime/log_and_raise.h"
+#include "runtime/stop.h"
 #include "util/paths.h"
 
 namespace kivd {
@@ -126,7 +126,7 @@ void pass_on(const daemon_socket& daemon, std::span<char> message) {
 
 void* run_thread(void* /*argument*/) {
     (void)pthread_setname_np(pthread_self(), "kivkb");
-    kivkb_main();
+    run_kernel_bridge();
     return nullptr;
 }
 
@@ -188,7 +188,7 @@ int receive_kernel_message(int netlink, daemon_socket& daemon) {
     return 0;
 }
 
-void kivkb_main() {
+void run_kernel_bridge() {
     // They stay open until the process ends, so that nobody else takes the port.
     static daemon_socket daemon;
     static unique_fd netlink;

@@ -27,7 +27,7 @@ struct daemon_socket {
 int receive_kernel_message(int netlink, daemon_socket& daemon);
 
 // The body of the thread: ends when the set-up fails or the daemon is to stop.
-void kivkb_main();
+void run_kernel_bridge();
 
 // Starts the thread, which takes no signals, and waits until it is set up or has given up. False
 // when there is none.

@@ -3,8 +3,8 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "daemon/error/log_and_raise.h"
 #include "kernel.pb-c.h"
+#include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {

@@ -8,13 +8,13 @@
 #include <cerrno>
 #include <cstring>
 
-#include "daemon/error/give_up.h"
-#include "daemon/event_loop.h"
+#include "daemon/loop/event_loop.h"
+#include "daemon/loop/turn_away.h"
 #include "daemon/net/connections.h"
 #include "daemon/net/datagrams.h"
 #include "daemon/net/packet_buffer.h"
-#include "daemon/net/turn_away.h"
 #include "daemon/net/wait.h"
+#include "runtime/give_up.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 

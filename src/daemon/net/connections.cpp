@@ -12,14 +12,14 @@
 #include <cstring>
 #include <utility>
 
-#include "daemon/error/log_and_raise.h"
+#include "daemon/loop/turn_away.h"
 #include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/send.h"
 #include "daemon/net/stream_framing.h"
-#include "daemon/net/turn_away.h"
 #include "daemon/net/wait.h"
 #include "daemon/request/handle_request.h"
+#include "runtime/log_and_raise.h"
 #include "util/clock.h"
 #include "util/unique_fd.h"
 
@@ -126,10 +126,11 @@ size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
 
 void handle_packet(int fd, std::span<char> packet, const char* receiver) {
     packet.data()[packet.size()] = '\0';
-    const size_t reply_size = handle_request(fd, packet, nullptr);
-    if (reply_size == 0) return;
+    const answer given = handle_request(fd, packet, nullptr);
+    if (given.descriptor.ok()) return (void)send_fd_message(fd, given.descriptor.get());
+    if (given.size == 0) return;
     wait_before_send();
-    if (send_all(fd, packet.data(), reply_size) >= 0) return;
+    if (send_all(fd, packet.data(), given.size) >= 0) return;
     const int error = errno;
     (void)log_and_raise(tag, "%s: failed to send to client %d, errno=%d (%s)", receiver, fd, error,
                         strerror(error));

@@ -1,7 +1,7 @@
 // Requests with replies, over connections of sequenced packets or of a stream.
 #pragma once
 
-#include "daemon/event_loop.h"
+#include "daemon/loop/event_loop.h"
 
 namespace kivd {
 

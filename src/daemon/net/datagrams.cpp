@@ -6,11 +6,11 @@
 #include <cerrno>
 #include <span>
 
-#include "daemon/error/log_and_raise.h"
 #include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/wait.h"
 #include "daemon/request/handle_request.h"
+#include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {

@@ -1,7 +1,7 @@
 // Requests by datagram: one way, without a reply.
 #pragma once
 
-#include "daemon/event_loop.h"
+#include "daemon/loop/event_loop.h"
 
 namespace kivd {
 

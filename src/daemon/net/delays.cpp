@@ -1,6 +1,6 @@
 #include "daemon/net/delays.h"
 
-#include "daemon/stop.h"
+#include "runtime/stop.h"
 
 namespace kivd {
 namespace {

@@ -7,9 +7,9 @@
 #include <cerrno>
 #include <cstring>
 
-#include "daemon/error/log_and_raise.h"
 #include "daemon/net/delays.h"
 #include "daemon/net/wait.h"
+#include "runtime/log_and_raise.h"
 #include "util/clock.h"
 
 namespace kivd {

@@ -8,7 +8,7 @@
 #include <array>
 #include <cerrno>
 
-#include "daemon/stop.h"
+#include "runtime/stop.h"
 #include "util/clock.h"
 
 namespace kivd {

@@ -5,8 +5,8 @@
 #include <cstring>
 #include <optional>
 
-#include "daemon/error/log_and_raise.h"
 #include "platform/permission.h"
+#include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {

@@ -4,15 +4,15 @@
 #include <cstdio>
 #include <cstring>
 
-#include "config/intake.h"
-#include "daemon/error/log_and_raise.h"
-#include "daemon/save_clock.h"
+#include "daemon/loop/save_clock.h"
 #include "diag/diag_store.h"
 #include "diag/file_export.h"
+#include "intake/intake.h"
 #include "report/identity.h"
 #include "report/output_dir.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
+#include "runtime/log_and_raise.h"
 #include "util/numbers.h"
 
 namespace kivd {
@@ -20,97 +20,99 @@ namespace {
 
 constexpr char tag[] = "kivd";
 
-// Calls `act` with the next token; a missing one is logged with `complaint` and raised. No reply.
-size_t with_argument(request& r, const char* complaint, void (*act)(const char*)) {
+// Calls `act` with the next token; a missing one is logged with `complaint` and raised.
+answer with_argument(request& r, const char* complaint, void (*act)(const char*)) {
     const char* const argument = next_token(r);
     if (argument != nullptr) {
         act(argument);
     } else {
         (void)log_and_raise(tag, "%s", complaint);
     }
-    return 0;
+    return no_answer();
 }
 
 }  // namespace
 
-size_t flush(request& /*r*/) {
+answer flush(request& /*r*/) {
     (void)generate_report();
     update_header_info();
-    return 0;
+    return no_answer();
 }
 
-size_t force_save(request& /*r*/) {
+answer force_save(request& /*r*/) {
     save_data();
-    return 0;
+    return no_answer();
 }
 
-size_t announce_configuration(request& r) { return reply(r, take_new_configuration() ? "1" : "0"); }
+answer announce_configuration(request& r) {
+    return answer_with(r, take_new_configuration() ? "1" : "0");
+}
 
-size_t write_configuration(request& r) {
+answer write_configuration(request& r) {
     constexpr size_t command_size = 3;  // with the delimiter behind it
     if (r.packet.size() < command_size) {
         (void)log_and_raise(tag, "Badly formatted packet (WC) - dropping.");
-        return 0;
+        return no_answer();
     }
     write_configuration(r.packet.subspan(command_size));
-    return 0;
+    return no_answer();
 }
 
-size_t read_device_id(request& r) {
+answer read_device_id(request& r) {
     device_id_buffer id;
     get_device_id(id);
-    return reply(r, {id.data(), strnlen(id.data(), id.size())});
+    return answer_with(r, {id.data(), strnlen(id.data(), id.size())});
 }
 
-size_t switch_data_collection(request& r) {
+answer switch_data_collection(request& r) {
     return with_argument(r, "Enable/disable data collection without value.", [](const char* value) {
         const int32_t number = parse_saturated(value);
         set_data_collection(number != 0);
-        qz_set_active(number);
-        config_save();
+        diag_set_active(number);
+        state_save();
     });
 }
 
-size_t remove_report(request& r) {
+answer remove_report(request& r) {
     return with_argument(r, "Remove report without number.",
                          [](const char* number) { delete_reports(parse_saturated(number)); });
 }
 
 // The reply is cut to what goes into the request with a NUL behind it, less one byte.
-size_t next_file(request& r) {
+answer next_file(request& r) {
     const char* const set = next_token(r);
     const char* const number = next_token(r);
     char digits[16];
     snprintf(digits, std::min(r.packet.size() - 1, sizeof digits), "%d",
-             fu_file_iterator_next(set, number));
-    return reply(r, digits);
+             next_exported_file(set, number));
+    return answer_with(r, digits);
 }
 
-size_t get_file(request& r) {
+answer get_file(request& r) {
     const char* const set = next_token(r);
     const char* const number = next_token(r);
     if (set == nullptr || number == nullptr) {
         (void)log_and_raise(tag, "Badly formatted packet (FG) - dropping.");
-        return reply(r, "FAIL");
+        return answer_with(r, "FAIL");
     }
-    return reply_with_descriptor(r, fu_file_get(set, number));
+    return answer_with(r, open_exported_file(set, number));
 }
 
-size_t accept_serial_number(request& r) {
+answer accept_serial_number(request& r) {
     return with_argument(r, "set_serial_number without value.", set_serial_number);
 }
 
-size_t accept_imei(request& r) { return with_argument(r, "set_imei without value.", set_imei); }
+answer accept_imei(request& r) { return with_argument(r, "set_imei without value.", set_imei); }
 
-size_t add_group(request& r) {
+answer add_group(request& r) {
     return with_argument(r, "set_group_id without value.", set_group_id);
 }
 
-size_t delete_group(request& r) {
+answer delete_group(request& r) {
     return with_argument(r, "delete_group_id without value.", delete_group_id);
 }
 
-size_t replace_group(request& r) {
+answer replace_group(request& r) {
     const char* const new_id = next_token(r);
     const char* const old_id = next_token(r);
     if (new_id != nullptr && old_id != nullptr) {
@@ -118,7 +120,7 @@ size_t replace_group(request& r) {
     } else {
         (void)log_and_raise(tag, "replace_group_id without valid value.");
     }
-    return 0;
+    return no_answer();
 }
 
 }  // namespace kivd

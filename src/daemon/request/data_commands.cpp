@@ -2,12 +2,12 @@
 
 #include "config/config_parts.h"
 #include "config/filters.h"
-#include "daemon/error/log_and_raise.h"
 #include "diag/diag_store.h"
 #include "report/report_generation.h"
-#include "store/counter_store.h"
-#include "store/event_store.h"
-#include "store/static_store.h"
+#include "runtime/log_and_raise.h"
+#include "store/counters.h"
+#include "store/events.h"
+#include "store/static_data.h"
 #include "util/numbers.h"
 #include "util/unique_fd.h"
 
@@ -27,52 +27,52 @@ void update_counter(request& r, const char* command, counter_mode mode) {
 
 }  // namespace
 
-size_t add_event(request& r) {
+answer add_event(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "EV", probe)) return 0;
+    if (!take_probe_id(r, "EV", probe)) return no_answer();
     const std::span<const char> payload = raw_rest(r);
     if (payload.size() > max_payload_size) {
         (void)log_and_raise(tag, "Too large event - dropping. [%s:%s] %zu bytes", probe.package,
                             probe.name, payload.size());
-        return 0;
+        return no_answer();
     }
-    qz_add_event(probe.package, probe.name, payload);
+    diag_add_event(probe.package, probe.name, payload);
     if (events_add(probe.package, probe.name, payload) == event_file::full) (void)generate_report();
-    return 0;
+    return no_answer();
 }
 
-size_t set_counter(request& r) {
+answer set_counter(request& r) {
     update_counter(r, "CS", counter_mode::set);
-    return 0;
+    return no_answer();
 }
 
-size_t increment_counter(request& r) {
+answer increment_counter(request& r) {
     update_counter(r, "CI", counter_mode::increment);
-    return 0;
+    return no_answer();
 }
 
-size_t set_static_data(request& r) {
+answer set_static_data(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "SD", probe)) return 0;
+    if (!take_probe_id(r, "SD", probe)) return no_answer();
     const char* const value = text_rest(r);
-    if (check_probe_value("SD", probe, value)) sdata_set(probe.package, probe.name, value);
-    return 0;
+    if (check_probe_value("SD", probe, value)) static_data_set(probe.package, probe.name, value);
+    return no_answer();
 }
 
-size_t is_alive(request& r) { return reply(r, "1"); }
+answer is_alive(request& r) { return answer_with(r, "1"); }
 
-size_t is_probe_active(request& r) {
+answer is_probe_active(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "PA", probe)) return 0;
+    if (!take_probe_id(r, "PA", probe)) return no_answer();
     const bool wanted = filter_match(filter_kind::events, probe.package, probe.name) ||
-                        qz_wants_probe(probe.package, probe.name);
-    return reply(r, wanted ? "1" : "0");
+                        diag_wants_probe(probe.package, probe.name);
+    return answer_with(r, wanted ? "1" : "0");
 }
 
-size_t get_config_part(request& r) {
+answer get_config_part(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "GC", probe)) return 0;
-    return reply_with_descriptor(r, get_config_fd(probe.package, probe.name));
+    if (!take_probe_id(r, "GC", probe)) return no_answer();
+    return answer_with(r, get_config_fd(probe.package, probe.name));
 }
 
 }  // namespace kivd

@@ -4,13 +4,13 @@
 #include <string_view>
 
 #include "daemon/debug/debug_interface.h"
-#include "daemon/error/log_and_raise.h"
 #include "daemon/request/caller.h"
 #include "daemon/request/control_commands.h"
 #include "daemon/request/data_commands.h"
 #include "daemon/request/request.h"
 #include "platform/android_log.h"
 #include "report/state_file.h"
+#include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {
@@ -19,7 +19,7 @@ constexpr char tag[] = "kivd";
 
 struct command {
     std::string_view name;
-    size_t (*run)(request&);         // gives the length of the reply, 0 for none
+    answer (*run)(request&);
     bool only_while_collecting;      // ignored in silence while data collection is off
     const char* refusal;             // logged when permission is lacking; null: open to all
     std::string_view refusal_reply;  // what a refused caller gets
@@ -52,26 +52,26 @@ constexpr command commands[] = {
 
 }  // namespace
 
-size_t handle_request(int fd, std::span<char> packet, const msghdr* message) {
-    di_mirror_request(packet);
+answer handle_request(int fd, std::span<char> packet, const msghdr* message) {
+    debug_mirror_request(packet);
     request r = make_request(fd, packet, message);
     const char* const name = next_token(r);
     if (name == nullptr) {
         (void)log_and_raise(tag, "Invalid command: none - dropping.");
-        return 0;
+        return no_answer();
     }
     const auto* const found = std::ranges::find(commands, std::string_view(name), &command::name);
     if (found == std::end(commands)) {
         (void)log_and_raise(tag, "Bad command: %d/%d - dropping",
                             static_cast<unsigned char>(packet.data()[0]),
                             static_cast<unsigned char>(packet.data()[1]));
-        return 0;
+        return no_answer();
     }
     if (found->refusal != nullptr && !check_caller_permission(r)) {
         __android_log_print(ANDROID_LOG_WARN, tag, "%s", found->refusal);
-        return reply(r, found->refusal_reply);
+        return answer_with(r, found->refusal_reply);
     }
-    if (found->only_while_collecting && !is_data_collection_enabled()) return 0;
+    if (found->only_while_collecting && !is_data_collection_enabled()) return no_answer();
     return found->run(r);
 }
 

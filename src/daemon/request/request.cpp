@@ -1,9 +1,9 @@
 #include "daemon/request/request.h"
 
 #include <cstring>
+#include <utility>
 
-#include "daemon/error/log_and_raise.h"
-#include "daemon/net/send.h"
+#include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {
@@ -41,13 +41,14 @@ std::span<const char> raw_rest(const request& r) {
 
 const char* text_rest(const request& r) { return r.rest; }
 
-size_t reply(request& r, std::string_view text) { return text.copy(r.packet.data(), text.size()); }
+answer answer_with(request& r, std::string_view text) {
+    return {text.copy(r.packet.data(), text.size()), unique_fd()};
+}
 
-size_t reply_with_descriptor(request& r, const unique_fd& descriptor) {
-    if (r.fd < 0) return 0;
-    if (!descriptor.ok()) return reply(r, "FAIL");
-    (void)send_fd_message(r.fd, descriptor.get());
-    return 0;
+answer answer_with(request& r, unique_fd descriptor) {
+    if (r.fd < 0) return no_answer();
+    if (!descriptor.ok()) return answer_with(r, "FAIL");
+    return {0, std::move(descriptor)};
 }
 
 bool take_probe_id(request& r, const char* command, probe_id& probe) {

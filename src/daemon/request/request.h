@@ -31,12 +31,20 @@ struct request {
 // The same as text, up to the first NUL; empty when the last token ended the text.
 [[nodiscard]] const char* text_rest(const request& r);
 
-// Writes a reply over the packet; gives its length.
-size_t reply(request& r, std::string_view text);
+// What a request is answered with.
+struct answer {
+    size_t size;           // of the text at the start of the packet; 0: none
+    unique_fd descriptor;  // ok: goes out in place of the text
+};
 
-// Replies with a descriptor, or with "FAIL" when it is none. Nothing for a datagram, to whose
-// sender none can be sent.
-size_t reply_with_descriptor(request& r, const unique_fd& descriptor);
+[[nodiscard]] inline answer no_answer() { return {0, unique_fd()}; }
+
+// Writes the text over the packet.
+[[nodiscard]] answer answer_with(request& r, std::string_view text);
+
+// Gives a descriptor, or the text "FAIL" when it is none. Nothing for a datagram, to whose sender
+// none can be sent.
+[[nodiscard]] answer answer_with(request& r, unique_fd descriptor);
 
 // A probe's id: package and name.
 struct probe_id {

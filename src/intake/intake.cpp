@@ -1,0 +1,147 @@
+#include "intake/intake.h"
+
+#include <fcntl.h>
+#include <openssl/evp.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstring>
+#include <optional>
+#include <utility>
+
+#include "config.pb-c.h"
+#include "config/config_parts.h"
+#include "config/filters.h"
+#include "config/settings.h"
+#include "intake/config_file.h"
+#include "intake/config_request.h"
+#include "intake/run_actions.h"
+#include "platform/android_log.h"
+#include "report/identity.h"
+#include "report/state_file.h"
+#include "runtime/log_and_raise.h"
+#include "security/key_paths.h"
+#include "security/signature.h"
+#include "util/directory.h"
+#include "util/file_io.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-conf";
+
+void clean_input_dir() {
+    (void)for_each_entry(paths::input_dir, [](std::string_view name) {
+        char path[sizeof paths::input_dir + NAME_MAX];
+        snprintf(path, sizeof path, "%s%s", paths::input_dir, name.data());
+        if (unlink(path) == 0) return;
+        __android_log_print(ANDROID_LOG_WARN, tag, "Failed to delete %s.", path);
+    });
+}
+
+bool refuse(const char* reason) {
+    (void)log_and_raise(tag, "%s", reason);
+    return false;
+}
+
+bool checksum_of(std::span<const uint8_t> file, config_checksum& checksum) {
+    return EVP_Digest(file.data(), file.size(), checksum.data(), nullptr, EVP_sha1(), nullptr) == 1;
+}
+
+bool store_package(std::span<const uint8_t> bytes) {
+    const auto package = unpack_message<kiv__config__config_package__unpack,
+                                        kiv__config__config_package__free_unpacked>(bytes);
+    if (!package) return false;
+    retire_config_parts();
+    for (const Kiv__Config__ConfigPart* part : std::span(package->parts, package->n_parts)) {
+        store_config_part(part->package, part->name, {part->payload.data, part->payload.len});
+    }
+    return save_config_list();
+}
+
+void put_in_force(const config_checksum& checksum) {
+    delete_retired_parts();
+    set_config_checksum(checksum);
+    write_config_request();
+    apply_settings();
+    update_header_info();
+    apply_filter_config();
+    run_actions();
+    run_actions_once();
+}
+
+bool take_config_file(std::span<const uint8_t> file) {
+    config_checksum checksum;
+    if (!checksum_of(file, checksum)) return false;
+    if (!extract_config_fields(file)) return refuse("Failed to unpack configuration");
+    if (config_key_available() &&
+        !verify_file(paths::new_config_data, paths::new_config_signature)) {
+        return refuse("Failed to verify configuration");
+    }
+    const std::optional<file_bytes> package = read_config_package();
+    if (!package) return refuse("Failed to read configuration");
+    if (!store_package(package->view())) return refuse("Failed to parse configuration");
+    put_in_force(checksum);
+    return true;
+}
+
+bool take_input() {
+    // Not waiting: a pipe in its place is an empty file.
+    unique_fd fd(open(paths::config_file, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+    struct stat status = {};
+    if (!fd.ok() || fstat(fd.get(), &status) != 0 || S_ISDIR(status.st_mode)) return false;
+    if (std::cmp_greater(status.st_size, max_config_file_size)) {
+        return refuse("Failed to unpack configuration");
+    }
+    const std::optional<file_bytes> file = read_whole_fd(std::move(fd));
+    return file && take_config_file(file->view());
+}
+
+}  // namespace
+
+void write_configuration(std::span<const char> bytes) {
+    const unique_fd file = create_file(paths::config_file);
+    if (!file.ok()) {
+        (void)log_and_raise(tag, "Failed to create configuration file: %s", strerror(errno));
+        return;
+    }
+    if (write_all(file.get(), bytes.data(), bytes.size()) >= 0) return;
+    (void)log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
+}
+
+void install_first_configuration() {
+    if (access(paths::config_file, F_OK) == 0) return;
+    const unique_fd source(open(paths::first_config_file, O_RDONLY | O_CLOEXEC));
+    if (!source.ok()) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to open %s. %s",
+                            paths::first_config_file, strerror(errno));
+        return;
+    }
+    const unique_fd copy = create_file(paths::config_file);
+    if (!copy.ok()) {
+        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to open input configuration: %s",
+                            strerror(errno));
+        return;
+    }
+    std::array<char, 4096> chunk;
+    ssize_t size = 0;
+    while ((size = read(source.get(), chunk.data(), chunk.size())) > 0) {
+        if (write_all(copy.get(), chunk.data(), static_cast<size_t>(size)) < 0) return;
+    }
+}
+
+bool take_new_configuration() {
+    const bool taken = take_input();
+    (void)unlink(paths::new_config_data);
+    (void)unlink(paths::new_config_signature);
+    clean_input_dir();  // input/config with all else
+    return taken;
+}
+
+}  // namespace kivd

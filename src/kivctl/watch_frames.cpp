@@ -1,0 +1,51 @@
+#include "kivctl/watch_frames.h"
+
+#include <cstdint>
+
+#include "toolkit/length_varint.h"
+
+namespace kivd {
+namespace {
+
+constexpr size_t head_size = 4;
+constexpr char packet_key = 0x0a;               // field 1, length-delimited
+constexpr size_t message_size_min = 2;          // of an empty packet
+constexpr size_t message_size_max = 4 + 31176;  // of the largest one
+
+size_t read_head(std::string_view head) {
+    size_t size = 0;
+    for (const char byte : head.substr(0, head_size)) size = size << 8 | static_cast<uint8_t>(byte);
+    return size;
+}
+
+// The packet in a message; none when the message holds anything else.
+std::optional<std::string_view> find_packet(std::string_view message) {
+    if (message[0] != packet_key) return std::nullopt;
+    const length_varint length = read_length(message.substr(1));
+    const std::string_view packet = message.substr(1 + length.size);
+    if (length.size == 0 || length.value != packet.size()) return std::nullopt;
+    return packet;
+}
+
+}  // namespace
+
+void frame_reader::add(std::string_view bytes) {
+    data_.erase(0, start_);
+    start_ = 0;
+    data_ += bytes;
+}
+
+std::optional<debug_frame> frame_reader::next() {
+    const std::string_view left = std::string_view(data_).substr(start_);
+    if (is_broken_ || left.size() < head_size) return std::nullopt;
+    const size_t message_size = read_head(left);
+    is_broken_ = message_size < message_size_min || message_size > message_size_max;
+    if (is_broken_ || left.size() - head_size < message_size) return std::nullopt;
+    const auto packet = find_packet(left.substr(head_size, message_size));
+    is_broken_ = !packet;
+    if (is_broken_) return std::nullopt;
+    start_ += head_size + message_size;
+    return debug_frame{left.substr(0, head_size + message_size), *packet};
+}
+
+}  // namespace kivd

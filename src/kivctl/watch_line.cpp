@@ -1,0 +1,147 @@
+#include "kivctl/watch_line.h"
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <iterator>
+
+#include "toolkit/text_escape.h"
+
+namespace kivd {
+namespace {
+
+using std::string_view;
+
+constexpr string_view delimiters = " \t\r\n";
+constexpr size_t text_characters = 120;  // what is shown at most, of any part of a packet
+constexpr size_t hex_bytes = 32;
+
+enum class target : uint8_t { probe, none };
+enum class rest : uint8_t { words, text, bytes };
+
+struct layout {
+    string_view command;
+    target names;
+    rest carries;
+};
+// clang-format off
+constexpr layout layouts[] = {
+    {"EV", target::probe, rest::bytes},
+    {"CS", target::probe, rest::words},
+    {"CI", target::probe, rest::words},
+    {"SD", target::probe, rest::text},
+    {"PA", target::probe, rest::words},
+    {"GC", target::probe, rest::words},
+    {"IA", target::none,  rest::words},
+    {"FL", target::none,  rest::words},
+    {"FS", target::none,  rest::words},
+    {"NC", target::none,  rest::words},
+    {"WC", target::none,  rest::bytes},
+    {"GD", target::none,  rest::words},
+    {"DC", target::none,  rest::words},
+    {"RM", target::none,  rest::words},
+    {"FN", target::none,  rest::words},
+    {"FG", target::none,  rest::words},
+    {"SN", target::none,  rest::words},
+    {"IM", target::none,  rest::words},
+    {"SG", target::none,  rest::words},
+    {"DG", target::none,  rest::words},
+    {"RG", target::none,  rest::words},
+};
+// clang-format on
+
+string_view until_nul(string_view bytes) { return bytes.substr(0, bytes.find('\0')); }
+
+string_view without_blanks_before(string_view text) {
+    return text.substr(std::min(text.find_first_not_of(delimiters), text.size()));
+}
+
+// Takes the next word off `left`, but not what ended it. A NUL ends all words.
+string_view take_word(string_view& left) {
+    const string_view text = without_blanks_before(until_nul(left));
+    const string_view word = text.substr(0, text.find_first_of(delimiters));
+    left.remove_prefix(static_cast<size_t>(word.data() + word.size() - left.data()));
+    return word;
+}
+
+// A packet as the daemon understands it.
+struct parts {
+    const layout* shape = nullptr;  // null: no known command
+    string_view package, name;
+    string_view left;  // with what ended the last of these; the packet when there is no command
+};
+
+parts take_apart(string_view packet) {
+    parts found;
+    found.left = packet;
+    const string_view command = take_word(found.left);
+    const auto* const shape = std::ranges::find(layouts, command, &layout::command);
+    if (shape == std::end(layouts)) return {nullptr, {}, {}, packet};
+    found.shape = shape;
+    if (shape->names == target::none) return found;
+    found.package = take_word(found.left);
+    found.name = take_word(found.left);
+    return found;
+}
+
+bool is_text(string_view bytes) {
+    while (!bytes.empty()) {
+        const size_t length = utf8_length(bytes);
+        const auto first = static_cast<uint8_t>(bytes[0]);
+        const bool is_control =
+            (first < 0x20 && delimiters.find(bytes[0]) == string_view::npos) || first == 0x7f;
+        if (length == 0 || is_control) return false;
+        bytes.remove_prefix(length);
+    }
+    return true;
+}
+
+std::string quoted(string_view text) { return '"' + printable(text, text_characters) + '"'; }
+
+std::string hex(string_view bytes) {
+    std::string digits;
+    for (const char byte : bytes.substr(0, hex_bytes)) {
+        char text[4];
+        snprintf(text, sizeof text, " %02X", static_cast<uint8_t>(byte));
+        digits += digits.empty() ? text + 1 : text;
+    }
+    return bytes.size() > hex_bytes ? digits + " ..." : digits;
+}
+
+std::string with_size(string_view bytes) {
+    std::string text = std::to_string(bytes.size()) + " bytes";
+    if (!bytes.empty()) text += ": " + (is_text(bytes) ? quoted(bytes) : hex(bytes));
+    return text;
+}
+
+std::string describe_rest(const parts& p) {
+    if (p.shape == nullptr) return with_size(p.left);
+    const bool is_binary = p.shape->carries == rest::bytes;
+    string_view left = is_binary ? p.left : until_nul(p.left);
+    if (p.shape->carries == rest::words) {
+        return printable(without_blanks_before(left), text_characters);
+    }
+    left.remove_prefix(std::min<size_t>(1, left.size()));  // one delimiter; more are part of it
+    return with_size(left);
+}
+
+// Two blanks and the text, nothing when there is none.
+std::string column(const std::string& text) { return text.empty() ? "" : "  " + text; }
+
+}  // namespace
+
+std::string describe_request(string_view packet) {
+    const parts p = take_apart(packet);
+    const std::string size = std::to_string(packet.size());
+    std::string line(size.size() < 5 ? 5 - size.size() : 0, ' ');
+    line += size + "  ";
+    line += p.shape == nullptr ? "??" : p.shape->command;
+    line += column(printable(p.package, text_characters));
+    if (!p.name.empty()) line += ' ' + printable(p.name, text_characters);
+    return line + column(describe_rest(p));
+}
+
+string_view package_of(string_view packet) { return take_apart(packet).package; }
+
+}  // namespace kivd

@@ -1,0 +1,55 @@
+// What a look at a configuration has found.
+#pragma once
+
+#include <google/protobuf/descriptor.h>
+#include <google/protobuf/text_format.h>
+
+#include <cstddef>
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include "kivtool/config/config_source.h"
+
+namespace kivd {
+
+struct lint_finding {
+    bool is_error;
+    std::string text;  // a line: where, error or warning, about what, and what the daemon does
+};
+
+// The record of a list file that the daemon reads back, and how many of them.
+inline constexpr size_t max_list_record = 1024;  // bytes
+inline constexpr size_t max_list_records = 20'000;
+
+// Where something is: a file, a line in it counted from 1, what it is about. No line: 0.
+struct lint_place {
+    std::string path;
+    int line = 0;
+    std::string subject;
+};
+
+class lint_findings {
+ public:
+    void error(const lint_place& place, const std::string& text) { add(true, place, text); }
+    void warning(const lint_place& place, const std::string& text) { add(false, place, text); }
+
+    void append(lint_findings&& others);
+
+    [[nodiscard]] bool has_errors() const;
+    void print(std::ostream& out) const;
+
+ private:
+    void add(bool is_error, const lint_place& place, const std::string& text);
+
+    std::vector<lint_finding> all_;
+};
+
+// "PACKAGE:NAME", printable.
+[[nodiscard]] std::string id_of(const part_content& part);
+
+// The line of a field, 0 when that is not known. `index` is that of a list, or -1.
+[[nodiscard]] int line_of(const google::protobuf::TextFormat::ParseInfoTree* places,
+                          const google::protobuf::FieldDescriptor& field, int index = -1);
+
+}  // namespace kivd

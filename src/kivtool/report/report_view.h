@@ -1,0 +1,27 @@
+// Ways to show reports.
+#pragma once
+
+#include <string>
+
+#include "kivtool/report/report_reader.h"
+
+namespace kivd {
+
+// Takes the records of one file after the other, and shows them while they come or at the end.
+class report_view {
+ public:
+    report_view() = default;
+    virtual ~report_view() = default;
+    report_view(const report_view&) = delete;
+    report_view& operator=(const report_view&) = delete;
+
+    // A file whose first record is about to come; one without records is not told of.
+    virtual void start_file(const std::string& path) = 0;
+    virtual void add(const report_record& record) = 0;
+    // The end of it. Gives what could not be shown, as the end of a sentence, or nothing.
+    virtual std::string finish_file(const report_reader& file) = 0;
+    // The end of all files. Gives what could not be done, as a sentence, or nothing.
+    virtual std::string finish() { return ""; }
+};
+
+}  // namespace kivd

@@ -1,0 +1,17 @@
+// Compressing one whole file.
+#pragma once
+
+#include <cstdint>
+
+namespace kivd {
+
+enum class gzip_level : uint8_t {
+    stored,  // gzip framing around uncompressed data
+    best,
+};
+
+// Copies the file `source` into the gzip file `destination`. 1 when all of it arrived there, else
+// 0: a failure to open either has been logged and raised, and a part of the destination may remain.
+[[nodiscard]] int gzip_file(const char* source, const char* destination, gzip_level level);
+
+}  // namespace kivd

@@ -1,0 +1,77 @@
+#include "store/events.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "config/filters.h"
+#include "config/limits.h"
+#include "record/event_record.h"
+#include "record/header_record.h"
+#include "runtime/log_and_raise.h"
+#include "util/paths.h"
+#include "util/unique_fd.h"
+
+namespace kivd {
+namespace {
+
+constexpr char tag[] = "kivd-events";
+
+// Not a unique_fd: the descriptor stays open until the process ends, after all else is released.
+constinit int events_fd = -1;
+constinit uint64_t events_size = 0;
+
+// The file is only ever appended to, so this is its size.
+void measure_size() {
+    const off_t size = lseek(events_fd, 0, SEEK_END);
+    if (size >= 0) events_size = static_cast<uint64_t>(size);
+}
+
+// A report that began without its header could not be read, so such a file is not kept.
+void start_file() {
+    if (write_report_header(events_fd) == 0) {
+        measure_size();
+        return;
+    }
+    (void)!ftruncate(events_fd, 0);  // in case it cannot be removed either
+    (void)close(events_fd);
+    events_fd = -1;
+    (void)unlink(paths::events);
+}
+
+}  // namespace
+
+void events_open() {
+    if (events_fd >= 0) return;
+    events_fd = open(paths::events, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0700);
+    if (events_fd < 0) {
+        (void)log_and_raise(tag, "Failed to open partial event file: %s", strerror(errno));
+        return;
+    }
+    measure_size();
+    if (events_size == 0) start_file();
+}
+
+event_file events_add(const char* package, const char* name, std::span<const char> payload) {
+    if (!filter_match(filter_kind::events, package, name)) return event_file::open;
+    events_open();
+    if (events_fd < 0) return event_file::open;
+    const ssize_t written = write_event_record(events_fd, package, name, payload, tag);
+    if (written < 0) measure_size();
+    if (written > 0) events_size += static_cast<uint64_t>(written);
+    return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
+}
+
+int events_flush() {
+    events_open();
+    if (events_fd >= 0) (void)close(events_fd);
+    events_fd = -1;
+    return rename(paths::events, paths::flushed_data);
+}
+
+bool events_pending() { return access(paths::events, F_OK) == 0; }
+
+}  // namespace kivd
