@@ -104,7 +104,7 @@ void measure_level(const setup& s, const char* name, gzip_level level, int zlib_
         packed_size = compress_at_once(source, theirs, zlib_level, use);
         const int64_t their_ns = now_ns() - start;
         start = now_ns();
-        if (gzip_file(source.c_str(), ours.c_str(), level) == 0) give_up("fu_gzip_file failed");
+        if (!gzip_file(source.c_str(), ours.c_str(), level)) give_up("gzip_file failed");
         const int64_t our_ns = now_ns() - start;
         if (i == 0) continue;
         our_ms.push_back(static_cast<double>(our_ns) / 1e6);

@@ -12,7 +12,7 @@ namespace kivd::bench {
 
 void write_file(const std::string& path, std::string_view bytes) {
     const unique_fd file = create_file(path.c_str());
-    if (!file.ok() || write_all(file.get(), bytes.data(), bytes.size()) < 0)
+    if (!file.ok() || !write_all(file.get(), bytes.data(), bytes.size()))
         give_up("%s: %s", path.c_str(), strerror(errno));
 }
 

@@ -67,7 +67,7 @@ double seal_in_child(const std::string& directory, const std::string& key_direct
         if (chdir(directory.c_str()) == -1) give_up("chdir failed");
         set_report_key_dir(key_directory.c_str());
         figures[0] = milliseconds_of([] {
-            if (seal_compacted_data() != 0) give_up("seal_compacted_data failed");
+            if (!seal_compacted_data()) give_up("seal_compacted_data failed");
         });
     });
     return milliseconds;
@@ -94,10 +94,11 @@ void encrypt_plainly(const std::string& source, const std::string& destination,
     if (!good) give_up("EVP_EncryptUpdate failed");
 }
 
-void encrypt_as_daemon(const std::string& source, const std::string& destination, seal& opened) {
+void encrypt_as_daemon(const std::string& source, const std::string& destination,
+                       sealing& started) {
     const unique_fd input(open(source.c_str(), O_RDONLY | O_CLOEXEC));
     const unique_fd output = create_file(destination.c_str());
-    if (!input.ok() || !output.ok() || encrypt_file(input.get(), output.get(), opened) == 0)
+    if (!input.ok() || !output.ok() || !encrypt_file(input.get(), output.get(), started))
         give_up("encrypt_file failed");
 }
 
@@ -121,11 +122,12 @@ void run_in_process(const setup& s, const std::string& directory, const std::str
         };
         const auto run_daemon = [&](double& open_ms) {
             remove_files({ours});
-            seal opened = {};
+            std::optional<sealing> started;
             open_ms = milliseconds_of([&] {
-                if (open_report_seal(opened) == 0) give_up("open_report_seal failed");
+                started = start_sealing();
+                if (!started) give_up("start_sealing failed");
             });
-            return milliseconds_of([&] { encrypt_as_daemon(source, ours, opened); });
+            return milliseconds_of([&] { encrypt_as_daemon(source, ours, *started); });
         };
         double unused = 0;
         (void)run_loop();

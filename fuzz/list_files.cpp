@@ -59,7 +59,7 @@ bool is_in_order(std::string_view file) {
         if (previous != nullptr) {
             const probe_key before = key_of(previous);
             const probe_key after = key_of(file.data());
-            if (compare_probes(&before, &after) >= 0) return false;
+            if (compare_probes(before, after) >= 0) return false;
         }
         previous = file.data();
         file.remove_prefix(end + terminator.size());

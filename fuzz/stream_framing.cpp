@@ -118,9 +118,9 @@ void check_connection(const listening_socket& listening, input_bytes input) {
 
 }  // namespace
 
-int event_loop_add(event_handler& handler) {
+bool event_loop_add(event_handler& handler) {
     connection = &handler;
-    return 0;
+    return true;
 }
 
 void event_loop_remove(event_handler& /*handler*/) { connection = nullptr; }
@@ -137,7 +137,7 @@ stall_guard::~stall_guard() = default;
 int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using namespace kivd;
     static const listening_socket listening;
-    static const bool mapped = packet_buffers_init() == 0;
+    static const bool mapped = packet_buffers_init();
     require(mapped, "no packet buffers");
     check_header({data, size});
     clear_files();

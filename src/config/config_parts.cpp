@@ -6,13 +6,12 @@
 #include <array>
 #include <climits>
 #include <cstdio>
-#include <cstdlib>
+#include <string_view>
 
 #include "format/probe_key.h"
 #include "list/list_file.h"
 #include "list/sorted_list.h"
 #include "platform/android_log.h"
-#include "runtime/daemon_error.h"
 #include "runtime/log_and_raise.h"
 #include "util/numbers.h"
 #include "util/paths.h"
@@ -26,42 +25,27 @@ constexpr char own_package[] = "kivd";
 // Holds the highest id that was ever given out; has no file and is never in force.
 constexpr probe_key last_id_key = {own_package, "_last_id"};
 
-// One block of malloc with the two texts behind it.
-struct config_item {
-    probe_key key;
+struct config_item : probe_key {
     int32_t id;
     int32_t in_use;  // 1 while in force
 };
 
-constinit sorted_list* parts = nullptr;
+constinit sorted_list<config_item> parts(16);
 
 struct part_path {
     explicit part_path(int32_t id) { snprintf(text, sizeof text, paths::config_part_format, id); }
     char text[sizeof paths::config_part_format + 12];
 };
 
-config_item* find_item(const probe_key& key) {
-    return static_cast<config_item*>(list_find(*parts, &key));
-}
+bool is_last_id(const probe_key& key) { return compare_probes(last_id_key, key) == 0; }
 
-void* make_item(const probe_key& key, int32_t id, int32_t in_use) {
-    void* const block = new_probe_element(sizeof(config_item), key);
-    if (block == nullptr) return nullptr;
-    auto& item = *static_cast<config_item*>(block);
-    item.id = id;
-    item.in_use = in_use;
-    return block;
-}
-
-bool is_last_id(const probe_key& key) { return compare_probes(&last_id_key, &key) == 0; }
-
-void* parse_record(const char* record, const char* terminator, void* /*context*/) {
+unique_entry<config_item> parse_record(std::string_view record) {
     std::array<const char*, 4> fields;
-    const bool is_complete = split_record(record, terminator, fields);
+    const bool is_complete = split_list_record(record, fields);
     const probe_key key = {fields[0], fields[1]};
     const int32_t id = is_complete ? parse_saturated(fields[2]) : 0;
     if (id >= 1 || (is_complete && is_last_id(key))) {
-        return make_item(key, id, parse_saturated(fields[3]));
+        return make_entry<config_item>(key, id, parse_saturated(fields[3]));
     }
     if (fields.back() != nullptr) {
         __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to parse config line.");
@@ -69,119 +53,103 @@ void* parse_record(const char* record, const char* terminator, void* /*context*/
     return nullptr;
 }
 
-int write_record(FILE* file, const void* element, void* /*context*/) {
-    const auto& item = *static_cast<const config_item*>(element);
-    record_writer writer(file);
-    writer.text(item.key.package);
-    writer.text(item.key.name);
+bool write_record(list_writer& writer, const config_item& item) {
+    writer.text(item.package);
+    writer.text(item.name);
     writer.number(item.id);
     writer.number(item.in_use);
-    if (writer.finish()) return 1;
-    (void)log_and_raise(tag, "Failed to write to configuration list file.");
-    return 0;
+    if (writer.end_record()) return true;
+    return log_and_raise(tag, "Failed to write to configuration list file.");
 }
 
 // The id of a part; 0 for the counter, which has the id of one.
-int32_t id_of(const void* element) {
-    const auto& item = *static_cast<const config_item*>(element);
-    return is_last_id(item.key) ? 0 : item.id;
-}
+int32_t id_of(const config_item& item) { return is_last_id(item) ? 0 : item.id; }
 
-// Drops each item that is equal to a neighbour, and that one too.
-void drop_equal_items(auto equal) {
-    sorted_list& list = *parts;
-    uint32_t kept = 0;
-    bool equals_last = false;
-    for (uint32_t i = 0; i < list.count; ++i) {
-        void* const element = list.elements[i];
-        const bool equals_next = i + 1 < list.count && equal(element, list.elements[i + 1]);
-        if (equals_last || equals_next) {
-            const auto& key = static_cast<const config_item*>(element)->key;
+// Puts the list into `order` (below 0, 0, above 0), and drops each item that is equal in it to a
+// neighbour, and that one too.
+void sort_and_drop_equal(auto order) {
+    parts.sort([order](const config_item& a, const config_item& b) { return order(a, b) < 0; });
+    bool equals_previous = false;
+    parts.drop_if([&](const config_item& item, const config_item* next) {
+        const bool equals_next = next != nullptr && order(item, *next) == 0;
+        const bool dropped = equals_previous || equals_next;
+        equals_previous = equals_next;
+        if (dropped) {
             __android_log_print(ANDROID_LOG_ERROR, tag, "Dropped config line <%s::%s>.",
-                                key.package, key.name);
-            free(element);
-        } else {
-            list.elements[kept++] = element;
+                                item.package, item.name);
         }
-        equals_last = equals_next;
-    }
-    list.count = kept;
+        return dropped;
+    });
 }
 
 // A list file that was damaged may have items that share an id, so that nobody knows whose file it
 // is, or that are not found where they stand. A part that is dropped gets a new id when it comes
 // with a configuration.
 void repair_list() {
-    const auto items = [] { return std::span(parts->elements, parts->count); };
-    std::ranges::sort(items(), {}, id_of);
-    drop_equal_items([](const void* a, const void* b) { return id_of(a) == id_of(b); });
-    std::ranges::sort(items(), [](void* a, void* b) { return compare_probes(a, b) < 0; });
-    drop_equal_items([](const void* a, const void* b) { return compare_probes(a, b) == 0; });
+    sort_and_drop_equal([](const config_item& a, const config_item& b) {
+        return id_of(a) < id_of(b) ? -1 : static_cast<int>(id_of(a) > id_of(b));
+    });
+    sort_and_drop_equal(compare_probes);
 }
 
 int32_t highest_id() {
     int32_t highest = 0;
-    list_foreach<config_item>(
-        *parts, [&highest](const config_item& item) { highest = std::max(highest, item.id); });
+    parts.for_each([&](const config_item& item) { highest = std::max(highest, item.id); });
     return highest;
+}
+
+// An item that is not there yet; null when there is no memory.
+config_item* add_item(const probe_key& key, int32_t id, int32_t in_use) {
+    unique_entry<config_item> added = make_entry<config_item>(key, id, in_use);
+    return added ? parts.add(std::move(added)) : nullptr;
 }
 
 // A list file that has lost its counter must not have an id given out for the second time.
 void repair_last_id() {
-    if (config_item* const last = find_item(last_id_key)) {
+    if (config_item* const last = parts.find(last_id_key)) {
         last->id = highest_id();
         last->in_use = 0;
-    } else if (parts->count > 0) {
-        void* added = make_item(last_id_key, highest_id(), 0);
-        if (added != nullptr) (void)list_add(*parts, added);
+    } else if (parts.size() > 0) {
+        (void)add_item(last_id_key, highest_id(), 0);
     }
 }
 
 // An id that was never given out before; below 1 when there is none.
 int32_t take_new_id() {
-    if (config_item* const last = find_item(last_id_key)) {
-        return last->id < INT32_MAX ? ++last->id : 0;
-    }
-    void* first = make_item(last_id_key, 1, 0);
-    if (first == nullptr) return 0;
-    if (list_add(*parts, first) == 1) return 1;
-    free(first);
-    return 0;
+    config_item* last = parts.find(last_id_key);
+    if (last == nullptr) last = add_item(last_id_key, 0, 0);
+    return last != nullptr && last->id < INT32_MAX ? ++last->id : 0;
 }
 
-config_item* add_item(const probe_key& key) {
+config_item* add_part(const probe_key& key) {
     const int32_t id = take_new_id();
     if (id < 1) return nullptr;
-    void* added = make_item(key, id, 1);
-    if (added == nullptr) return nullptr;
-    if (list_add(*parts, added) == 1) return static_cast<config_item*>(added);
-    (void)log_and_raise(tag, "Failed to add new config item: list_add.");
-    free(added);
-    return nullptr;
+    config_item* const added = add_item(key, id, 1);
+    if (added == nullptr) log_and_raise(tag, "Failed to add new config item: list_add.");
+    return added;
 }
 
 void write_part(int32_t id, std::span<const uint8_t> payload) {
     const part_path path(id);
     const unique_fd file = create_file(path.text);
-    if (!file.ok() || write_all(file.get(), payload.data(), payload.size()) >= 0) return;
-    (void)log_and_raise(tag, "Failed to write config %d with %zu bytes", id, payload.size());
+    if (!file.ok() || write_all(file.get(), payload.data(), payload.size())) return;
+    log_and_raise(tag, "Failed to write config %d with %zu bytes", id, payload.size());
     (void)unlink(path.text);
 }
 
 }  // namespace
 
 void load_config_list() {
-    parts = list_create(32, 16, compare_probes, nullptr);
-    if (parts == nullptr) fatal_error("OOM, while creating config_list_p");
-    (void)list_load(*parts, paths::config_list, parse_record, nullptr);
+    parts.clear();
+    (void)list_load(parts, paths::config_list, parse_record);
     repair_list();
     repair_last_id();
 }
 
-void release_config_list() { list_destroy(parts); }
+void release_config_list() { parts.clear(); }
 
 unique_fd get_config_fd(const char* package, const char* name) {
-    const config_item* const item = find_item({package, name});
+    const config_item* const item = parts.find({package, name});
     if (item == nullptr || item->in_use == 0) return unique_fd();
     return open_regular(part_path(item->id).text);
 }
@@ -193,7 +161,7 @@ std::optional<file_bytes> read_own_part(const char* name) {
 }
 
 void retire_config_parts() {
-    list_foreach<config_item>(*parts, [](config_item& item) { item.in_use = 0; });
+    parts.for_each([](config_item& item) { item.in_use = 0; });
 }
 
 void store_config_part(const char* package, const char* name, std::span<const uint8_t> payload) {
@@ -202,25 +170,23 @@ void store_config_part(const char* package, const char* name, std::span<const ui
         __android_log_print(ANDROID_LOG_WARN, tag, "Skipped part with the reserved name %s.", name);
         return;
     }
-    config_item* item = find_item(key);
-    if (item == nullptr) item = add_item(key);
+    config_item* item = parts.find(key);
+    if (item == nullptr) item = add_part(key);
     if (item == nullptr) return;
     item->in_use = 1;
     write_part(item->id, payload);
 }
 
-bool save_config_list() {
-    return list_save(*parts, paths::config_list, write_record, nullptr) != 0;
-}
+bool save_config_list() { return list_save(parts, paths::config_list, write_record); }
 
 void delete_retired_parts() {
-    list_foreach<config_item>(*parts, [](const config_item& item) {
-        if (item.in_use == 0 && !is_last_id(item.key)) (void)unlink(part_path(item.id).text);
+    parts.for_each([](const config_item& item) {
+        if (item.in_use == 0 && !is_last_id(item)) (void)unlink(part_path(item.id).text);
     });
 }
 
 void retire_own_part(const char* name) {
-    if (config_item* const item = find_item({own_package, name})) item->in_use = 0;
+    if (config_item* const item = parts.find({own_package, name})) item->in_use = 0;
 }
 
 }  // namespace kivd

@@ -12,7 +12,7 @@
 
 namespace kivd {
 
-// Loads private/config_list.txt; a missing file is fine. Ends the process when out of memory.
+// Loads private/config_list.txt; a missing file is fine.
 void load_config_list();
 void release_config_list();
 

@@ -9,8 +9,7 @@ namespace kivd {
 
 enum class filter_kind : uint8_t { counters, static_data, events };
 
-// Loads the filter files; a missing one is fine. True when there was one for events. Ends the
-// process when out of memory.
+// Loads the filter files; a missing one is fine. True when there was one for events.
 bool load_filters();
 void release_filters();
 

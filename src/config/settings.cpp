@@ -44,12 +44,12 @@ void take_limits(const Kivd__Settings& settings, limits& values) {
 
 void check_limits(limits& values) {
     if (values.max_report_size <= values.max_output_dir_size) return;
-    (void)log_and_raise(tag,
-                        "Bad settings found in configuration file, report_max_size (%zu) > "
-                        "output_dir_max_size (%zu). Default values (%d)(%d) will be used",
-                        size_t{values.max_report_size}, size_t{values.max_output_dir_size},
-                        static_cast<int>(default_max_report_size),
-                        static_cast<int>(default_max_output_dir_size));
+    log_and_raise(tag,
+                  "Bad settings found in configuration file, report_max_size (%zu) > "
+                  "output_dir_max_size (%zu). Default values (%d)(%d) will be used",
+                  size_t{values.max_report_size}, size_t{values.max_output_dir_size},
+                  static_cast<int>(default_max_report_size),
+                  static_cast<int>(default_max_output_dir_size));
     values.max_report_size = default_max_report_size;
     values.max_output_dir_size = default_max_output_dir_size;
 }

@@ -93,7 +93,7 @@ void take_lock() {
     while (!is_current_lock(fd.get())) fd = lock_file();
     char line[20];
     const int size = snprintf(line, sizeof line, "%d\n", getpid());
-    if (write_all(fd.get(), line, static_cast<size_t>(size)) < 0) exit(1);
+    if (!write_all(fd.get(), line, static_cast<size_t>(size))) exit(1);
     set_inherited_descriptor(fd.release());
 }
 
@@ -146,6 +146,14 @@ void create_directories() {
     create_directory(paths::output_dir, 0755, "output");
     create_directory(paths::input_dir, 0755, "input");
     umask(022);
+}
+
+// Where the marker says that the daemon is disabled: says so and waits until a stop is requested.
+void wait_while_disabled() {
+    if (access(paths::disable_marker, F_OK) != 0) return;
+    __android_log_print(ANDROID_LOG_ERROR, "kivd-util", "KIV will disable itself.");
+    constexpr int day_ms = 86400 * 1000;
+    while (!is_stop_requested()) wait_for_stop(day_ms);
 }
 
 // Puts the process into its place: detached, in its directory, the only one there.
@@ -212,13 +220,13 @@ int run_daemon(int argc, char** argv) {
     const options given = parse_options(argc, argv);
     install_signal_handlers();
     enter_working_directory(given);
-    check_disabled();
+    wait_while_disabled();
 
     __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
     create_directories();
     load_everything();
 
-    if (event_loop_init() != 0) exit(1);
+    if (!event_loop_init()) exit(1);
     create_client_sockets();
     if (given.debug_interface) {
         __android_log_print(ANDROID_LOG_INFO, tag, "kivddi (kivd debug interface) Enabled.");

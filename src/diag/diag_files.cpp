@@ -35,7 +35,7 @@ std::optional<int32_t> diag_number(std::string_view name) {
 
 void delete_entry(const char* path) {
     if (unlink(path) == 0 || errno == ENOENT) return;
-    (void)log_and_raise(tag, "Failed to delete %s, <%s>", path, strerror(errno));
+    log_and_raise(tag, "Failed to delete %s, <%s>", path, strerror(errno));
 }
 
 }  // namespace

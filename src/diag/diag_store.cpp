@@ -61,7 +61,7 @@ unique_fd open_current(int32_t number) {
     const diag_path path('z', number);
     unique_fd fd(open(path.text, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NONBLOCK, 0700));
     if (!fd.ok()) {
-        (void)log_and_raise(tag, "Failed to open %s, <%s>", path.text, strerror(errno));
+        log_and_raise(tag, "Failed to open %s, <%s>", path.text, strerror(errno));
     }
     return fd;
 }
@@ -70,7 +70,7 @@ unique_fd open_current(int32_t number) {
 void compress(int32_t number) {
     const diag_path plain('z', number);
     const diag_path compressed('y', number);
-    if (gzip_file(plain.text, paths::diag_compressed, gzip_level::best) != 0 &&
+    if (gzip_file(plain.text, paths::diag_compressed, gzip_level::best) &&
         rename(paths::diag_compressed, compressed.text) == 0) {
         delete_diag_file(plain);
     } else {
@@ -85,7 +85,7 @@ void start_compressor(int32_t number) {
     diag_wait_for_compressor();
     __android_log_print(ANDROID_LOG_INFO, tag, "Compressing Report...");
     compressor_pid = fork_child(child_kind::worker);
-    if (compressor_pid < 0) (void)log_and_raise(tag, "Failed to fork compactor thread.");
+    if (compressor_pid < 0) log_and_raise(tag, "Failed to fork compactor thread.");
     if (compressor_pid != 0) return;
 
     compress(number);
@@ -110,7 +110,7 @@ int32_t make_room(const diag_numbers& numbers) {
 unique_fd open_write_file() {
     diag_numbers numbers;
     if (!scan_diag_files(numbers)) {
-        (void)log_and_raise(tag, "qz_file_statdir() failed: %s", strerror(errno));
+        log_and_raise(tag, "qz_file_statdir() failed: %s", strerror(errno));
         return unique_fd();
     }
     unique_fd current = open_current(numbers.highest);
@@ -129,16 +129,14 @@ void switch_off() {
     diag_wait_for_compressor();  // it would leave another file
     delete_all_diag_entries();
     if (rmdir(paths::diag_dir) == 0 || errno == ENOENT) return;
-    (void)log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s",
-                        strerror(errno));
+    log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s", strerror(errno));
 }
 
 // A record that a crash has torn must not have others behind it.
 void qz_rescue_event_file() {
     diag_numbers numbers;
     if (!scan_diag_files(numbers)) {
-        (void)log_and_raise(tag, "qz_rescue_event_file: qz_file_statdir() failed: %s",
-                            strerror(errno));
+        log_and_raise(tag, "qz_rescue_event_file: qz_file_statdir() failed: %s", strerror(errno));
         return;
     }
     rescue_event_file(diag_path('z', numbers.highest).text, record_header::absent);
@@ -146,8 +144,8 @@ void qz_rescue_event_file() {
 
 void switch_on() {
     if (mkdir(paths::diag_dir, 0700) != 0 && errno != EEXIST) {
-        (void)log_and_raise(tag, "Failed to create Lumora Diagnostics output directory: %s",
-                            strerror(errno));
+        log_and_raise(tag, "Failed to create Lumora Diagnostics output directory: %s",
+                      strerror(errno));
     }
     qz_rescue_event_file();
 }

@@ -14,14 +14,15 @@ constexpr int32_t diag_file_set = 750;
 
 int32_t next_exported_file(const char* set, const char* number) {
     if (set == nullptr || number == nullptr) {
-        return log_and_raise(tag, "File iterator next, null parameters found.");
+        log_and_raise(tag, "File iterator next, null parameters found.");
+        return -1;
     }
     return parse_saturated(set) == diag_file_set ? next_diag_file(parse_saturated(number)) : -1;
 }
 
 unique_fd open_exported_file(const char* set, const char* number) {
     if (set == nullptr || number == nullptr) {
-        (void)log_and_raise(tag, "File get, null parameters found.");
+        log_and_raise(tag, "File get, null parameters found.");
         return unique_fd();
     }
     if (parse_saturated(set) != diag_file_set) return unique_fd();

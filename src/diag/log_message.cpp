@@ -6,6 +6,7 @@
 #include <optional>
 #include <string_view>
 
+#include "format/varint.h"
 #include "runtime/log_and_raise.h"
 #include "system_logging.pb-c.h"
 #include "util/protobuf_message.h"
@@ -37,17 +38,6 @@ constexpr uint32_t nesting_field(int depth) {
 
 using bytes = std::span<const uint8_t>;
 
-std::optional<uint64_t> take_varint(bytes& rest, size_t max_size) {
-    uint64_t value = 0;
-    for (size_t i = 0; i < std::min(rest.size(), max_size); ++i) {
-        value |= uint64_t{rest[i] & 0x7FU} << (7 * i);
-        if ((rest[i] & 0x80U) != 0) continue;
-        rest = rest.subspan(i + 1);
-        return value;
-    }
-    return std::nullopt;
-}
-
 std::optional<bytes> take_bytes(bytes& rest, size_t size) {
     if (size > rest.size()) return std::nullopt;
     const bytes taken = rest.first(size);
@@ -59,13 +49,14 @@ std::optional<bytes> take_bytes(bytes& rest, size_t size) {
 std::optional<bytes> take_content(bytes& rest, uint32_t type) {
     switch (type) {
         case varint:
-            return take_varint(rest, 10) ? std::optional<bytes>(bytes()) : std::nullopt;
+            return take_varint(rest, max_varint64_size) ? std::optional<bytes>(bytes())
+                                                        : std::nullopt;
         case fixed64:
             return take_bytes(rest, 8);
         case fixed32:
             return take_bytes(rest, 4);
         case length_delimited:
-            if (const auto size = take_varint(rest, 5)) {
+            if (const auto size = take_varint(rest, max_varint32_size)) {
                 return take_bytes(rest, static_cast<uint32_t>(*size));
             }
             return std::nullopt;
@@ -79,7 +70,7 @@ std::optional<bytes> take_content(bytes& rest, uint32_t type) {
 bool is_decodable(bytes message, int depth) {
     if (depth > max_depth) return false;
     while (!message.empty()) {
-        const auto key = take_varint(message, 5);
+        const auto key = take_varint(message, max_varint32_size);
         if (!key) return false;
         const auto type = static_cast<uint32_t>(*key & 7U);
         const auto content = take_content(message, type);
@@ -101,8 +92,7 @@ bool is_kept_log_message(std::span<const char> payload) {
                              kiv__system_logging__log_message__free_unpacked>(encoded)
             : nullptr;
     if (!message || message->tag == nullptr) {
-        (void)log_and_raise(tag, "Failed to unpack protobuf LogMessage");
-        return false;
+        return log_and_raise(tag, "Failed to unpack protobuf LogMessage");
     }
     const auto* const kept =
         std::ranges::find(kept_tags, std::string_view(message->tag), &kept_tag::name);

@@ -3,6 +3,8 @@
 #include <cstring>
 #include <string_view>
 
+#include "format/varint.h"
+
 namespace kivd {
 namespace {
 
@@ -51,23 +53,6 @@ class field_writer {
 };
 
 }  // namespace
-
-size_t varint64_size(uint64_t value) {
-    size_t size = 1;
-    for (; value >= 0x80; value >>= 7U) ++size;
-    return size;
-}
-
-size_t varint32_size(uint32_t value) { return varint64_size(value); }
-
-size_t pack_varint64(uint8_t* out, uint64_t value) {
-    size_t size = 0;
-    for (; value >= 0x80; value >>= 7U) out[size++] = static_cast<uint8_t>(value | 0x80U);
-    out[size++] = static_cast<uint8_t>(value);
-    return size;
-}
-
-size_t pack_varint32(uint8_t* out, uint32_t value) { return pack_varint64(out, value); }
 
 size_t pack_event_record(std::span<uint8_t> buffer, const char* package, const char* name,
                          int64_t timestamp, size_t payload_size) {

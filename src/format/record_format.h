@@ -16,13 +16,6 @@ namespace kivd {
 inline constexpr uint8_t header_record_key = 0x0A;
 inline constexpr uint8_t event_record_key = 0x12;
 
-// Base-128 varints, least significant group first, of 1 to 5 or 1 to 10 bytes. The packers give the
-// bytes written; `out` has room for the longest.
-[[nodiscard]] size_t varint32_size(uint32_t value);
-[[nodiscard]] size_t varint64_size(uint64_t value);
-size_t pack_varint32(uint8_t* out, uint32_t value);
-size_t pack_varint64(uint8_t* out, uint64_t value);
-
 // The head of an event record, up to and including the payload's length: the caller writes the
 // payload right behind it. Timestamps are milliseconds since the epoch.
 [[nodiscard]] size_t pack_event_record(std::span<uint8_t> buffer, const char* package,

@@ -48,7 +48,7 @@ std::optional<uint32_t> take_length(config_bytes& bytes) {
         if (static_cast<int32_t>(length) > room) break;
         return length;
     }
-    (void)log_and_raise(tag, "Corrupt file - bad field length");
+    log_and_raise(tag, "Corrupt file - bad field length");
     return std::nullopt;
 }
 
@@ -57,13 +57,11 @@ bool extract_field(config_bytes& bytes, const char* path) {
     if (!length) return false;
     if (*length <= bytes.rest.size()) {
         const unique_fd file = create_file(path);
-        const bool written =
-            file.ok() && write_all(file.get(), bytes.rest.data(), *length) == ssize_t{*length};
+        const bool written = file.ok() && write_all(file.get(), bytes.rest.data(), *length);
         bytes.rest = bytes.rest.subspan(*length);
         if (written || *length == 0) return true;
     }
-    (void)log_and_raise(tag, "Failed to extract to %s", path);
-    return false;
+    return log_and_raise(tag, "Failed to extract to %s", path);
 }
 
 // Appends the next chunk to the package. Gives its size, or nothing on failure.

@@ -45,10 +45,7 @@ void clean_input_dir() {
     });
 }
 
-bool refuse(const char* reason) {
-    (void)log_and_raise(tag, "%s", reason);
-    return false;
-}
+bool refuse(const char* reason) { return log_and_raise(tag, "%s", reason); }
 
 bool checksum_of(std::span<const uint8_t> file, config_checksum& checksum) {
     return EVP_Digest(file.data(), file.size(), checksum.data(), nullptr, EVP_sha1(), nullptr) == 1;
@@ -105,14 +102,14 @@ bool take_input() {
 
 }  // namespace
 
-void write_configuration(std::span<const char> bytes) {
+void replace_config_file(std::span<const char> bytes) {
     const unique_fd file = create_file(paths::config_file);
     if (!file.ok()) {
-        (void)log_and_raise(tag, "Failed to create configuration file: %s", strerror(errno));
+        log_and_raise(tag, "Failed to create configuration file: %s", strerror(errno));
         return;
     }
-    if (write_all(file.get(), bytes.data(), bytes.size()) >= 0) return;
-    (void)log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
+    if (write_all(file.get(), bytes.data(), bytes.size())) return;
+    log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
 }
 
 void install_first_configuration() {
@@ -132,7 +129,7 @@ void install_first_configuration() {
     std::array<char, 4096> chunk;
     ssize_t size = 0;
     while ((size = read(source.get(), chunk.data(), chunk.size())) > 0) {
-        if (write_all(copy.get(), chunk.data(), static_cast<size_t>(size)) < 0) return;
+        if (!write_all(copy.get(), chunk.data(), static_cast<size_t>(size))) return;
     }
 }
 

@@ -7,7 +7,7 @@
 namespace kivd {
 
 // Replaces input/config. Failures have been logged and raised.
-void write_configuration(std::span<const char> bytes);
+void replace_config_file(std::span<const char> bytes);
 
 // Copies the system's first configuration to input/config unless there is one. Failures have been
 // logged.

@@ -28,7 +28,7 @@ constinit int log_reader_fd = -1;
     const char* const usual[] = {paths::log_reader, "main", nullptr};
     const char* const test_mode[] = {paths::log_reader, "-s", "/data/kiv_run/", "main", nullptr};
     exec_program(is_test_mode() ? test_mode : usual);
-    (void)log_and_raise(tag, "Failed to execute log reader: %s", strerror(errno));
+    log_and_raise(tag, "Failed to execute log reader: %s", strerror(errno));
     _exit(1);
 }
 
@@ -38,12 +38,12 @@ void start_log_reader() {
     const pid_t pid = fork_child(child_kind::program);
     if (pid == 0) become_log_reader();
     if (pid < 0) {
-        (void)log_and_raise(tag, "Failed to start log reader");
+        log_and_raise(tag, "Failed to start log reader");
         return;
     }
     log_reader_fd = static_cast<int>(syscall(SYS_pidfd_open, pid, 0));
     if (log_reader_fd >= 0 || errno == ESRCH) return;  // or it has ended already
-    (void)log_and_raise(tag, "Failed to keep hold of log reader: %s", strerror(errno));
+    log_and_raise(tag, "Failed to keep hold of log reader: %s", strerror(errno));
 }
 
 void stop_log_reader() {

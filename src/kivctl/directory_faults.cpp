@@ -9,8 +9,8 @@
 #include <string_view>
 
 #include "config.pb-c.h"
+#include "format/list_record.h"
 #include "kivctl/io.h"
-#include "list/list_file.h"
 #include "util/directory.h"
 #include "util/paths.h"
 #include "util/protobuf_message.h"
@@ -21,7 +21,6 @@ namespace {
 using std::string_view;
 
 constexpr size_t list_size_max = list_record_size_max * (list_records_max + 1);
-constexpr string_view terminator(list_terminator, sizeof list_terminator);
 
 enum class maker : bool { daemon, worker };
 
@@ -62,18 +61,18 @@ std::optional<std::vector<temporary>> list_temporaries() {
 
 // Empty when the daemon can read all of it.
 std::string find_list_fault(string_view content, bool is_filter) {
-    int records = 0;
-    for (; content.size() >= terminator.size() && records < list_records_max; ++records) {
-        const size_t end = content.substr(0, list_record_size_max).find(terminator);
-        if (end == string_view::npos) {
+    size_t records = 0;
+    for (; content.size() >= list_record_end.size() && records < list_records_max; ++records) {
+        const auto record = first_list_record(content);
+        if (!record) {
             return "record " + std::to_string(records + 1) + " has more than " +
                    std::to_string(list_record_size_max) + " bytes or no end";
         }
-        content.remove_prefix(end + terminator.size());
+        content.remove_prefix(record->size() + list_record_end.size());
     }
     // a filter that is just full is not known to be read to its end
     const bool is_full = records == list_records_max;
-    if (is_full && (is_filter || content.size() >= terminator.size())) {
+    if (is_full && (is_filter || content.size() >= list_record_end.size())) {
         return "there are more than " + std::to_string(list_records_max - (is_filter ? 1 : 0)) +
                " records";
     }
@@ -84,12 +83,12 @@ std::string find_list_fault(string_view content, bool is_filter) {
 bool accepts_everything(string_view content) {
     constexpr string_view marker("__type\0exclude", 14);
     bool is_exclude = false, has_items = false, has_all = false;
-    for (size_t end; (end = content.find(terminator)) != string_view::npos;
-         content.remove_prefix(end + terminator.size())) {
-        const bool is_marker = content.substr(0, end) == marker;
+    while (const auto record = first_list_record(content)) {
+        const bool is_marker = *record == marker;
         is_exclude = is_exclude || is_marker;
         has_items = has_items || !is_marker;
         has_all = has_all || content.starts_with('*');
+        content.remove_prefix(record->size() + list_record_end.size());
     }
     return is_exclude ? !has_items : has_all;
 }

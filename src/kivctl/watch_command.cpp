@@ -166,7 +166,7 @@ bool wait_readable(int fd) {
 
 // False when nobody reads it any more.
 bool write_output(std::string_view text) {
-    if (write_all(STDOUT_FILENO, text.data(), text.size()) >= 0) return true;
+    if (write_all(STDOUT_FILENO, text.data(), text.size())) return true;
     if (errno == EPIPE) return false;
     fail_output();
 }

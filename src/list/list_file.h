@@ -1,61 +1,98 @@
-// List files: the on-disk form of a sorted list. A field is its text and a NUL; a record is its
-// fields, one more NUL and a line feed, so each ends in 00 00 0A and is at most 1024 bytes long to
-// be readable. A file is records end to end, in list order, at most 20000 of them.
+// List files: the on-disk form of a sorted list. Layout and limits: format/list_record.h.
 #pragma once
 
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
-#include <span>
+#include <optional>
 #include <string_view>
 
+#include "format/list_record.h"
 #include "list/sorted_list.h"
+#include "runtime/log_and_raise.h"
+#include "util/unique_fd.h"
 
 namespace kivd {
 
-inline constexpr int list_records_max = 20000;
-inline constexpr size_t list_record_size_max = 1024;  // bytes, its end with it
-inline constexpr char list_terminator[] = {'\0', '\0', '\n'};
-
-// Makes an element of one record, or null to skip it. `terminator` is the first of the three bytes
-// that end the record: the last field's NUL.
-using list_parse_fn = void* (*)(const char* record, const char* terminator, void* context);
-
-// Writes one record, or nothing to leave the element out. 0 when the write failed, after logging.
-using list_write_fn = int (*)(FILE* file, const void* element, void* context);
-
-// Appends the records of the file at `path` to `list`. 1 when the whole file was read; 0 when it is
-// missing, has 20000 records or more, or could not be read on, which has been logged and raised.
-int list_load(sorted_list& list, const char* path, list_parse_fn parse, void* context);
-
-// Replaces the file at `path`, through a temporary file beside it. On failure (0; logged and
-// raised) the old file is untouched and the temporary one gone.
-[[nodiscard]] int list_save(const sorted_list& list, const char* path, list_write_fn write,
-                            void* context);
-
-// Writes the fields of one record. Buffered by the stream, so a failure may show only later.
-class record_writer {
+// Reads a list file, record by record.
+class list_reader {
  public:
-    explicit record_writer(FILE* file) : file_(file) {}
-    void text(std::string_view field);
-    void number(int64_t field);
-    // Ends the record; false, with errno set, when any of its bytes could not be written.
-    [[nodiscard]] bool finish();
+    explicit list_reader(const char* path);
+
+    // The next record, valid until the next call; see first_list_record. Nothing at the end of the
+    // file, behind 20000 records, when the file cannot be opened, and when it cannot be read on,
+    // which has been logged and raised.
+    [[nodiscard]] std::optional<std::string_view> next();
+
+    // Whether the last record of the file was the last that `next` gave.
+    [[nodiscard]] bool is_complete() const { return complete_; }
 
  private:
-    void put(const char* bytes, size_t size);
+    void refill();
 
-    FILE* file_;
-    bool ok_ = true;
+    unique_fd file_;
+    bool complete_ = false;
+    size_t records_ = 0;
+    size_t step_ = 0;   // bytes of the record that was given last
+    size_t start_ = 0;  // of what has not been stepped over
+    size_t end_ = 0;    // of what has been read
+    std::array<char, 32768> bytes_;
 };
 
-// The five text fields that the records of counters and static data have.
-using record_fields = std::array<const char*, 5>;
+// Replaces a list file, through a temporary file beside it.
+class list_writer {
+ public:
+    explicit list_writer(const char* path);  // which the caller keeps; it may be -1, see `finish`
 
-// Finds the fields of a record; those that begin at or behind the terminator are null. True when
-// all are there and the last one ends exactly at the terminator.
-[[nodiscard]] bool split_record(const char* record, const char* terminator,
-                                std::span<const char*> fields);
+    // One record: its fields in their order, and its end. Errors show at any of them or in
+    // `finish`.
+    void text(std::string_view field);
+    void number(int64_t field);
+    // False, with errno set, once a write has failed.
+    [[nodiscard]] bool end_record();
+
+    // Puts the file into place. On failure, logged and raised, the old one is untouched and the
+    // temporary one gone; `records_written` says whether the caller has been able to write them
+    // all.
+    [[nodiscard]] bool finish(bool records_written);
+
+    [[nodiscard]] bool is_open() const { return file_.ok(); }
+
+ private:
+    void put(std::string_view bytes);
+    void flush();
+
+    const char* path_;
+    std::array<char, 4096> temporary_;
+    unique_fd file_;
+    int error_ = 0;  // errno of the first failure
+    size_t used_ = 0;
+    std::array<char, 16384> bytes_;
+};
+
+// Appends what `parse` makes of the records of the file at `path`: a unique_entry, or null to skip
+// one. True when the whole file was read; false when it is missing, has 20000 records or more, or
+// could not be read on, which has been logged and raised.
+template <class entry>
+bool list_load(sorted_list<entry>& list, const char* path, auto parse) {
+    list_reader reader(path);
+    while (const std::optional<std::string_view> record = reader.next()) {
+        unique_entry<entry> parsed = parse(*record);
+        if (parsed && !list.append(std::move(parsed))) {
+            return log_and_raise("kivd-list", "Out of memory when adding element to list");
+        }
+    }
+    return reader.is_complete();
+}
+
+// Replaces the file at `path` with what `write(list_writer&, const entry&)` writes of each entry:
+// one record, or nothing to leave it out. `write` gives false, after logging, when end_record did.
+// On failure, logged and raised, the old file is untouched.
+template <class entry>
+[[nodiscard]] bool list_save(const sorted_list<entry>& list, const char* path, auto write) {
+    list_writer writer(path);
+    if (!writer.is_open()) return false;
+    return writer.finish(!list.any_of([&](const entry& each) { return !write(writer, each); }));
+}
 
 }  // namespace kivd

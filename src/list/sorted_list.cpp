@@ -1,6 +1,5 @@
 #include "list/sorted_list.h"
 
-#include <cstdlib>
 #include <cstring>
 
 #include "platform/android_log.h"
@@ -10,48 +9,43 @@ namespace {
 
 constexpr char tag[] = "kivd-list";
 
-void destroy_element(const sorted_list& list, void*& element) {
-    if (list.destroy != nullptr) list.destroy(element);
-    free(element);
-    element = nullptr;
+}  // namespace
+
+void any_list::swap(any_list& other) noexcept {
+    std::swap(keys_, other.keys_);
+    std::swap(count_, other.count_);
+    std::swap(capacity_, other.capacity_);
+    std::swap(grow_by_, other.grow_by_);
+    std::swap(order_, other.order_);
+    std::swap(index_, other.index_);
 }
 
-bool make_room(sorted_list& list) {
-    if (list.count < list.capacity) return true;
-    const size_t capacity = size_t{list.count} + list.grow_by;
-    void* const grown = realloc(list.elements, capacity * sizeof *list.elements);
+void any_list::use_index() {
+    index_.create();
+    for (probe_key* const key : keys()) index_.add(key);
+}
+
+bool any_list::make_room() {
+    if (count_ < capacity_) return true;
+    const size_t capacity = size_t{count_} + grow_by_;
+    void* const grown = realloc(keys_, capacity * sizeof *keys_);
     if (grown == nullptr) {
         __android_log_print(ANDROID_LOG_WARN, tag, "Failed to grow list to %zu elements", capacity);
         return false;
     }
-    list.elements = static_cast<void**>(grown);
-    list.capacity = static_cast<uint32_t>(capacity);
+    keys_ = static_cast<probe_key**>(grown);
+    capacity_ = static_cast<uint32_t>(capacity);
     return true;
 }
 
-}  // namespace
-
-sorted_list* list_create(uint32_t capacity, uint32_t grow_by,
-                         int (*compare)(const void*, const void*), void (*destroy)(void*)) {
-    auto* const list = static_cast<sorted_list*>(malloc(sizeof(sorted_list)));
-    if (list == nullptr) return nullptr;
-    auto** const elements = static_cast<void**>(malloc(capacity * sizeof(void*)));
-    *list = {elements, 0, elements != nullptr ? capacity : 0, grow_by, compare, destroy, {}};
-    return list;
-}
-
-void list_use_index(sorted_list& list) {
-    list.index = probe_index_create();
-    for (uint32_t i = 0; i < list.count; ++i) probe_index_add(list.index, list.elements[i]);
-}
-
-uint32_t list_search(const sorted_list& list, const void* key, bool& found) {
+// The position of the entry equal to `key`, or the one at which it would be inserted.
+uint32_t any_list::search(const probe_key& key, bool& found) const {
     uint32_t low = 0;
-    uint32_t high = list.count;
+    uint32_t high = count_;
     found = false;
     while (low < high) {
         const uint32_t middle = low + (high - low) / 2;
-        const int order = list.compare(key, list.elements[middle]);
+        const int order = order_(key, *keys_[middle]);
         if (order == 0) {
             found = true;
             return middle;
@@ -65,55 +59,46 @@ uint32_t list_search(const sorted_list& list, const void* key, bool& found) {
     return low;
 }
 
-void* list_find(const sorted_list& list, const void* key) {
-    if (list.index.slots != nullptr) {
-        return probe_index_find(list.index, *static_cast<const probe_key*>(key));
-    }
+probe_key* any_list::find_key(const probe_key& key) const {
+    if (index_.exists()) return index_.find(key);
     bool found = false;
-    const uint32_t position = list_search(list, key, found);
-    return found ? list.elements[position] : nullptr;
+    const uint32_t position = search(key, found);
+    return found ? keys_[position] : nullptr;
 }
 
-int list_add(sorted_list& list, void*& element) {
-    if (element == nullptr) {
-        __android_log_print(ANDROID_LOG_WARN, tag, "list_add: Element is NULL!");
-        return 0;
-    }
-    if (!make_room(list)) {
-        destroy_element(list, element);
-        return 0;
-    }
+bool any_list::add_key(probe_key* added) {
+    if (!make_room()) return false;
     bool found = false;
-    const uint32_t position = list_search(list, element, found);
+    const uint32_t position = search(*added, found);
     if (found) {
         __android_log_print(ANDROID_LOG_WARN, tag, "list_add: Duplicate found!");
-        return 0;
+        return false;
     }
-    void** const slot = list.elements + position;
-    memmove(slot + 1, slot, (list.count - position) * sizeof *slot);
-    *slot = element;
-    ++list.count;
-    probe_index_add(list.index, element);
-    return 1;
+    probe_key** const slot = keys_ + position;
+    memmove(slot + 1, slot, (count_ - position) * sizeof *slot);
+    *slot = added;
+    ++count_;
+    index_.add(added);
+    return true;
 }
 
-int list_append(sorted_list& list, void*& element) {
-    if (!make_room(list)) {
-        destroy_element(list, element);
-        return 0;
-    }
-    list.elements[list.count++] = element;
-    probe_index_add(list.index, element);
-    return 1;
+bool any_list::append_key(probe_key* added) {
+    if (!make_room()) return false;
+    keys_[count_++] = added;
+    index_.add(added);
+    return true;
 }
 
-void list_destroy(sorted_list*& list) {
-    if (list == nullptr) return;
-    for (uint32_t i = 0; i < list->count; ++i) destroy_element(*list, list->elements[i]);
-    probe_index_release(list->index);
-    free(list->elements);
-    free(list);
-    list = nullptr;
+void any_list::keep_first(uint32_t count) {
+    count_ = count;
+    if (index_.exists()) use_index();
+}
+
+void any_list::forget_keys() {
+    free(keys_);
+    keys_ = nullptr;
+    count_ = capacity_ = 0;
+    index_.release();
 }
 
 }  // namespace kivd

@@ -1,58 +1,126 @@
-// A growable array of pointers to heap elements, in ascending order by the owner's comparison.
-// Elements are never removed one by one: an owner that needs another set builds a new list.
+// A growable array of entries (list/entry.h), which it owns, in ascending order. Entries are never
+// removed one by one: an owner that needs another set builds a new list.
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
+#include <span>
 
+#include "format/probe_key.h"
+#include "list/entry.h"
 #include "list/probe_index.h"
 
 namespace kivd {
 
-struct sorted_list {
-    void** elements;  // each a block of malloc, owned by the list
-    uint32_t count;
-    uint32_t capacity;
-    uint32_t grow_by;  // slots added each time the array is full
+// Below 0 when `a` sorts before `b`, 0 when they are equal, above 0 when after.
+using probe_order = int (*)(const probe_key& a, const probe_key& b);
 
-    // Below 0 when `key` sorts before `element`, 0 when equal, above 0 when after.
-    int (*compare)(const void* key, const void* element);
-    // Releases what an element owns beside its own block; may be null.
-    void (*destroy)(void* element);
+// What lists of all types have in common.
+class any_list {
+ public:
+    [[nodiscard]] uint32_t size() const { return count_; }
 
-    probe_index index;  // none until list_use_index
+    // From now on entries are found through a hash index; for lists that compare_probes orders.
+    void use_index();
+
+ protected:
+    // `grow_by`: slots added each time the array is full.
+    constexpr any_list(uint32_t grow_by, probe_order order) : grow_by_(grow_by), order_(order) {}
+    any_list(any_list&& other) noexcept : grow_by_(0), order_(nullptr) { swap(other); }
+    ~any_list() { free(keys_); }
+    void swap(any_list& other) noexcept;
+
+    [[nodiscard]] probe_key* find_key(const probe_key& key) const;
+    [[nodiscard]] bool add_key(probe_key* added);     // false: a duplicate, or no room; logged
+    [[nodiscard]] bool append_key(probe_key* added);  // false: no room; logged
+    void keep_first(uint32_t count);
+    void forget_keys();
+
+    [[nodiscard]] std::span<probe_key*> keys() const { return {keys_, count_}; }
+
+ private:
+    [[nodiscard]] uint32_t search(const probe_key& key, bool& found) const;
+    [[nodiscard]] bool make_room();
+
+    probe_key** keys_ = nullptr;  // each the beginning of an entry
+    uint32_t count_ = 0;
+    uint32_t capacity_ = 0;
+    uint32_t grow_by_;
+    probe_order order_;
+    probe_index index_;  // none until use_index
 };
 
-// Null when there is no memory for the list. When there is none for the array, the list has a
-// capacity of 0 and grows on first use.
-[[nodiscard]] sorted_list* list_create(uint32_t capacity, uint32_t grow_by,
-                                       int (*compare)(const void*, const void*),
-                                       void (*destroy)(void*));
+template <class entry>
+class sorted_list : public any_list {
+ public:
+    constexpr explicit sorted_list(uint32_t grow_by, probe_order order = compare_probes)
+        : any_list(grow_by, order) {}
+    sorted_list(sorted_list&& other) noexcept = default;
+    sorted_list& operator=(sorted_list&& other) noexcept {
+        swap(other);
+        return *this;
+    }
+    ~sorted_list() { clear(); }
 
-// From now on list_find goes through a hash index; for lists that compare_probes orders.
-void list_use_index(sorted_list& list);
+    // The entry equal to `key`, or null.
+    [[nodiscard]] entry* find(const probe_key& key) const {
+        return static_cast<entry*>(find_key(key));
+    }
 
-// The position of the element equal to `key`, or the one at which it would be inserted.
-[[nodiscard]] uint32_t list_search(const sorted_list& list, const void* key, bool& found);
+    // Inserts an entry. Gives it, or null, with the entry gone, when there is one equal to it or
+    // the array cannot grow; either has been logged.
+    entry* add(unique_entry<entry> added) {
+        return add_key(added.get()) ? added.release() : nullptr;
+    }
 
-// The element equal to `key`, or null.
-[[nodiscard]] void* list_find(const sorted_list& list, const void* key);
+    // Puts an entry behind the last one without looking at the order, as when a list is loaded.
+    // False, with the entry gone, when the array cannot grow, which has been logged.
+    [[nodiscard]] bool append(unique_entry<entry> added) {
+        if (!append_key(added.get())) return false;
+        (void)added.release();
+        return true;
+    }
 
-// Inserts `element` and gives 1. Gives 0 when it is null or a duplicate, which stays the caller's,
-// or when the array cannot grow: the element is then destroyed and `element` null. Failures have
-// been logged.
-[[nodiscard]] int list_add(sorted_list& list, void*& element);
+    // Calls `function` with each entry in order.
+    void for_each(auto function) const {
+        for (probe_key* const key : keys()) function(static_cast<entry&>(*key));
+    }
+    // Whether `condition` holds for one of them.
+    [[nodiscard]] bool any_of(auto condition) const {
+        for (const probe_key* const key : keys()) {
+            if (condition(static_cast<const entry&>(*key))) return true;
+        }
+        return false;
+    }
 
-// Puts `element` behind the last one without looking at the order, as when a list is loaded.
-// Gives 0 as list_add does when the array cannot grow.
-[[nodiscard]] int list_append(sorted_list& list, void*& element);
+    // For lists that were not saved in order. `less` tells which of two entries comes first.
+    void sort(auto less) {
+        std::ranges::sort(keys(), [less](const probe_key* a, const probe_key* b) {
+            return less(static_cast<const entry&>(*a), static_cast<const entry&>(*b));
+        });
+    }
+    // Releases each entry for which `condition(entry, the next one or null)` holds.
+    void drop_if(auto condition) {
+        const std::span<probe_key*> all = keys();
+        uint32_t kept = 0;
+        for (size_t i = 0; i < all.size(); ++i) {
+            auto* const each = static_cast<entry*>(all[i]);
+            const auto* const next =
+                i + 1 < all.size() ? static_cast<const entry*>(all[i + 1]) : nullptr;
+            if (condition(*each, next)) {
+                unique_entry<entry>(each).reset();
+            } else {
+                all[kept++] = each;
+            }
+        }
+        keep_first(kept);
+    }
 
-// Calls `function` with each element in order, cast to `type*`.
-template <class type>
-void list_foreach(const sorted_list& list, auto function) {
-    for (uint32_t i = 0; i < list.count; ++i) function(*static_cast<type*>(list.elements[i]));
-}
-
-// Destroys every element and the list, and nulls the pointer; null is fine.
-void list_destroy(sorted_list*& list);
+    // Releases every entry, and the index.
+    void clear() {
+        for (probe_key* const key : keys()) unique_entry<entry>(static_cast<entry*>(key)).reset();
+        forget_keys();
+    }
+};
 
 }  // namespace kivd

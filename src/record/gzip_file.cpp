@@ -43,7 +43,7 @@ bool deflate_chunk(z_stream& stream, int flush, int output) {
         stream.next_out = chunk.data();
         stream.avail_out = chunk.size();
         if (deflate(&stream, flush) == Z_STREAM_ERROR) return false;
-        if (write_all(output, chunk.data(), chunk.size() - stream.avail_out) < 0) return false;
+        if (!write_all(output, chunk.data(), chunk.size() - stream.avail_out)) return false;
     } while (stream.avail_out == 0);
     return true;
 }
@@ -63,11 +63,10 @@ bool copy(int input, z_stream& stream, int output) {
 
 }  // namespace
 
-int gzip_file(const char* source, const char* destination, gzip_level level) {
+bool gzip_file(const char* source, const char* destination, gzip_level level) {
     const unique_fd input(open(source, O_RDONLY | O_CLOEXEC));
     if (!input.ok()) {
-        (void)log_and_raise(tag, "Failed to open input file: %s", strerror(errno));
-        return 0;
+        return log_and_raise(tag, "Failed to open input file: %s", strerror(errno));
     }
     const unique_fd output = create_file(destination);
     z_stream stream = {};
@@ -75,11 +74,10 @@ int gzip_file(const char* source, const char* destination, gzip_level level) {
     if (!output.ok() ||
         deflateInit2(&stream, settings.level, Z_DEFLATED, settings.window_bits + gzip_framing,
                      settings.memory_level, Z_DEFAULT_STRATEGY) != Z_OK) {
-        (void)log_and_raise(tag, "Failed to gzopen output file");
-        return 0;
+        return log_and_raise(tag, "Failed to gzopen output file");
     }
     const unique_deflate end(&stream);
-    return copy(input.get(), stream, output.get()) ? 1 : 0;
+    return copy(input.get(), stream, output.get());
 }
 
 }  // namespace kivd

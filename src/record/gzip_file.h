@@ -10,8 +10,9 @@ enum class gzip_level : uint8_t {
     best,
 };
 
-// Copies the file `source` into the gzip file `destination`. 1 when all of it arrived there, else
-// 0: a failure to open either has been logged and raised, and a part of the destination may remain.
-[[nodiscard]] int gzip_file(const char* source, const char* destination, gzip_level level);
+// Copies the file `source` into the gzip file `destination`. False when not all of it arrived
+// there: a failure to open either has been logged and raised, and a part of the destination may
+// remain.
+[[nodiscard]] bool gzip_file(const char* source, const char* destination, gzip_level level);
 
 }  // namespace kivd

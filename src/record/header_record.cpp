@@ -73,14 +73,14 @@ size_t find_group_id(const group_id_list& groups, std::string_view id) {
     return max_group_ids;
 }
 
-int add_group_id(group_id_list& groups, std::string_view id) {
-    if (find_group_id(groups, id) != max_group_ids) return 0;
+bool add_group_id(group_id_list& groups, std::string_view id) {
+    if (find_group_id(groups, id) != max_group_ids) return false;
     if (groups.count == max_group_ids) {
         std::shift_left(groups.ids.begin(), groups.ids.end(), 1);
         --groups.count;
     }
     groups.ids[groups.count++].set(id);
-    return 1;
+    return true;
 }
 
 void copy_known_values(header_record& destination, const header_record& source) {
@@ -108,13 +108,13 @@ void pack_report_header() {
 
     const size_t size = kiv__report__get_packed_size(&report);
     if (size == 0) {
-        (void)log_and_raise(tag, "Failed to get packed size of report header.");
+        log_and_raise(tag, "Failed to get packed size of report header.");
         return;
     }
     unique_malloc<uint8_t> bytes(static_cast<uint8_t*>(malloc(size)));
     if (!bytes) return;
     if (kiv__report__pack(&report, bytes.get()) != size) {
-        (void)log_and_raise(tag, "Failed to pack report header.");
+        log_and_raise(tag, "Failed to pack report header.");
         return;
     }
     report_header = {bytes.release(), size};
@@ -135,19 +135,19 @@ std::span<const uint8_t> get_empty_report_header() {
     report.header = &header;
     const size_t size = kiv__report__get_packed_size(&report);
     if (size == 0 || size > bytes.size()) {
-        (void)log_and_raise(tag, "Failed to get packed size of empty report header.");
+        log_and_raise(tag, "Failed to get packed size of empty report header.");
         return {};
     }
     if (kiv__report__pack(&report, bytes.data()) != size) {
-        (void)log_and_raise(tag, "Failed to pack empty report header.");
+        log_and_raise(tag, "Failed to pack empty report header.");
         return {};
     }
     packed_size = size;
     return {bytes.data(), packed_size};
 }
 
-int write_report_header(int fd) {
-    if (write_all(fd, report_header.bytes, report_header.size) >= 0) return 0;
+bool write_report_header(int fd) {
+    if (write_all(fd, report_header.bytes, report_header.size)) return true;
     return log_and_raise(tag, "Failed to write report header: %s", strerror(errno));
 }
 

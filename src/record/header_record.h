@@ -69,8 +69,8 @@ void init_header(header_record& header);
 // The position of `id`, or max_group_ids when it is not there.
 [[nodiscard]] size_t find_group_id(const group_id_list& groups, std::string_view id);
 
-// 1 when added, 0 when it was there. A seventh id drops the oldest.
-int add_group_id(group_id_list& groups, std::string_view id);
+// False when it was there already. A seventh id drops the oldest.
+bool add_group_id(group_id_list& groups, std::string_view id);
 
 // Copies what `source` knows; checksum and timezone always, group ids never.
 void copy_known_values(header_record& destination, const header_record& source);
@@ -86,8 +86,8 @@ void pack_report_header();
 // has been logged and raised.
 [[nodiscard]] std::span<const uint8_t> get_empty_report_header();
 
-// Writes the report header. -1 on failure, logged and raised.
-[[nodiscard]] int write_report_header(int fd);
+// Writes the report header. A failure has been logged and raised.
+[[nodiscard]] bool write_report_header(int fd);
 
 // Releases the report header and resets the header record.
 void release_header();

@@ -15,10 +15,10 @@ enum class record_header : bool { absent, expected };
 
 // Steps over the record at `offset`, the byte position at which `file` stands. `key` is the byte
 // that the record has to start with.
-//  0  `offset` is now behind the record
-// -1  no whole record with that key there; `offset` unchanged. A wrong key and a failing read or
-//     seek have been logged and raised; a torn record has not.
-[[nodiscard]] int read_record(FILE* file, size_t file_size, size_t& offset, uint8_t key);
+// True when `offset` is now behind it. False, with `offset` unchanged, when no whole record with
+// that key is there: a wrong key and a failing read or seek have been logged and raised, a torn
+// record has not.
+[[nodiscard]] bool read_record(FILE* file, size_t file_size, size_t& offset, uint8_t key);
 
 // Cuts the file at `path` back to its longest run of whole records, or removes it when its header
 // is spoilt. A missing file is fine. Failures are logged; the caller has nothing to do.

@@ -100,7 +100,7 @@ void ensure_device_id() {
     if (record.device_id.is_known()) return;
     const unique_file file(fopen(paths::random_uuid, "re"));
     if (!file) {
-        (void)log_and_raise(tag, "Failed to open uuid file: %s", strerror(errno));
+        log_and_raise(tag, "Failed to open uuid file: %s", strerror(errno));
         return;
     }
     char line[40];
@@ -117,7 +117,7 @@ void get_device_id(device_id_buffer& buffer) {
 }
 
 void set_group_id(const char* id) {
-    if (add_group_id(get_header_record().groups, id) != 0) announce_group_ids();
+    if (add_group_id(get_header_record().groups, id)) announce_group_ids();
 }
 
 void delete_group_id(const char* id) {

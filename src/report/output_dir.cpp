@@ -17,7 +17,6 @@
 #include "diag/diag_store.h"
 #include "platform/android_log.h"
 #include "runtime/log_and_raise.h"
-#include "runtime/stop.h"
 #include "util/directory.h"
 #include "util/paths.h"
 #include "util/text_scan.h"
@@ -97,7 +96,7 @@ bool scan_output_dir(directory_state& state) {
                             paths::output_dir, name);
     });
     if (!complete) {
-        (void)log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
+        log_and_raise(tag, "prune_dir(): get_statdir() failed: %s", strerror(errno));
     }
     return complete;
 }
@@ -105,8 +104,7 @@ bool scan_output_dir(directory_state& state) {
 bool is_free_space_enough() {
     struct statfs status = {};
     if (statfs(paths::output_dir, &status) != 0) {
-        (void)log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
-        return false;
+        return log_and_raise(tag, "is_free_space_enough(): statfs() failed: %s", strerror(errno));
     }
     const uint64_t needed = compaction_space(get_limits().max_report_size) + diag_space_reserve();
     const uint64_t available = static_cast<uint64_t>(status.f_bsize) * status.f_bavail;
@@ -152,15 +150,16 @@ report_path::report_path(int64_t number) {
              static_cast<long long>(number));
 }
 
-int32_t prune_dir() {
+std::optional<int32_t> prune_dir() {
     for (;;) {
         directory_state state;
-        if (!scan_output_dir(state)) return -1;
+        if (!scan_output_dir(state)) return std::nullopt;
         if (is_room_enough(state)) return state.highest;
         if (state.oldest_count == 0) {
-            return log_and_raise(tag, "Failed to prune files from output directory");
+            log_and_raise(tag, "Failed to prune files from output directory");
+            return std::nullopt;
         }
-        if (!delete_oldest(state)) return -1;
+        if (!delete_oldest(state)) return std::nullopt;
     }
 }
 
@@ -178,13 +177,6 @@ void delete_reports(int32_t number) {
     if (unlink(path.text) == 0) return log_deleted(remove_tag, path.text);
     __android_log_print(ANDROID_LOG_WARN, remove_tag, "Failed to delete %s : %s", path.text,
                         strerror(errno));
-}
-
-void check_disabled() {
-    if (access(paths::disable_marker, F_OK) != 0) return;
-    __android_log_print(ANDROID_LOG_ERROR, remove_tag, "KIV will disable itself.");
-    constexpr int day_ms = 86400 * 1000;
-    while (!is_stop_requested()) wait_for_stop(day_ms);
 }
 
 }  // namespace kivd

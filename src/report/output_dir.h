@@ -4,6 +4,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 
 namespace kivd {
 
@@ -23,8 +24,9 @@ inline constexpr uint64_t free_inodes_min = 8;
 }
 
 // Deletes the oldest reports until another one fits. Gives the highest report number left, 0 when
-// there is none, or -1 when room cannot be made; what stood in the way has mostly been logged.
-[[nodiscard]] int32_t prune_dir();
+// there is none; nothing when room cannot be made, and mostly a log line about what stood in the
+// way.
+[[nodiscard]] std::optional<int32_t> prune_dir();
 
 // The path of the report with that number, NUL-terminated.
 struct report_path {
@@ -37,8 +39,5 @@ struct report_path {
 
 // Deletes the report with that number, or with 0 every file but the configuration request.
 void delete_reports(int32_t number);
-
-// When the disable marker exists: says so and waits until a stop is requested.
-void check_disabled();
 
 }  // namespace kivd

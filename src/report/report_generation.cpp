@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <optional>
 
 #include "platform/android_log.h"
 #include "record/gzip_file.h"
@@ -33,8 +34,8 @@ constinit pid_t compactor_pid = -1;
 constinit gzip_level compression = gzip_level::best;
 
 // Moves what has been collected into the file that the compactor takes.
-int flush_stores() {
-    if (events_flush() != 0) return log_and_raise(tag, "Failed to flush events");
+bool flush_stores() {
+    if (!events_flush()) return log_and_raise(tag, "Failed to flush events");
 
     const unique_fd fd(open(paths::flushed_data, O_WRONLY | O_APPEND | O_CLOEXEC));
     const off_t size = fd.ok() ? lseek(fd.get(), 0, SEEK_END) : -1;
@@ -46,33 +47,33 @@ int flush_stores() {
     counters_write_report(report, get_last_flush());
     static_data_write_report(report, get_last_flush());
     set_last_flush(flush_time);
-    return 0;
+    return true;
 }
 
 void start_compactor() {
     const pid_t pid = fork_child(child_kind::worker);
     if (pid < 0) {
-        (void)log_and_raise(tag, "Failed to fork compactor thread.");
+        log_and_raise(tag, "Failed to fork compactor thread.");
         return;
     }
     if (pid > 0) {
         compactor_pid = pid;
         return;
     }
-    if (compact_report() != 0) _exit(1);
+    if (!compact_report()) _exit(1);
     __android_log_print(ANDROID_LOG_INFO, tag, "Compactor all done.");
     _exit(0);
 }
 
 }  // namespace
 
-int generate_report() {
-    if (!has_data_to_report()) return -1;
+bool generate_report() {
+    if (!has_data_to_report()) return false;
     __android_log_print(ANDROID_LOG_INFO, tag, "Generating Report...");
     wait_for_compactor();
-    if (flush_stores() != 0) return -1;
+    if (!flush_stores()) return false;
     start_compactor();
-    return 0;
+    return true;
 }
 
 bool has_data_to_report() {
@@ -80,19 +81,19 @@ bool has_data_to_report() {
            static_data_pending(get_last_flush()) || events_pending();
 }
 
-int compact_report() {
-    const int32_t highest = prune_dir();
-    if (highest < 0) return log_and_raise(tag, "Corrupt output directory - will not do anything.");
-    if (gzip_file(paths::flushed_data, paths::compacted_data, compression) == 0) {
+bool compact_report() {
+    const std::optional<int32_t> highest = prune_dir();
+    if (!highest) return log_and_raise(tag, "Corrupt output directory - will not do anything.");
+    if (!gzip_file(paths::flushed_data, paths::compacted_data, compression)) {
         return log_and_raise(tag, "Failed to compact file");
     }
-    if (report_key_available() && seal_compacted_data() != 0) return -1;
-    const report_path report(next_report_number(highest));
+    if (report_key_available() && !seal_compacted_data()) return false;
+    const report_path report(next_report_number(*highest));
     if (rename(paths::compacted_data, report.text) != 0) {
         return log_and_raise(tag, "Failed to rename output file: %s", strerror(errno));
     }
     (void)unlink(paths::flushed_data);
-    return 0;
+    return true;
 }
 
 void wait_for_compactor() { wait_for_child(compactor_pid); }

@@ -6,16 +6,17 @@
 
 namespace kivd {
 
-// 0 when a compactor was started or its fork failed; -1 when there was nothing to report or the
-// flush failed, which has been logged and raised. Waits for an earlier compactor first.
-int generate_report();
+// Waits for an earlier compactor, flushes and starts one. False when there was nothing to report or
+// the flush failed, which has been logged and raised; a fork that failed has been, too, and leaves
+// the flushed data to be replaced by the next.
+bool generate_report();
 
 // Whether anything has been collected since the last flush.
 [[nodiscard]] bool has_data_to_report();
 
-// The body of the compactor: turns the flushed data into a report. 0, or -1 with the failure logged
-// and raised and the files left as they are.
-[[nodiscard]] int compact_report();
+// The body of the compactor: turns the flushed data into a report. On failure, logged and raised,
+// the files are left as they are.
+[[nodiscard]] bool compact_report();
 
 // Waits until no compactor runs.
 void wait_for_compactor();

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <optional>
 #include <span>
 
 #include "format/record_format.h"
@@ -25,18 +26,18 @@ constexpr char tag[] = "kivd-compactor";
 constexpr size_t crypto_fields_size = max_report_key_bits / 8 + 64;
 
 // All that stands before the ciphertext.
-int write_envelope(int output, const seal& opened, uint32_t plain_size) {
+bool write_envelope(int output, const sealing& started, uint32_t plain_size) {
     const std::span<const uint8_t> header = get_empty_report_header();
     if (header.empty()) return log_and_raise(tag, "Failed to get empty report header.");
     std::array<uint8_t, crypto_fields_size> fields;
-    const size_t size = pack_crypto_fields(fields, opened.encrypted_key.data(), opened.key_bits,
-                                           opened.iv, sealed_size(plain_size));
+    const size_t size = pack_crypto_fields(fields, started.encrypted_key.data(), started.key_bits,
+                                           started.iv, sealed_size(plain_size));
     iovec pieces[] = {{const_cast<uint8_t*>(header.data()), header.size()}, {fields.data(), size}};
-    if (write_all(output, pieces) >= 0) return 0;
+    if (write_all(output, pieces)) return true;
     return log_and_raise(tag, "Failed to write crypto data, %s", strerror(errno));
 }
 
-int write_sealed_data(seal& opened) {
+bool write_sealed_data(sealing& started) {
     const unique_fd input(open(paths::compacted_data, O_RDONLY | O_CLOEXEC));
     struct stat status = {};
     if (!input.ok() || fstat(input.get(), &status) != 0) {
@@ -47,22 +48,20 @@ int write_sealed_data(seal& opened) {
         return log_and_raise(tag, "Failed to open output encryption file: %s", strerror(errno));
     }
     const auto plain_size = static_cast<uint32_t>(status.st_size);
-    if (write_envelope(output.get(), opened, plain_size) != 0) return -1;
-    return encrypt_file(input.get(), output.get(), opened) == 1 ? 0 : -1;
+    return write_envelope(output.get(), started, plain_size) &&
+           encrypt_file(input.get(), output.get(), started);
 }
 
 }  // namespace
 
-int seal_compacted_data() {
-    seal opened = {};
-    if (open_report_seal(opened) == 0) {
-        return log_and_raise(tag, "Failed to initialize encryption.");
-    }
-    if (write_sealed_data(opened) != 0) return -1;
-    if (rename(paths::encrypted_data, paths::compacted_data) == 0) return 0;
-    (void)log_and_raise(tag, "Failed to rename encrypted file: %s", strerror(errno));
+bool seal_compacted_data() {
+    std::optional<sealing> started = start_sealing();
+    if (!started) return log_and_raise(tag, "Failed to initialize encryption.");
+    if (!write_sealed_data(*started)) return false;
+    if (rename(paths::encrypted_data, paths::compacted_data) == 0) return true;
+    log_and_raise(tag, "Failed to rename encrypted file: %s", strerror(errno));
     (void)unlink(paths::encrypted_data);
-    return -1;
+    return false;
 }
 
 }  // namespace kivd

@@ -4,7 +4,7 @@
 
 namespace kivd {
 
-// Replaces the compacted data by its sealed form. 0, or -1 with the failure logged and raised.
-[[nodiscard]] int seal_compacted_data();
+// Replaces the compacted data by its sealed form. A failure has been logged and raised.
+[[nodiscard]] bool seal_compacted_data();
 
 }  // namespace kivd

@@ -167,8 +167,8 @@ void state_load() {
     const unique_file file = open_to_read(paths::state);
     if (!file) {
         if (errno == ENOENT) return;
-        (void)log_and_raise(tag, "Failed to open configuration file %s: %s", paths::state,
-                            strerror(errno));
+        log_and_raise(tag, "Failed to open configuration file %s: %s", paths::state,
+                      strerror(errno));
         return;
     }
     char line[line_size];
@@ -178,13 +178,13 @@ void state_load() {
 void state_save() {
     unique_file file(fopen(paths::state_new, "we"));
     if (!file) {
-        (void)log_and_raise(tag, "Failed to create new configuration file: %s", strerror(errno));
+        log_and_raise(tag, "Failed to create new configuration file: %s", strerror(errno));
         return;
     }
     write_lines(file.get());
     file.reset();  // a line that got lost only leaves its value at the default
     if (rename(paths::state_new, paths::state) != 0) {
-        (void)log_and_raise(tag, "Failed to rename configuration file: %s", strerror(errno));
+        log_and_raise(tag, "Failed to rename configuration file: %s", strerror(errno));
     }
 }
 

@@ -9,7 +9,7 @@
 
 namespace kivd {
 
-int log_and_raise(const char* tag, const char* format, ...) {
+bool log_and_raise(const char* tag, const char* format, ...) {
     const int saved_errno = errno;
     char text[error_text_size];
     va_list arguments;
@@ -19,7 +19,7 @@ int log_and_raise(const char* tag, const char* format, ...) {
     __android_log_print(ANDROID_LOG_ERROR, tag, "%s", text);
     raise_daemon_error("%s: %s", tag, text);
     errno = saved_errno;
-    return -1;
+    return false;
 }
 
 }  // namespace kivd

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <optional>
 #include <span>
 
 #include "runtime/log_and_raise.h"
@@ -25,8 +26,8 @@ unique_fd create_beside(const char* path, const char* suffix) {
 
 void write_beside(const char* path, const char* suffix, std::span<const uint8_t> bytes) {
     const unique_fd file = create_beside(path, suffix);
-    if (!file.ok() || write_all(file.get(), bytes.data(), bytes.size()) >= 0) return;
-    (void)log_and_raise(tag, "debug_encrypt(), fwrite() failed, %s ", strerror(errno));
+    if (!file.ok() || write_all(file.get(), bytes.data(), bytes.size())) return;
+    log_and_raise(tag, "debug_encrypt(), fwrite() failed, %s ", strerror(errno));
 }
 
 }  // namespace
@@ -37,12 +38,12 @@ void debug_encrypt(const char* path) {
         perror("File not found.");
         return;
     }
-    seal opened = {};
-    if (open_report_seal(opened) == 0) return;
-    write_beside(path, ".key", opened.key());
-    write_beside(path, ".iv", opened.iv);
+    std::optional<sealing> started = start_sealing();
+    if (!started) return;
+    write_beside(path, ".key", started->key());
+    write_beside(path, ".iv", started->iv);
     const unique_fd output = create_beside(path, ".enc");
-    if (output.ok()) (void)encrypt_file(input.get(), output.get(), opened);
+    if (output.ok()) (void)encrypt_file(input.get(), output.get(), *started);
 }
 
 }  // namespace kivd

@@ -5,7 +5,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <utility>
 
 #include "runtime/log_and_raise.h"
 #include "security/key_paths.h"
@@ -26,20 +25,19 @@ bool is_report_key(const EVP_PKEY* key) {
 }
 
 bool write_sealed(int output, const uint8_t* bytes, int size) {
-    if (write_all(output, bytes, static_cast<size_t>(size)) >= 0) return true;
-    (void)log_and_raise(tag, "encrypt_file(): fwrite() failed, %s", strerror(errno));
-    return false;
+    if (write_all(output, bytes, static_cast<size_t>(size))) return true;
+    return log_and_raise(tag, "encrypt_file(): fwrite() failed, %s", strerror(errno));
 }
 
 }  // namespace
 
-int open_report_seal(seal& opened) {
+std::optional<sealing> start_sealing() {
     const unique_pkey key = load_report_key();
     if (!is_report_key(key.get())) {
-        (void)log_and_raise(tag, "Failed to open report key");
-        return 0;
+        log_and_raise(tag, "Failed to open report key");
+        return std::nullopt;
     }
-    seal fresh = {};
+    sealing fresh = {};
     fresh.key_bits = static_cast<uint32_t>(EVP_PKEY_get_bits(key.get()));
     fresh.cipher.reset(EVP_CIPHER_CTX_new());
     uint8_t* keys[] = {fresh.encrypted_key.data()};
@@ -48,13 +46,12 @@ int open_report_seal(seal& opened) {
     if (!fresh.cipher || EVP_SealInit(fresh.cipher.get(), EVP_aes_128_cbc(), keys, &key_size,
                                       fresh.iv.data(), recipients, 1) != 1) {
         ERR_clear_error();
-        return 0;
+        return std::nullopt;
     }
-    opened = std::move(fresh);
-    return 1;
+    return fresh;
 }
 
-int encrypt_file(int input, int output, seal& opened) {
+bool encrypt_file(int input, int output, sealing& started) {
     std::array<uint8_t, chunk_size> plain;
     std::array<uint8_t, chunk_size + EVP_MAX_BLOCK_LENGTH> sealed;
     int size = 0;
@@ -62,22 +59,19 @@ int encrypt_file(int input, int output, seal& opened) {
         const ssize_t n = read(input, plain.data(), plain.size());
         if (n < 0 && errno == EINTR) continue;
         if (n < 0) {
-            (void)log_and_raise(tag, "encrypt_file(): read() failed, %s", strerror(errno));
-            return 0;
+            return log_and_raise(tag, "encrypt_file(): read() failed, %s", strerror(errno));
         }
         if (n == 0) break;
-        if (EVP_EncryptUpdate(opened.cipher.get(), sealed.data(), &size, plain.data(),
+        if (EVP_EncryptUpdate(started.cipher.get(), sealed.data(), &size, plain.data(),
                               static_cast<int>(n)) != 1) {
-            (void)log_and_raise(tag, "EVP_SealUpdate failed");
-            return 0;
+            return log_and_raise(tag, "EVP_SealUpdate failed");
         }
-        if (!write_sealed(output, sealed.data(), size)) return 0;
+        if (!write_sealed(output, sealed.data(), size)) return false;
     }
-    if (EVP_SealFinal(opened.cipher.get(), sealed.data(), &size) != 1) {
-        (void)log_and_raise(tag, "EVP_SealFinal failed");
-        return 0;
+    if (EVP_SealFinal(started.cipher.get(), sealed.data(), &size) != 1) {
+        return log_and_raise(tag, "EVP_SealFinal failed");
     }
-    return write_sealed(output, sealed.data(), size) ? 1 : 0;
+    return write_sealed(output, sealed.data(), size);
 }
 
 }  // namespace kivd

@@ -7,6 +7,7 @@
 #include <array>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 
 #include "util/unique_fd.h"
@@ -17,7 +18,8 @@ using unique_cipher = std::unique_ptr<EVP_CIPHER_CTX, releaser<EVP_CIPHER_CTX_fr
 
 inline constexpr uint32_t max_report_key_bits = 4096;
 
-struct seal {
+// One encryption that has been started.
+struct sealing {
     unique_cipher cipher;
     std::array<uint8_t, max_report_key_bits / 8> encrypted_key;  // as long as the key's modulus
     uint32_t key_bits;
@@ -28,15 +30,15 @@ struct seal {
     }
 };
 
-// Starts one encryption with the report key. Gives 1, or 0 with `opened` as it was: no RSA key of
-// up to 4096 bits could be had, which has been logged and raised, or the library failed.
-[[nodiscard]] int open_report_seal(seal& opened);
+// Starts one encryption with the report key. Nothing when no RSA key of up to 4096 bits could be
+// had, which has been logged and raised, or when the library failed.
+[[nodiscard]] std::optional<sealing> start_sealing();
 
 // The size of the ciphertext of `size` bytes: padding adds 1 to 16.
 [[nodiscard]] constexpr uint32_t sealed_size(uint32_t size) { return (size & ~15U) + 16; }
 
-// Encrypts all that `input` still has into `output` and finishes the seal. 1 when sealed_size bytes
-// have been written, else 0; a failure has been logged and raised.
-[[nodiscard]] int encrypt_file(int input, int output, seal& opened);
+// Encrypts all that `input` still has into `output` and finishes the sealing. True when sealed_size
+// bytes have been written; a failure has been logged and raised.
+[[nodiscard]] bool encrypt_file(int input, int output, sealing& started);
 
 }  // namespace kivd

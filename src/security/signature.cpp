@@ -32,12 +32,10 @@ bool digest_file(EVP_MD_CTX* digest, FILE* data) {
 bool verify_signature(FILE* data, FILE* signature, EVP_PKEY* key) {
     const unique_digest digest(EVP_MD_CTX_new());
     if (!digest) {
-        (void)log_and_raise(tag, "Failed to create EVP context");
-        return false;
+        return log_and_raise(tag, "Failed to create EVP context");
     }
     if (EVP_DigestInit_ex(digest.get(), EVP_sha1(), nullptr) != 1) {
-        (void)log_and_raise(tag, "Failed to initialize EVP");
-        return false;
+        return log_and_raise(tag, "Failed to initialize EVP");
     }
     if (!digest_file(digest.get(), data)) return false;
     std::array<uint8_t, max_signature_size> bytes;
@@ -50,18 +48,15 @@ bool verify_signature(FILE* data, FILE* signature, EVP_PKEY* key) {
 bool verify_file(const char* data_path, const char* signature_path) {
     const unique_file data = open_to_read(data_path);
     if (!data) {
-        (void)log_and_raise(tag, "Failed to verify file - file can't be opened.");
-        return false;
+        return log_and_raise(tag, "Failed to verify file - file can't be opened.");
     }
     const unique_file signature = open_to_read(signature_path);
     if (!signature) {
-        (void)log_and_raise(tag, "Failed to open signature file.");
-        return false;
+        return log_and_raise(tag, "Failed to open signature file.");
     }
     const unique_pkey key = load_config_key();
     if (!key) {
-        (void)log_and_raise(tag, "Failed to load public key.");
-        return false;
+        return log_and_raise(tag, "Failed to load public key.");
     }
     const bool holds = verify_signature(data.get(), signature.get(), key.get());
     ERR_clear_error();

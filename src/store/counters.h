@@ -11,7 +11,7 @@ namespace kivd {
 
 enum class counter_mode : uint8_t { set, increment };
 
-// Loads private/counters.txt; a missing file is fine. Ends the process when out of memory.
+// Loads private/counters.txt; a missing file is fine.
 void counters_init();
 
 // Sets the counter to `value` or adds it (the sum wraps); an unknown counter is created with it.

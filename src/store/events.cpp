@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <optional>
 
 #include "config/filters.h"
 #include "config/limits.h"
@@ -32,7 +33,7 @@ void measure_size() {
 
 // A report that began without its header could not be read, so such a file is not kept.
 void start_file() {
-    if (write_report_header(events_fd) == 0) {
+    if (write_report_header(events_fd)) {
         measure_size();
         return;
     }
@@ -48,7 +49,7 @@ void events_open() {
     if (events_fd >= 0) return;
     events_fd = open(paths::events, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0700);
     if (events_fd < 0) {
-        (void)log_and_raise(tag, "Failed to open partial event file: %s", strerror(errno));
+        log_and_raise(tag, "Failed to open partial event file: %s", strerror(errno));
         return;
     }
     measure_size();
@@ -59,17 +60,19 @@ event_file events_add(const char* package, const char* name, std::span<const cha
     if (!filter_match(filter_kind::events, package, name)) return event_file::open;
     events_open();
     if (events_fd < 0) return event_file::open;
-    const ssize_t written = write_event_record(events_fd, package, name, payload, tag);
-    if (written < 0) measure_size();
-    if (written > 0) events_size += static_cast<uint64_t>(written);
+    if (const std::optional size = write_event_record(events_fd, package, name, payload, tag)) {
+        events_size += *size;
+    } else {
+        measure_size();
+    }
     return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
 }
 
-int events_flush() {
+bool events_flush() {
     events_open();
     if (events_fd >= 0) (void)close(events_fd);
     events_fd = -1;
-    return rename(paths::events, paths::flushed_data);
+    return rename(paths::events, paths::flushed_data) == 0;
 }
 
 bool events_pending() { return access(paths::events, F_OK) == 0; }

@@ -22,9 +22,9 @@ enum class event_file : bool {
 // raised.
 void events_open();
 
-// Moves the event file, which is made if there is none, to private/flushed_data. 0, or -1 with
-// errno set.
-[[nodiscard]] int events_flush();
+// Moves the event file, which is made if there is none, to private/flushed_data. False, with errno
+// set, when that fails.
+[[nodiscard]] bool events_flush();
 
 // Whether there is an event file.
 [[nodiscard]] bool events_pending();

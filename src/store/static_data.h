@@ -8,7 +8,7 @@
 
 namespace kivd {
 
-// Loads private/sdata.txt; a missing file is fine. Ends the process when out of memory.
+// Loads private/sdata.txt; a missing file is fine.
 void static_data_init();
 
 // Stores a copy of `value`, of any length.

@@ -8,21 +8,19 @@
 
 namespace kivd {
 
-ssize_t write_all(int fd, const void* bytes, size_t size) {
+bool write_all(int fd, const void* bytes, size_t size) {
     iovec piece = {const_cast<void*>(bytes), size};
     return write_all(fd, {&piece, 1});
 }
 
-ssize_t write_all(int fd, std::span<iovec> pieces) {
-    size_t total = 0;
-    for (const iovec& piece : pieces) total += piece.iov_len;
-
-    size_t left = total;
+bool write_all(int fd, std::span<iovec> pieces) {
+    size_t left = 0;
+    for (const iovec& piece : pieces) left += piece.iov_len;
     while (left > 0) {
         const ssize_t n = writev(fd, pieces.data(), static_cast<int>(pieces.size()));
         if (n < 0 && errno == EINTR) continue;
         if (n == 0) errno = ENOSPC;
-        if (n <= 0) return -1;
+        if (n <= 0) return false;
         left -= static_cast<size_t>(n);
         auto written = static_cast<size_t>(n);
         while (!pieces.empty() && written >= pieces.front().iov_len) {
@@ -34,14 +32,14 @@ ssize_t write_all(int fd, std::span<iovec> pieces) {
             pieces.front().iov_len -= written;
         }
     }
-    return static_cast<ssize_t>(total);
+    return true;
 }
 
-int64_t get_file_size(FILE* file) {
-    if (fseeko(file, 0, SEEK_END) != 0) return -1;
+std::optional<uint64_t> get_file_size(FILE* file) {
+    if (fseeko(file, 0, SEEK_END) != 0) return std::nullopt;
     const off_t size = ftello(file);
-    if (size < 0 || fseeko(file, 0, SEEK_SET) != 0) return -1;
-    return size;
+    if (size < 0 || fseeko(file, 0, SEEK_SET) != 0) return std::nullopt;
+    return static_cast<uint64_t>(size);
 }
 
 std::optional<file_bytes> read_whole_fd(unique_fd fd) {
@@ -75,15 +73,19 @@ unique_fd open_regular(const char* path) {
     return fd;
 }
 
-unique_file open_to_read(const char* path) {
+unique_fd open_readable(const char* path) {
     unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
-    if (!fd.ok()) return nullptr;
     struct stat status = {};
-    if (fstat(fd.get(), &status) == 0 && S_ISDIR(status.st_mode)) {
+    if (fd.ok() && fstat(fd.get(), &status) == 0 && S_ISDIR(status.st_mode)) {
+        fd.reset();
         errno = EISDIR;
-        return nullptr;
     }
-    unique_file file(fdopen(fd.get(), "r"));
+    return fd;
+}
+
+unique_file open_to_read(const char* path) {
+    unique_fd fd = open_readable(path);
+    unique_file file(fd.ok() ? fdopen(fd.get(), "r") : nullptr);
     if (file) (void)fd.release();
     return file;
 }

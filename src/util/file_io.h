@@ -13,15 +13,16 @@
 
 namespace kivd {
 
-// Writes all `size` bytes, through short writes and EINTR. Gives `size`, or -1 with errno set; a
-// write that takes nothing counts as a full device (ENOSPC).
-[[nodiscard]] ssize_t write_all(int fd, const void* bytes, size_t size);
+// Writes all `size` bytes, through short writes and EINTR. False, with errno set, when that fails:
+// some of them may then have been written. A write that takes nothing counts as a full device
+// (ENOSPC).
+[[nodiscard]] bool write_all(int fd, const void* bytes, size_t size);
 
 // The same for several pieces in one call each round; `pieces` is used up on the way.
-[[nodiscard]] ssize_t write_all(int fd, std::span<iovec> pieces);
+[[nodiscard]] bool write_all(int fd, std::span<iovec> pieces);
 
-// Size in bytes of an open file, -1 when it cannot be had. The stream is then at its start.
-[[nodiscard]] int64_t get_file_size(FILE* file);
+// Size in bytes of an open file, if it can be had. The stream is then at its start.
+[[nodiscard]] std::optional<uint64_t> get_file_size(FILE* file);
 
 // What a file held, in a block of malloc of at least one byte.
 struct file_bytes {
@@ -42,8 +43,9 @@ struct file_bytes {
 // opened.
 [[nodiscard]] unique_fd open_regular(const char* path);
 
-// Opens a file to read; null with errno set. Unlike plain fopen it refuses a directory (EISDIR) and
-// doesn't wait for the writer of a pipe.
+// Opens a file to read; not ok, or null, with errno set. Unlike a plain open it refuses a directory
+// (EISDIR) and doesn't wait for the writer of a pipe.
+[[nodiscard]] unique_fd open_readable(const char* path);
 [[nodiscard]] unique_file open_to_read(const char* path);
 
 }  // namespace kivd

@@ -255,12 +255,12 @@ TEST_F(intake, what_cannot_be_stored_is_said_and_the_rest_goes_on) {
     EXPECT_EQ(get_limits().max_report_size, default_max_report_size);
 
     fs::remove("input");
-    write_configuration({});
+    replace_config_file({});
     EXPECT_EQ(take_log(), lines({"E kivd-conf: Failed to create configuration file: "
                                  "No such file or directory"}));
     fs::create_directory("input");
     fs::create_symlink("/dev/full", "input/config");
-    write_configuration("x"s);
+    replace_config_file("x"s);
     EXPECT_EQ(take_log(), lines({"E kivd-conf: Failed to write configuration file: "
                                  "No space left on device"}));
 }

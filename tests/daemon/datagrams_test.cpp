@@ -18,7 +18,7 @@ class datagrams : public scratch_directory {
  protected:
     datagrams() {
         set_data_collection(true);
-        EXPECT_EQ(packet_buffers_init(), 0);
+        EXPECT_TRUE(packet_buffers_init());
         EXPECT_EQ(socketpair(AF_UNIX, SOCK_DGRAM, 0, ends), 0);
         handler.fd = ends[0];
     }

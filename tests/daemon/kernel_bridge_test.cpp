@@ -23,10 +23,10 @@ namespace {
 class kernel_bridge : public scratch_directory {
  protected:
     kernel_bridge() {
-        EXPECT_EQ(open_daemon_socket(daemon_), 0);
+        EXPECT_TRUE(open_daemon_socket(daemon_));
         EXPECT_STREQ(daemon_.address.sun_path, "/mnt/kiv/kiv_cl");
         strcpy(daemon_.address.sun_path, "kiv_cl");
-        EXPECT_EQ(open_netlink_socket(netlink_), 0);
+        EXPECT_TRUE(open_netlink_socket(netlink_));
         kernel_.reset(socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_USERSOCK));
     }
     bool send(const std::string& text) const {
@@ -41,7 +41,7 @@ class kernel_bridge : public scratch_directory {
         while (!next_packet().empty()) {
         }
         EXPECT_TRUE(send(std::string(16, '\xff') + text));
-        EXPECT_EQ(receive_kernel_message(netlink_.get(), daemon_), 0);
+        receive_kernel_message(netlink_.get(), daemon_);
     }
 
     daemon_socket daemon_;
@@ -109,7 +109,7 @@ TEST_F(kernel_bridge, drops_what_it_does_not_know) {
     }
     for (const size_t size : {1, 15}) {  // less than the header
         EXPECT_TRUE(send(std::string(size, 'x')));
-        EXPECT_EQ(receive_kernel_message(netlink_.get(), daemon_), 0);
+        receive_kernel_message(netlink_.get(), daemon_);
     }
     fs::remove("kiv_cl");
     receive("CI pkg cnt 1");
@@ -118,18 +118,18 @@ TEST_F(kernel_bridge, drops_what_it_does_not_know) {
 
 TEST_F(kernel_bridge, its_set_up_says_what_fails_but_for_a_silent_kernel) {
     unique_fd second;
-    EXPECT_EQ(open_netlink_socket(second), EADDRINUSE);  // the port is taken
+    EXPECT_FALSE(open_netlink_socket(second));  // the port is taken
     EXPECT_FALSE(second.ok());
     EXPECT_EQ(take_log(), lines({"E kivkb: Failed to assign netlink socket name [98/Address "
                                  "already in use]."}));
-    EXPECT_EQ(send_pid_to_kernel(netlink_.get()), ECONNREFUSED);
+    EXPECT_FALSE(send_pid_to_kernel(netlink_.get()));
     EXPECT_EQ(take_log(), lines());
 }
 
 TEST_F(kernel_bridge, its_wait_for_a_message_ends_with_the_stop) {
     EXPECT_TRUE(stop_init());
     std::thread bridge([this] {
-        while (!is_stop_requested()) (void)receive_kernel_message(netlink_.get(), daemon_);
+        while (!is_stop_requested()) receive_kernel_message(netlink_.get(), daemon_);
     });
     EXPECT_TRUE(send(std::string(16, ' ') + "CI kernel count 1"));
     EXPECT_TRUE(wait_until([this] { return !next_packet().empty(); }));
@@ -141,7 +141,7 @@ TEST_F(kernel_bridge, its_wait_for_a_message_ends_with_the_stop) {
 TEST_F(kernel_bridge, holds_up_neither_forks_nor_the_stop) {
     EXPECT_TRUE(stop_init());
     std::thread bridge([this] {
-        while (!is_stop_requested()) (void)receive_kernel_message(netlink_.get(), daemon_);
+        while (!is_stop_requested()) receive_kernel_message(netlink_.get(), daemon_);
     });
     std::atomic<bool> done = false;
     std::thread sender([this, &done] {

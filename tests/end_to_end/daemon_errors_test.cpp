@@ -65,7 +65,7 @@ TEST_F(daemon_errors, of_a_full_disk_end_and_what_comes_after_them_is_kept) {
     {
         const unique_fd filler(open("filler", O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
         const std::string page(4096, 'x');
-        while (write_all(filler.get(), page.data(), page.size()) > 0) {
+        while (write_all(filler.get(), page.data(), page.size())) {
         }
         ASSERT_EQ(errno, ENOSPC);
     }

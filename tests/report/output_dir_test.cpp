@@ -57,7 +57,7 @@ TEST_F(output_dir, the_lowest_numbers_go_until_there_is_room) {
     for (const auto& [before, room, highest, after] : cases) {
         SCOPED_TRACE(testing::PrintToString(before) + " " + std::to_string(room));
         prepare(before, room);
-        EXPECT_EQ(prune_dir(), highest);
+        EXPECT_EQ(prune_dir().value_or(-1), highest);
         EXPECT_EQ(names(), after);
     }
 }
@@ -86,13 +86,13 @@ TEST_F(output_dir, only_reports_in_the_directory_are_removed) {
     EXPECT_EQ(mkfifo("output/kiv_1", 0600), 0);
     EXPECT_EQ(prune_dir(), 0);
     fs::create_directory("output/kiv_3");
-    EXPECT_EQ(prune_dir(), -1);
+    EXPECT_EQ(prune_dir(), std::nullopt);
 }
 
 TEST_F(output_dir, numbers_and_sizes_wrap) {
     prepare({"kiv_1", "kiv_2147483647"}, 0);
     get_limits().max_output_dir_size = get_limits().max_report_size - 1;  // no limit, then
-    EXPECT_EQ(next_report_number(prune_dir()), 2);
+    EXPECT_EQ(next_report_number(prune_dir().value()), 2);
     EXPECT_EQ(next_report_number(2147483646), 2147483647);
 }
 

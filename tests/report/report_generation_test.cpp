@@ -46,7 +46,7 @@ TEST_F(report_generation, all_files_have_the_documented_bytes) {
 }
 
 TEST_F(report_generation, each_report_has_what_came_since_the_last_one) {
-    EXPECT_EQ(generate_report(), -1);
+    EXPECT_FALSE(generate_report());
     EXPECT_EQ(take_log(), lines{});
     counters_update("p", "c1", 1, counter_mode::set);
     EXPECT_EQ(contents(next_report()), "P1; c1=1; ");
@@ -68,7 +68,7 @@ TEST_F(report_generation, each_report_has_what_came_since_the_last_one) {
 TEST_F(report_generation, a_failed_flush_leaves_the_event_file) {
     (void)events_add("p", "e1", {});
     fs::create_directory(paths::flushed_data);
-    EXPECT_EQ(generate_report(), -1);
+    EXPECT_FALSE(generate_report());
     EXPECT_EQ(take_log(), (lines{"I kivd-compactor: Generating Report...",
                                  "E kivd-compactor: Failed to flush events"}));
     (void)events_add("p", "e2", {});
@@ -78,11 +78,11 @@ TEST_F(report_generation, a_failed_flush_leaves_the_event_file) {
 
 TEST_F(report_generation, a_failed_compactor_leaves_its_data_and_no_report) {
     (void)events_add("p", "e", {});
-    EXPECT_EQ(events_flush(), 0);
+    EXPECT_TRUE(events_flush());
     fs::create_symlink("/dev/full", paths::compacted_data);
-    EXPECT_EQ(compact_report(), -1);
+    EXPECT_FALSE(compact_report());
     EXPECT_TRUE(fs::remove(paths::compacted_data) && fs::is_empty("output"));
-    EXPECT_EQ(compact_report(), 0);
+    EXPECT_TRUE(compact_report());
     EXPECT_TRUE(exists("output/kiv_1"));
 }
 
@@ -91,7 +91,7 @@ TEST_F(report_generation, a_report_that_cannot_be_sealed_whole_does_not_appear) 
     set_report_key_dir("./");
     set_output_compression(false);
     (void)events_add("p", "e", std::string(5000, 'x'));
-    EXPECT_EQ(events_flush(), 0);
+    EXPECT_TRUE(events_flush());
     const auto size = fs::file_size(paths::flushed_data);
     const std::pair<rlim_t, const char*> limits[] = {
         {size + 100, "E kivd/crypto: encrypt_file(): fwrite() failed, File too large"},
@@ -99,12 +99,12 @@ TEST_F(report_generation, a_report_that_cannot_be_sealed_whole_does_not_appear) 
     };
     for (const auto& [limit, message] : limits) {
         limit_file_size(limit);
-        EXPECT_EQ(compact_report(), -1);
+        EXPECT_FALSE(compact_report());
         EXPECT_EQ(take_log().back(), message);
         EXPECT_TRUE(fs::is_empty("output"));
     }
     limit_file_size(RLIM_INFINITY);
-    EXPECT_EQ(compact_report(), 0);
+    EXPECT_TRUE(compact_report());
     EXPECT_TRUE(exists("output/kiv_1") && !exists(paths::flushed_data));
 }
 

@@ -30,7 +30,7 @@ TEST_F(event_store, a_file_has_one_header_and_is_full_at_its_limit) {
     EXPECT_EQ(add(), event_file::open);  // 187 bytes
     get_limits().max_report_size = 212;
     EXPECT_EQ(add(), event_file::full);
-    EXPECT_EQ(events_flush(), 0);
+    EXPECT_TRUE(events_flush());
     EXPECT_EQ(read_file(paths::flushed_data), header + event + event);
     write_file(paths::events, header + event);  // as a restart finds it
     get_limits().max_report_size = 213;

@@ -7,41 +7,38 @@ namespace {
 
 const std::string end = "\0\0\n"s;
 
-int write_record(FILE* file, const void* element, void* /*context*/) {
-    record_writer writer(file);
-    writer.text(static_cast<const probe_key*>(element)->package);
-    return writer.finish() ? 1 : 0;
+struct item : probe_key {};
+
+bool write_record(list_writer& writer, const item& each) {
+    writer.text(each.package);
+    return writer.end_record();
 }
 
 // A list whose records are one text each.
 class list_file : public scratch_directory {
  protected:
-    ~list_file() override { list_destroy(list); }
-
     // What loading a file of `bytes` gives: its result, and the number of records.
-    std::pair<int, uint32_t> load(const std::string& bytes) {
+    std::pair<bool, uint32_t> load(const std::string& bytes) {
         write_file("list", bytes);
-        list_destroy(list);
-        list = list_create(0, 100, compare_probes, nullptr);
-        const auto parse = [](const char* record, const char*, void*) {
-            return new_probe_element(sizeof(probe_key), {record, ""});
-        };
-        const int result = list_load(*list, "list", parse, nullptr);
-        return {result, list->count};
+        list.clear();
+        const bool complete = list_load(list, "list", [](std::string_view record) {
+            return make_entry<item>({record.data(), ""});
+        });
+        return {complete, list.size()};
     }
 
-    sorted_list* list = nullptr;
+    sorted_list<item> list{100};
 };
 
 TEST_F(list_file, records_and_files_have_their_limits) {
     const std::string longest = std::string(1021, 'x') + end;
     std::string many;
     for (int i = 0; i < 200; ++i) many += longest + "a" + end;  // across the edges of any buffer
-    EXPECT_EQ(load(many), std::pair(1, 400U));
-    EXPECT_EQ(load(many + "x" + longest), std::pair(0, 400U));
+    EXPECT_EQ(load(many), std::pair(true, 400U));
+    EXPECT_EQ(load(many + "x" + longest), std::pair(false, 400U));
     for (int i = 400; i < 19999; ++i) many += "a" + end;
-    EXPECT_EQ(load(many), std::pair(1, 19999U));
-    EXPECT_EQ(load(many + longest + longest), std::pair(0, 20000U));
+    EXPECT_EQ(load(many), std::pair(true, 19999U));
+    EXPECT_EQ(load(many + longest + longest), std::pair(false, 20000U));
 }
 
 TEST_F(list_file, a_failed_save_keeps_the_old_file_and_no_other) {
@@ -62,13 +59,13 @@ TEST_F(list_file, a_failed_save_keeps_the_old_file_and_no_other) {
         for (int i = 0; i < records; ++i) old += "old" + end;
         (void)load(old);
         obstruct();
-        EXPECT_EQ(list_save(*list, "list", write_record, nullptr), 0);
+        EXPECT_FALSE(list_save(list, "list", write_record));
         EXPECT_EQ(take_log(), lines{message});
         EXPECT_TRUE(fs::is_directory("list") || read_file("list") == old);
         EXPECT_FALSE(exists("list_"));
 
         fs::remove_all("list");
-        EXPECT_EQ(list_save(*list, "list", write_record, nullptr), 1);
+        EXPECT_TRUE(list_save(list, "list", write_record));
         EXPECT_EQ(read_file("list"), old);
     }
 }

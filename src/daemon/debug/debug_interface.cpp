@@ -41,7 +41,7 @@ void accept_debug_client(event_handler& handler) {
     if (fd < 0 && errno != EAGAIN) turn_away_client(handler.fd);
     close_client();
     client.fd = fd;
-    if (fd >= 0 && event_loop_add(client) != 0) close_client();
+    if (fd >= 0 && !event_loop_add(client)) close_client();
 }
 
 void read_debug_client(event_handler& handler) {
@@ -60,7 +60,7 @@ void debug_start() {
     if (bind(listener.fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         give_up(tag, "Cannot bind to di-socket - port already used? %s", strerror(errno));
     }
-    if (listen(listener.fd, listen_backlog) != 0 || event_loop_add(listener) != 0) {
+    if (listen(listener.fd, listen_backlog) != 0 || !event_loop_add(listener)) {
         give_up(tag, "Failed to listen to di-socket: %s", strerror(errno));
     }
 }

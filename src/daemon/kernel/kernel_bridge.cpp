@@ -14,6 +14,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <optional>
 #include <span>
 #include <string_view>
 
@@ -34,11 +35,10 @@ constinit pthread_t thread = {};
 constinit bool thread_started = false;
 constinit std::atomic<bool> is_set_up = false;
 
-// Logs "WHAT [errno/text]"; gives the errno.
-int fail(const char* what, const char* end = "") {
-    const int error = errno;
-    __android_log_print(ANDROID_LOG_ERROR, tag, "%s [%d/%s]%s", what, error, strerror(error), end);
-    return error;
+// Logs "WHAT [errno/text]".
+bool fail(const char* what, const char* end = "") {
+    __android_log_print(ANDROID_LOG_ERROR, tag, "%s [%d/%s]%s", what, errno, strerror(errno), end);
+    return false;
 }
 
 // Waits until `fd` is readable; false when the daemon is to stop.
@@ -79,34 +79,33 @@ void pass_event(const daemon_socket& daemon, std::span<char> message, size_t pos
     const std::string_view package = next_token(text, position);
     const std::string_view name = next_token(text, position);
     if (package.empty() || name.empty()) {
-        (void)log_and_raise(tag, "Badly formatted event - dropping.");
+        log_and_raise(tag, "Badly formatted event - dropping.");
         return;
     }
     const size_t start = std::min(position + 1, text.size());
     const std::span<char> record = message.subspan(start);
     if (record.size() > max_record_size) {
-        (void)log_and_raise(tag, "Too large event - dropping.");
+        log_and_raise(tag, "Too large event - dropping.");
         return;
     }
-    unique_malloc<uint8_t> packed;
-    const int32_t size = translate_event(package, name, record, packed);
-    if (size == 0) {
-        (void)log_and_raise(tag, "Failed to pack %zu bytes.", record.size());
+    const std::optional<packed_event> packed = translate_event(package, name, record);
+    if (packed && packed->size == 0) {
+        log_and_raise(tag, "Failed to pack %zu bytes.", record.size());
         return;
     }
-    if (size < 0 || static_cast<size_t>(size) >= record.size()) {
-        (void)log_and_raise(tag, "Packed size greater than unpacked size, bailing...");
+    if (!packed || packed->size >= record.size()) {
+        log_and_raise(tag, "Packed size greater than unpacked size, bailing...");
         return;
     }
-    memcpy(record.data(), packed.get(), static_cast<size_t>(size));
-    (void)send_request(daemon, text.substr(0, start + static_cast<size_t>(size)));
+    memcpy(record.data(), packed->bytes.get(), packed->size);
+    (void)send_request(daemon, text.substr(0, start + packed->size));
 }
 
 void pass_counter(const daemon_socket& daemon, std::string_view text) {
     const ssize_t sent = send_request(daemon, text);
     if (sent == static_cast<ssize_t>(text.size())) return;
-    (void)log_and_raise(tag, "Failed to pass counter data to kivd (%d/%d).",
-                        static_cast<int>(text.size()), static_cast<int>(sent));
+    log_and_raise(tag, "Failed to pass counter data to kivd (%d/%d).",
+                  static_cast<int>(text.size()), static_cast<int>(sent));
 }
 
 // Nothing but events that are translated and counters goes on: every local user can send to this
@@ -116,7 +115,7 @@ void pass_on(const daemon_socket& daemon, std::span<char> message) {
     size_t position = 0;
     const std::string_view command = next_token(text, position);
     if (command.empty()) {
-        (void)log_and_raise(tag, "Failed to parse input.");
+        log_and_raise(tag, "Failed to parse input.");
     } else if (command == "EV") {
         pass_event(daemon, message, position);
     } else if (command == "CI" || command == "CS") {
@@ -132,7 +131,7 @@ void* run_thread(void* /*argument*/) {
 
 }  // namespace
 
-int open_daemon_socket(daemon_socket& daemon) {
+bool open_daemon_socket(daemon_socket& daemon) {
     daemon.address = {};
     daemon.address.sun_family = AF_UNIX;
     snprintf(daemon.address.sun_path, sizeof daemon.address.sun_path, "%s%s", KIV_DEFAULT_DIRECTORY,
@@ -141,24 +140,24 @@ int open_daemon_socket(daemon_socket& daemon) {
     if (!daemon.fd.ok()) return fail("Failed to create unix socket");
     const timeval timeout = {0, send_timeout_us};
     (void)setsockopt(daemon.fd.get(), SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
-    return 0;
+    return true;
 }
 
-int open_netlink_socket(unique_fd& netlink) {
+bool open_netlink_socket(unique_fd& netlink) {
     netlink.reset(socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_USERSOCK));
     if (!netlink.ok()) return fail("Failed to create netlink socket");
     sockaddr_nl own = {};
     own.nl_family = AF_NETLINK;
     own.nl_pid = static_cast<uint32_t>(getpid());
-    if (bind(netlink.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0) return 0;
-    const int error = fail("Failed to assign netlink socket name", ".");
+    if (bind(netlink.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0) return true;
+    fail("Failed to assign netlink socket name", ".");
     if (close(netlink.release()) != 0) {
         __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to close netlink socket.");
     }
-    return error;
+    return false;
 }
 
-int send_pid_to_kernel(int netlink) {
+bool send_pid_to_kernel(int netlink) {
     char digits[6];  // longer ids are cut, as the kernel expects
     snprintf(digits, sizeof digits, "%d", getpid());
     sockaddr_nl kernel = {};
@@ -166,38 +165,37 @@ int send_pid_to_kernel(int netlink) {
     if (sendto(netlink, digits, strlen(digits) + 1, 0, reinterpret_cast<const sockaddr*>(&kernel),
                sizeof kernel) >= 0) {
         __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the kernel!");
-        return 0;
+        return true;
     }
-    return errno == ECONNREFUSED ? ECONNREFUSED : fail("Failed to send pid to kernel");
+    return errno == ECONNREFUSED ? false : fail("Failed to send pid to kernel");
 }
 
-int receive_kernel_message(int netlink, daemon_socket& daemon) {
-    if (!wait_for_message(netlink)) return 0;
+void receive_kernel_message(int netlink, daemon_socket& daemon) {
+    if (!wait_for_message(netlink)) return;
     const ssize_t peeked = peek_size(netlink);
-    if (peeked < 0) return 0;  // messages were lost before this one
+    if (peeked < 0) return;  // messages were lost before this one
     const auto size = static_cast<size_t>(peeked);
     const unique_malloc<char> buffer(static_cast<char*>(malloc(size + 1)));
     if (!buffer) {
-        (void)log_and_raise(tag, "Unable to create buffer.\n");
-        return -ENOMEM;
+        log_and_raise(tag, "Unable to create buffer.\n");
+        return;
     }
     const ssize_t received = recv(netlink, buffer.get(), size + 1, MSG_DONTWAIT);
-    if (received <= 0) return 0;
+    if (received <= 0) return;
     const std::span<char> message(buffer.get(), static_cast<size_t>(received));
     pass_on(daemon, message.subspan(std::min(sizeof(nlmsghdr), message.size())));
-    return 0;
 }
 
 void run_kernel_bridge() {
     // They stay open until the process ends, so that nobody else takes the port.
     static daemon_socket daemon;
     static unique_fd netlink;
-    const bool serving = open_daemon_socket(daemon) == 0 && open_netlink_socket(netlink) == 0 &&
-                         send_pid_to_kernel(netlink.get()) == 0;
+    const bool serving = open_daemon_socket(daemon) && open_netlink_socket(netlink) &&
+                         send_pid_to_kernel(netlink.get());
     is_set_up = true;
     is_set_up.notify_one();
     if (!serving) return;
-    while (!is_stop_requested()) (void)receive_kernel_message(netlink.get(), daemon);
+    while (!is_stop_requested()) receive_kernel_message(netlink.get(), daemon);
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting Down...");
 }
 

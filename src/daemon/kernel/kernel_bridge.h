@@ -16,15 +16,16 @@ struct daemon_socket {
     unique_fd fd;
 };
 
-// The steps of the set-up; each gives 0 or an error number, which has been logged but for the
-// refusal (ECONNREFUSED) of a kernel in which nothing listens.
-[[nodiscard]] int open_daemon_socket(daemon_socket& daemon);
-[[nodiscard]] int open_netlink_socket(unique_fd& netlink);
-[[nodiscard]] int send_pid_to_kernel(int netlink);
+// The steps of the set-up. A failure has been logged, but for the refusal (ECONNREFUSED) of a
+// kernel in which nothing listens.
+[[nodiscard]] bool open_daemon_socket(daemon_socket& daemon);
+[[nodiscard]] bool open_netlink_socket(unique_fd& netlink);
+[[nodiscard]] bool send_pid_to_kernel(int netlink);
 
-// Receives one message, waiting for it until the daemon is to stop, and sends on what it says. 0,
-// or -ENOMEM when there is no memory for it. What is wrong with it has been logged and raised.
-int receive_kernel_message(int netlink, daemon_socket& daemon);
+// Receives one message, waiting for it until the daemon is to stop, and sends on what it says. What
+// is wrong with it has been logged and raised, and so has a lack of memory for it, when it is still
+// there.
+void receive_kernel_message(int netlink, daemon_socket& daemon);
 
 // The body of the thread: ends when the set-up fails or the daemon is to stop.
 void run_kernel_bridge();

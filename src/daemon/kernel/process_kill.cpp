@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 #include "kernel.pb-c.h"
 #include "runtime/log_and_raise.h"
@@ -44,25 +45,32 @@ void fill(Kernel__ProcessKill& message, const raw_process_kill& raw, char* comm)
 
 }  // namespace
 
-int32_t translate_event(std::string_view package, std::string_view name,
-                        std::span<const char> record, unique_malloc<uint8_t>& packed) {
+std::optional<packed_event> translate_event(std::string_view package, std::string_view name,
+                                            std::span<const char> record) {
     if (package != "kernel" || name != "ProcessKill") {
-        return log_and_raise(tag, "%s [%.*s/%.*s] not supported by translated", function_name,
-                             static_cast<int>(package.size()), package.data(),
-                             static_cast<int>(name.size()), name.data());
+        log_and_raise(tag, "%s [%.*s/%.*s] not supported by translated", function_name,
+                      static_cast<int>(package.size()), package.data(),
+                      static_cast<int>(name.size()), name.data());
+        return std::nullopt;
     }
     raw_process_kill raw;
     if (record.size() < sizeof raw) {
-        return log_and_raise(tag, "%s got a record of %zu bytes", function_name, record.size());
+        log_and_raise(tag, "%s got a record of %zu bytes", function_name, record.size());
+        return std::nullopt;
     }
     memcpy(&raw, record.data(), sizeof raw);
     char comm[sizeof raw.comm + 1] = {};
     memcpy(comm, raw.comm, sizeof raw.comm);
     Kernel__ProcessKill message = KERNEL__PROCESS_KILL__INIT;
     fill(message, raw, comm);
-    packed.reset(static_cast<uint8_t*>(malloc(kernel__process_kill__get_packed_size(&message))));
-    if (!packed) return log_and_raise(tag, "%s failed to allocate buffer", function_name);
-    return static_cast<int32_t>(kernel__process_kill__pack(&message, packed.get()));
+    unique_malloc<uint8_t> bytes(
+        static_cast<uint8_t*>(malloc(kernel__process_kill__get_packed_size(&message))));
+    if (!bytes) {
+        log_and_raise(tag, "%s failed to allocate buffer", function_name);
+        return std::nullopt;
+    }
+    const size_t size = kernel__process_kill__pack(&message, bytes.get());
+    return packed_event{std::move(bytes), size};
 }
 
 }  // namespace kivd

@@ -2,7 +2,9 @@
 // "ProcessKill" of package "kernel" carries.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string_view>
 
@@ -10,10 +12,15 @@
 
 namespace kivd {
 
-// The packed kernel.ProcessKill of a raw record goes to `packed`, a block of malloc. Gives its
-// size, or -1: such events are not known, the record is too short, or there is no memory; logged
-// and raised.
-[[nodiscard]] int32_t translate_event(std::string_view package, std::string_view name,
-                                      std::span<const char> record, unique_malloc<uint8_t>& packed);
+struct packed_event {
+    unique_malloc<uint8_t> bytes;
+    size_t size;
+};
+
+// The packed kernel.ProcessKill of a raw record. Nothing, which has been logged and raised, when
+// such events are not known, the record is too short, or there is no memory.
+[[nodiscard]] std::optional<packed_event> translate_event(std::string_view package,
+                                                          std::string_view name,
+                                                          std::span<const char> record);
 
 }  // namespace kivd

@@ -34,22 +34,22 @@ void call_handlers(std::span<const epoll_event> events) {
 
 }  // namespace
 
-int event_loop_init() {
+bool event_loop_init() {
     epoll_fd = epoll_create1(EPOLL_CLOEXEC);
     if (epoll_fd < 0) {
         __android_log_print(ANDROID_LOG_ERROR, tag, "epoll_create failed: %s", strerror(errno));
-        return -1;
+        return false;
     }
     stop_handler.fd = stop_event_fd();
     (void)event_loop_add(stop_handler);
-    return 0;
+    return true;
 }
 
-int event_loop_add(event_handler& handler) {
+bool event_loop_add(event_handler& handler) {
     epoll_event event = {};
     event.events = EPOLLIN;
     event.data.ptr = &handler;
-    return epoll_ctl(epoll_fd, EPOLL_CTL_ADD, handler.fd, &event);
+    return epoll_ctl(epoll_fd, EPOLL_CTL_ADD, handler.fd, &event) == 0;
 }
 
 void event_loop_remove(event_handler& handler) {

@@ -11,11 +11,12 @@ struct event_handler {
     int fd;  // -1 while closed
 };
 
-// Makes the loop. -1 on failure, logged.
-[[nodiscard]] int event_loop_init();
+// Makes the loop. A failure has been logged.
+[[nodiscard]] bool event_loop_init();
 
-// Adds a handler with its descriptor, or takes it out. -1 with errno set when it cannot be added.
-[[nodiscard]] int event_loop_add(event_handler& handler);
+// Adds a handler with its descriptor, or takes it out. False, with errno set, when it cannot be
+// added.
+[[nodiscard]] bool event_loop_add(event_handler& handler);
 void event_loop_remove(event_handler& handler);
 
 // Serves events and the timed save until a stop is requested.

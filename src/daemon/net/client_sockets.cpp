@@ -72,11 +72,11 @@ int create_socket(int type, const char* name) {
 }  // namespace
 
 void create_client_sockets() {
-    if (packet_buffers_init() != 0) give_up_to("map packet buffers");
+    if (!packet_buffers_init()) give_up_to("map packet buffers");
     turn_away_init();
     for (client_socket& each : client_sockets) {
         each.handler.fd = create_socket(each.type, each.name);
-        if (event_loop_add(each.handler) != 0) give_up_to("add socket to epoll");
+        if (!event_loop_add(each.handler)) give_up_to("add socket to epoll");
     }
 }
 

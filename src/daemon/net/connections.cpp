@@ -42,7 +42,7 @@ bool add_connection(unique_fd fd, void (*callback)(event_handler&)) {
     auto* const added = static_cast<connection*>(malloc(sizeof(connection)));
     if (added == nullptr) return false;
     *added = {{callback, fd.get()}, nullptr, connections};
-    if (event_loop_add(*added) != 0) {
+    if (!event_loop_add(*added)) {
         free(added);
         return false;
     }
@@ -76,11 +76,11 @@ void accept_client(int listening_fd, void (*callback)(event_handler&)) {
     unique_fd fd(accept4(listening_fd, nullptr, nullptr, SOCK_CLOEXEC));
     if (!fd.ok()) {
         if (errno == EAGAIN) return;  // it has hung up already
-        (void)log_and_raise(tag, "Accept failed: %s.", strerror(errno));
+        log_and_raise(tag, "Accept failed: %s.", strerror(errno));
         return turn_away_client(listening_fd);
     }
     if (is_spare(fd.get())) {
-        (void)log_and_raise(tag, "Accept failed: %s.", strerror(EMFILE));
+        log_and_raise(tag, "Accept failed: %s.", strerror(EMFILE));
         return;
     }
     set_socket_timeouts(fd.get());
@@ -106,8 +106,7 @@ size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
     const ssize_t n = receive(handler.fd, buffer, receive_size);
     if (n < 0 && errno == EAGAIN) return 0;
     if (n < 0) {
-        (void)log_and_raise(tag, "recvfrom() error from client %d, %s", handler.fd,
-                            strerror(errno));
+        log_and_raise(tag, "recvfrom() error from client %d, %s", handler.fd, strerror(errno));
         return 0;
     }
     if (n == 0) {
@@ -116,8 +115,7 @@ size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
     }
     const auto size = static_cast<size_t>(n);
     if (size > max_packet_size) {
-        (void)log_and_raise(tag, "Too large packet (%s) from client %d, dropping.", kind,
-                            handler.fd);
+        log_and_raise(tag, "Too large packet (%s) from client %d, dropping.", kind, handler.fd);
         return 0;
     }
     buffer[size] = '\0';
@@ -127,13 +125,13 @@ size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
 void handle_packet(int fd, std::span<char> packet, const char* receiver) {
     packet.data()[packet.size()] = '\0';
     const answer given = handle_request(fd, packet, nullptr);
-    if (given.descriptor.ok()) return (void)send_fd_message(fd, given.descriptor.get());
+    if (given.descriptor.ok()) return send_fd_message(fd, given.descriptor.get());
     if (given.size == 0) return;
     wait_before_send();
-    if (send_all(fd, packet.data(), given.size) >= 0) return;
+    if (send_all(fd, packet.data(), given.size)) return;
     const int error = errno;
-    (void)log_and_raise(tag, "%s: failed to send to client %d, errno=%d (%s)", receiver, fd, error,
-                        strerror(error));
+    log_and_raise(tag, "%s: failed to send to client %d, errno=%d (%s)", receiver, fd, error,
+                  strerror(error));
 }
 
 void receive_seq_client(event_handler& handler) {
@@ -168,22 +166,22 @@ void receive_stream_client(event_handler& handler) {
         case stream_header_status::ok:
             break;
         case stream_header_status::not_a_header:
-            (void)log_and_raise(tag, "Invalid packet for stream from client %d, dropping.", fd);
+            log_and_raise(tag, "Invalid packet for stream from client %d, dropping.", fd);
             return;
         case stream_header_status::no_length:
-            (void)log_and_raise(tag, "No length marked by client %d", fd);
+            log_and_raise(tag, "No length marked by client %d", fd);
             return;
         case stream_header_status::bad_length:
-            (void)log_and_raise(tag, "Incorrect size of packet from client %d, dropping.", fd);
+            log_and_raise(tag, "Incorrect size of packet from client %d, dropping.", fd);
             return;
     }
     const size_t wanted = header.header_size + header.payload_size;
     const size_t size = receive_rest(fd, buffer, first_size, wanted);
     if (size < wanted) {
-        (void)log_and_raise(tag, "Client %d disconnected, no data from peer", fd);
+        log_and_raise(tag, "Client %d disconnected, no data from peer", fd);
     }
     if (size != wanted) {
-        (void)log_and_raise(tag, "Incomplete packet for stream from client %d, dropping.", fd);
+        log_and_raise(tag, "Incomplete packet for stream from client %d, dropping.", fd);
         return;
     }
     handle_packet(fd, {buffer + header.header_size, header.payload_size}, "receive_stream_client");
@@ -204,8 +202,8 @@ void set_socket_timeouts(int fd) {
         return;
     }
     const int error = errno;
-    (void)log_and_raise(tag, "%s: failed to set socket timeouts, errno=%d (%s)",
-                        "set_socket_timeouts", error, strerror(error));
+    log_and_raise(tag, "%s: failed to set socket timeouts, errno=%d (%s)", "set_socket_timeouts",
+                  error, strerror(error));
 }
 
 void connections_release() {

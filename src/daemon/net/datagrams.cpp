@@ -26,7 +26,7 @@ struct alignas(cmsghdr) control_buffer {
 void handle_datagram(int fd, std::span<char> packet, const msghdr& message) {
     if (packet.empty()) return;
     if (packet.size() > max_packet_size) {
-        (void)log_and_raise(tag, "Too large packet (dgram) from client %d, dropping.", fd);
+        log_and_raise(tag, "Too large packet (dgram) from client %d, dropping.", fd);
         return;
     }
     packet.data()[packet.size()] = '\0';

@@ -9,13 +9,13 @@ constinit packet_buffers* buffers = nullptr;
 
 }  // namespace
 
-int packet_buffers_init() {
+bool packet_buffers_init() {
     void* const mapping = mmap(nullptr, sizeof(packet_buffers), PROT_READ | PROT_WRITE,
                                MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
-    if (mapping == MAP_FAILED) return -1;
+    if (mapping == MAP_FAILED) return false;
     (void)madvise(mapping, sizeof(packet_buffers), MADV_DONTFORK);
     buffers = static_cast<packet_buffers*>(mapping);
-    return 0;
+    return true;
 }
 
 packet_buffers& get_packet_buffers() { return *buffers; }

@@ -22,8 +22,8 @@ struct packet_buffers {
     std::array<packet_buffer, max_batch> packets;
 };
 
-// Maps the buffers. -1 with errno set when that is not possible.
-[[nodiscard]] int packet_buffers_init();
+// Maps the buffers. False, with errno set, when that is not possible.
+[[nodiscard]] bool packet_buffers_init();
 
 // Valid after packet_buffers_init. The callbacks of all sockets share them, one after the other.
 [[nodiscard]] packet_buffers& get_packet_buffers();

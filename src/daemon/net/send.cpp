@@ -21,7 +21,7 @@ constexpr int64_t descriptor_ms = 1000;
 
 }  // namespace
 
-ssize_t send_all(int fd, const char* bytes, size_t size) {
+bool send_all(int fd, const char* bytes, size_t size) {
     const int64_t deadline_ms = monotonic_ms() + reply_ms;
     size_t sent = 0;
     while (sent < size) {
@@ -31,16 +31,16 @@ ssize_t send_all(int fd, const char* bytes, size_t size) {
             continue;
         }
         if (errno == EINTR) continue;
-        if (errno != EAGAIN) return -1;
+        if (errno != EAGAIN) return false;
         if (!wait_for_client(fd, POLLOUT, deadline_ms)) {
             errno = EAGAIN;
-            return -1;
+            return false;
         }
     }
-    return static_cast<ssize_t>(size);
+    return true;
 }
 
-int send_fd_message(int fd, int descriptor) {
+void send_fd_message(int fd, int descriptor) {
     wait_before_send();
     char text[] = {'O', 'K'};
     iovec data = {text, sizeof text};
@@ -60,10 +60,9 @@ int send_fd_message(int fd, int descriptor) {
     while (sendmsg(fd, &message, MSG_NOSIGNAL | MSG_DONTWAIT) < 0) {
         if (errno == EINTR) continue;
         if (errno == EAGAIN && wait_for_client(fd, POLLOUT, deadline_ms)) continue;
-        (void)log_and_raise(tag, "Failed to send fd-message to client %d", fd);
-        return 0;
+        log_and_raise(tag, "Failed to send fd-message to client %d", fd);
+        return;
     }
-    return 1;
 }
 
 }  // namespace kivd

@@ -31,7 +31,7 @@ std::optional<ucred> peer_of(int fd) {
     ucred credentials;
     socklen_t size = sizeof credentials;
     if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &size) == 0) return credentials;
-    (void)log_and_raise(tag, "Failed to obtain user credentials");
+    log_and_raise(tag, "Failed to obtain user credentials");
     return std::nullopt;
 }
 

@@ -26,7 +26,7 @@ answer with_argument(request& r, const char* complaint, void (*act)(const char*)
     if (argument != nullptr) {
         act(argument);
     } else {
-        (void)log_and_raise(tag, "%s", complaint);
+        log_and_raise(tag, "%s", complaint);
     }
     return no_answer();
 }
@@ -51,10 +51,10 @@ answer announce_configuration(request& r) {
 answer write_configuration(request& r) {
     constexpr size_t command_size = 3;  // with the delimiter behind it
     if (r.packet.size() < command_size) {
-        (void)log_and_raise(tag, "Badly formatted packet (WC) - dropping.");
+        log_and_raise(tag, "Badly formatted packet (WC) - dropping.");
         return no_answer();
     }
-    write_configuration(r.packet.subspan(command_size));
+    replace_config_file(r.packet.subspan(command_size));
     return no_answer();
 }
 
@@ -92,7 +92,7 @@ answer get_file(request& r) {
     const char* const set = next_token(r);
     const char* const number = next_token(r);
     if (set == nullptr || number == nullptr) {
-        (void)log_and_raise(tag, "Badly formatted packet (FG) - dropping.");
+        log_and_raise(tag, "Badly formatted packet (FG) - dropping.");
         return answer_with(r, "FAIL");
     }
     return answer_with(r, open_exported_file(set, number));
@@ -118,7 +118,7 @@ answer replace_group(request& r) {
     if (new_id != nullptr && old_id != nullptr) {
         replace_group_id(new_id, old_id);
     } else {
-        (void)log_and_raise(tag, "replace_group_id without valid value.");
+        log_and_raise(tag, "replace_group_id without valid value.");
     }
     return no_answer();
 }

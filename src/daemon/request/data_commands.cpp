@@ -32,8 +32,8 @@ answer add_event(request& r) {
     if (!take_probe_id(r, "EV", probe)) return no_answer();
     const std::span<const char> payload = raw_rest(r);
     if (payload.size() > max_payload_size) {
-        (void)log_and_raise(tag, "Too large event - dropping. [%s:%s] %zu bytes", probe.package,
-                            probe.name, payload.size());
+        log_and_raise(tag, "Too large event - dropping. [%s:%s] %zu bytes", probe.package,
+                      probe.name, payload.size());
         return no_answer();
     }
     diag_add_event(probe.package, probe.name, payload);

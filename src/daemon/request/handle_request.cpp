@@ -57,14 +57,14 @@ answer handle_request(int fd, std::span<char> packet, const msghdr* message) {
     request r = make_request(fd, packet, message);
     const char* const name = next_token(r);
     if (name == nullptr) {
-        (void)log_and_raise(tag, "Invalid command: none - dropping.");
+        log_and_raise(tag, "Invalid command: none - dropping.");
         return no_answer();
     }
     const auto* const found = std::ranges::find(commands, std::string_view(name), &command::name);
     if (found == std::end(commands)) {
-        (void)log_and_raise(tag, "Bad command: %d/%d - dropping",
-                            static_cast<unsigned char>(packet.data()[0]),
-                            static_cast<unsigned char>(packet.data()[1]));
+        log_and_raise(tag, "Bad command: %d/%d - dropping",
+                      static_cast<unsigned char>(packet.data()[0]),
+                      static_cast<unsigned char>(packet.data()[1]));
         return no_answer();
     }
     if (found->refusal != nullptr && !check_caller_permission(r)) {

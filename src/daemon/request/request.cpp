@@ -55,24 +55,21 @@ bool take_probe_id(request& r, const char* command, probe_id& probe) {
     probe.package = next_token(r);
     probe.name = next_token(r);
     if (probe.package == nullptr || probe.name == nullptr) {
-        (void)log_and_raise(tag, "[%s] Null in probe id - dropping. [%s:%s]", command,
-                            or_null(probe.package), or_null(probe.name));
-        return false;
+        return log_and_raise(tag, "[%s] Null in probe id - dropping. [%s:%s]", command,
+                             or_null(probe.package), or_null(probe.name));
     }
     const size_t size = strlen(probe.package) + strlen(probe.name);
     if (size > max_probe_id_size) {
-        (void)log_and_raise(tag, "[%s] To large probe id, %zu > %d - dropping. [%s:%s]", command,
-                            size, static_cast<int>(max_probe_id_size), probe.package, probe.name);
-        return false;
+        return log_and_raise(tag, "[%s] To large probe id, %zu > %d - dropping. [%s:%s]", command,
+                             size, static_cast<int>(max_probe_id_size), probe.package, probe.name);
     }
     return true;
 }
 
 bool check_probe_value(const char* command, const probe_id& probe, const char* value) {
     if (value != nullptr && *value != '\0') return true;
-    (void)log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command, probe.package,
-                        probe.name);
-    return false;
+    return log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command,
+                         probe.package, probe.name);
 }
 
 }  // namespace kivd
