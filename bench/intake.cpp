@@ -12,6 +12,7 @@
 #include "bench/measure.h"
 #include "bench/plain_file.h"
 #include "bench/sections.h"
+#include "format/config_file.h"
 #include "intake/config_file.h"
 
 namespace kivd::bench {

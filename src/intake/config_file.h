@@ -1,5 +1,4 @@
-// The configuration file: a protobuf message of an optional signature and the compressed package,
-// in this order. Format: docs/configuration.md.
+// Taking a configuration file apart and unpacking it. Layout and limits: format/config_file.h.
 #pragma once
 
 #include <cstdint>
@@ -9,9 +8,6 @@
 #include "util/file_io.h"
 
 namespace kivd {
-
-inline constexpr size_t max_config_file_size = 204799;        // bytes
-inline constexpr size_t max_config_package_size = 8U << 20U;  // bytes, decompressed
 
 // Writes the two fields to private/new_config.sig and .gz; the former is there only when the file
 // has a signature. Bytes behind the second field are ignored. False when the file is not of that

@@ -17,6 +17,7 @@
 #include "config/config_parts.h"
 #include "config/filters.h"
 #include "config/settings.h"
+#include "format/config_file.h"
 #include "intake/config_file.h"
 #include "intake/config_request.h"
 #include "intake/run_actions.h"

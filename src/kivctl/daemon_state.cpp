@@ -16,6 +16,7 @@
 #include "config/limits.h"
 #include "daemon/option_names.h"
 #include "diag/diag_store.h"
+#include "format/report_name.h"
 #include "kivctl/io.h"
 #include "report/output_dir.h"
 #include "runtime/daemon_error.h"
@@ -118,8 +119,8 @@ std::optional<uint64_t> find_partial_size() {
 
 // The number of a report whose name is just as the daemon writes it; else it could not delete it.
 std::optional<int64_t> find_report_number(std::string_view name) {
-    if (!name.starts_with(paths::report_prefix)) return std::nullopt;
-    name.remove_prefix(sizeof paths::report_prefix - 1);
+    if (!name.starts_with(report_prefix)) return std::nullopt;
+    name.remove_prefix(sizeof report_prefix - 1);
     int64_t number = 0;
     const auto parsed = std::from_chars(name.data(), name.data() + name.size(), number);
     if (parsed.ec != std::errc{} || std::to_string(number) != name) return std::nullopt;

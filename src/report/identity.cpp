@@ -31,7 +31,7 @@ void fill_from_record(header_record& candidate, const header_record& record) {
     if (!candidate.device_id.is_known()) candidate.device_id = record.device_id;
     if (!candidate.serial_number.is_known()) candidate.serial_number = record.serial_number;
     if (candidate.device_imei.empty()) candidate.device_imei = record.device_imei;
-    candidate.config_checksum.set(get_config_checksum_text().get());
+    candidate.config_checksum.set(text_of_checksum(get_config_checksum()).data());
 }
 
 bool same_group_ids(const group_id_list& a, const group_id_list& b) {

@@ -15,11 +15,11 @@
 
 #include "config/limits.h"
 #include "diag/diag_store.h"
+#include "format/report_name.h"
 #include "platform/android_log.h"
 #include "runtime/log_and_raise.h"
 #include "util/directory.h"
 #include "util/paths.h"
-#include "util/text_scan.h"
 
 namespace kivd {
 namespace {
@@ -39,13 +39,6 @@ bool for_each_output(auto function) {
     return for_each_entry(paths::output_dir, [&function](std::string_view name) {
         if (name != paths::config_request_name) function(name.data());
     });
-}
-
-// Reads a name as scanf does with "kiv_%d": what follows the number does not matter.
-std::optional<int32_t> report_number(const char* name) {
-    if (!std::string_view(name).starts_with(paths::report_prefix)) return std::nullopt;
-    const std::optional<int64_t> number = scan_number(name + sizeof paths::report_prefix - 1);
-    return number ? std::optional(static_cast<int32_t>(*number)) : std::nullopt;
 }
 
 struct report_entry {
@@ -87,7 +80,7 @@ bool scan_output_dir(directory_state& state) {
             return;
         }
         const auto size = static_cast<uint64_t>(status.st_size);
-        if (const std::optional<int32_t> number = report_number(name)) {
+        if (const std::optional<int32_t> number = scan_report_number(name)) {
             state.add({*number, size});
             return;
         }
@@ -146,8 +139,7 @@ void delete_all_entries() {
 }  // namespace
 
 report_path::report_path(int64_t number) {
-    snprintf(text, sizeof text, "%s%s%lld", paths::output_dir, paths::report_prefix,
-             static_cast<long long>(number));
+    snprintf(text, sizeof text, "%s%s", paths::output_dir, report_name(number).text);
 }
 
 std::optional<int32_t> prune_dir() {

@@ -4,9 +4,11 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <optional>
 #include <string_view>
 
 #include "config/limits.h"
+#include "record/header_record.h"
 #include "runtime/daemon_error.h"
 #include "runtime/log_and_raise.h"
 #include "util/clock.h"
@@ -25,26 +27,15 @@ constinit int64_t last_flush = 0;
 constinit bool data_collection = false;
 constinit config_checksum checksum_in_force = {};
 
-// A digit that is none counts as 0.
-uint8_t value_of_hex_digit(char digit) {
-    if (digit >= '0' && digit <= '9') return static_cast<uint8_t>(digit - '0');
-    if (digit >= 'a' && digit <= 'f') return static_cast<uint8_t>(digit - 'a' + 10);
-    return 0;
-}
-
 void read_checksum(const char* text) {
     const std::string_view digits = scan_word(text, 59);
-    config_checksum checksum;
-    if (digits.size() != 2 * checksum.size()) return;
-    for (size_t i = 0; i < checksum.size(); ++i) {
-        checksum[i] = static_cast<uint8_t>(value_of_hex_digit(digits[2 * i]) << 4U |
-                                           value_of_hex_digit(digits[2 * i + 1]));
-    }
-    set_config_checksum(checksum);
+    const std::optional<config_checksum> checksum = parse_checksum(digits);
+    if (!checksum) return;
+    set_config_checksum(*checksum);
     get_header_record().config_checksum.set(digits);
 }
 
-void write_checksum(FILE* file) { fputs(get_config_checksum_text().get(), file); }
+void write_checksum(FILE* file) { fputs(text_of_checksum(checksum_in_force).data(), file); }
 
 void read_last_flush(const char* text) {
     const auto time_ms = scan_number(text);
@@ -199,16 +190,5 @@ void set_data_collection(bool enabled) { data_collection = enabled; }
 config_checksum get_config_checksum() { return checksum_in_force; }
 
 void set_config_checksum(const config_checksum& checksum) { checksum_in_force = checksum; }
-
-limited_text<40> get_config_checksum_text() {
-    constexpr char digits[] = "0123456789abcdef";
-    limited_text<40> text;
-    char* out = text.data();
-    for (const uint8_t byte : checksum_in_force) {
-        *out++ = digits[byte >> 4U];
-        *out++ = digits[byte & 0xFU];
-    }
-    return text;
-}
 
 }  // namespace kivd

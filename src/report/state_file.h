@@ -2,15 +2,11 @@
 // of them live here; the others belong to the header record, the limits and the error facility.
 #pragma once
 
-#include <array>
 #include <cstdint>
 
-#include "record/header_record.h"
+#include "format/config_file.h"
 
 namespace kivd {
-
-// SHA-1 of the configuration package in force; all zero before any arrived.
-using config_checksum = std::array<uint8_t, 20>;
 
 // Reads the file into the values that it has lines for. A missing file is fine; another failure to
 // open it has been logged and raised.
@@ -27,9 +23,8 @@ void set_last_flush(int64_t time_ms);
 [[nodiscard]] bool is_data_collection_enabled();
 void set_data_collection(bool enabled);
 
+// Of the configuration in force; all zero before any arrived.
 [[nodiscard]] config_checksum get_config_checksum();
 void set_config_checksum(const config_checksum& checksum);
-// The same as 40 lowercase hexadecimal digits.
-[[nodiscard]] limited_text<40> get_config_checksum_text();
 
 }  // namespace kivd

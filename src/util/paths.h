@@ -26,7 +26,6 @@ inline constexpr char flushed_data[] = "private/flushed_data";
 inline constexpr char compacted_data[] = "private/flushed_data.compacted";
 inline constexpr char encrypted_data[] = "private/flushed_data.encrypted";
 
-inline constexpr char report_prefix[] = "kiv_";                  // and a number, in output_dir
 inline constexpr char config_request_name[] = "config_request";  // in output_dir
 inline constexpr char config_request[] = "output/config_request";
 inline constexpr char disable_marker[] = "output/kiv_disabled";

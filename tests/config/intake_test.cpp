@@ -45,7 +45,7 @@ class intake : public scratch_directory {
         for (const auto& entry : fs::directory_iterator("private")) {
             files[entry.path()] = read_file(entry.path());
         }
-        files["checksum"] = get_config_checksum_text().get();
+        files["checksum"] = text_of_checksum(get_config_checksum()).data();
         return files;
     }
 };
@@ -150,7 +150,7 @@ TEST_F(intake, the_request_names_the_device_and_the_configuration) {
                     .ends_with(doc_example("report-format.md", "hex", "config-request-end")));
     write_file("config", file);
     const std::string digits = openssl("dgst -sha1 -r config").substr(0, 40);
-    EXPECT_EQ(get_config_checksum_text().get(), digits);
+    EXPECT_EQ(text_of_checksum(get_config_checksum()).data(), digits);
     EXPECT_NE(read_file("private/kivd.state").find("config-checksum: " + digits + "\n"),
               std::string::npos);
 

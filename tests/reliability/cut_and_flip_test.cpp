@@ -16,6 +16,7 @@
 #include "diag/diag_store.h"
 #include "diag/file_export.h"
 #include "intake/intake.h"
+#include "record/header_record.h"
 #include "record/record_file.h"
 #include "report/header_sources.h"
 #include "report/state_file.h"
@@ -308,7 +309,7 @@ decisions in_force() {
     for (const auto& entry : fs::directory_iterator(paths::private_dir)) {
         all[entry.path()] = read_file(entry.path());
     }
-    all["checksum"] = get_config_checksum_text().get();
+    all["checksum"] = text_of_checksum(get_config_checksum()).data();
     all["limits"] = std::to_string(get_limits().max_report_size);
     all["part"] = part({"app", "old", ""});
     return all;

@@ -1,4 +1,5 @@
 #include "report/state_file.h"
+#include "record/header_record.h"
 
 #include "config/limits.h"
 #include "support/scratch_directory.h"

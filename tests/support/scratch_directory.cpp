@@ -1,4 +1,5 @@
 #include "support/scratch_directory.h"
+#include "record/header_record.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>

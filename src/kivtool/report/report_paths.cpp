@@ -6,6 +6,7 @@
 #include <charconv>
 #include <cstring>
 
+#include "format/report_name.h"
 #include "util/directory.h"
 #include "util/paths.h"
 
@@ -13,9 +14,9 @@ namespace kivd {
 namespace {
 
 // 0 when it is no report's name: those have no sign and no zeros before the number.
-int64_t report_number(std::string_view name) {
-    if (!name.starts_with(paths::report_prefix)) return 0;
-    name.remove_prefix(strlen(paths::report_prefix));
+int64_t report_number_of(std::string_view name) {
+    if (!name.starts_with(report_prefix)) return 0;
+    name.remove_prefix(strlen(report_prefix));
     if (name.starts_with('-') || name.starts_with('0')) return 0;
     int64_t number = 0;
     const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), number);
@@ -30,7 +31,7 @@ report_paths::report_paths(const std::string& path) : path_(path) {
     if (!is_directory_) return;
     if (!path_.ends_with('/')) path_ += '/';
     const bool is_whole = for_each_entry(path_.c_str(), [this](std::string_view name) {
-        if (const int64_t number = report_number(name)) numbers_.push_back(number);
+        if (const int64_t number = report_number_of(name)) numbers_.push_back(number);
     });
     if (!is_whole) {
         problem_ = std::string("cannot be read: ") + strerror(errno);
@@ -42,7 +43,7 @@ report_paths::report_paths(const std::string& path) : path_(path) {
 
 std::string report_paths::path(size_t index) const {
     if (!is_directory_) return path_;
-    return path_ + paths::report_prefix + std::to_string(numbers_[index]);
+    return path_ + report_prefix + std::to_string(numbers_[index]);
 }
 
 }  // namespace kivd
