@@ -19,6 +19,7 @@
 #include <string_view>
 
 #include "daemon/kernel/process_kill.h"
+#include "format/request_words.h"
 #include "platform/android_log.h"
 #include "runtime/log_and_raise.h"
 #include "runtime/stop.h"
@@ -28,7 +29,6 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivkb";
-constexpr size_t max_record_size = 30720;
 constexpr suseconds_t send_timeout_us = 50000;  // then it looks whether the daemon is to stop
 
 constinit pthread_t thread = {};
@@ -84,7 +84,7 @@ void pass_event(const daemon_socket& daemon, std::span<char> message, size_t pos
     }
     const size_t start = std::min(position + 1, text.size());
     const std::span<char> record = message.subspan(start);
-    if (record.size() > max_record_size) {
+    if (record.size() > max_payload_size) {
         log_and_raise(tag, "Too large event - dropping.");
         return;
     }

@@ -4,9 +4,10 @@
 #include <array>
 #include <cstddef>
 
+#include "format/request_words.h"
+
 namespace kivd {
 
-inline constexpr size_t max_packet_size = 31176;  // the largest request, on each kind of socket
 inline constexpr size_t receive_size = max_packet_size + 1;  // shows that a packet is larger
 inline constexpr size_t max_reply_size = 63;                 // with its NUL, at most 64 bytes
 inline constexpr size_t max_batch = 16;

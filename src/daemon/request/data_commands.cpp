@@ -3,6 +3,7 @@
 #include "config/config_parts.h"
 #include "config/filters.h"
 #include "diag/diag_store.h"
+#include "format/request_words.h"
 #include "report/report_generation.h"
 #include "runtime/log_and_raise.h"
 #include "store/counters.h"
@@ -15,7 +16,6 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd";
-constexpr size_t max_payload_size = 30720;
 
 void update_counter(request& r, const char* command, counter_mode mode) {
     probe_id probe = {};

@@ -3,18 +3,15 @@
 #include <cstring>
 #include <utility>
 
+#include "format/request_words.h"
 #include "runtime/log_and_raise.h"
 
 namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd";
-constexpr size_t max_probe_id_size = 256;  // package and name together
 
 const char* or_null(const char* text) { return text != nullptr ? text : "null"; }
-
-// A loop of our own: strcspn would build a table of its set for every token.
-bool is_delimiter(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
 
 }  // namespace
 
@@ -23,14 +20,11 @@ request make_request(int fd, std::span<char> packet, const msghdr* message) {
 }
 
 const char* next_token(request& r) {
-    char* token = r.rest;
-    while (is_delimiter(*token)) ++token;
-    char* end = token;
-    while (*end != '\0' && !is_delimiter(*end)) ++end;
-    r.token_end = end;
-    r.rest = *end == '\0' ? end : end + 1;
-    *end = '\0';
-    return end > token ? token : nullptr;
+    const request_word word = find_word(r.rest);
+    r.token_end = r.rest + (word.end - r.rest);
+    r.rest = *word.end == '\0' ? r.token_end : r.token_end + 1;
+    *r.token_end = '\0';
+    return word.empty() ? nullptr : word.start;
 }
 
 std::span<const char> raw_rest(const request& r) {
