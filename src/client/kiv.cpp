@@ -1,4 +1,5 @@
-// What kiv.h declares is all that the shared library shows.
+// What kiv.h declares is all that the shared library shows. That is said here, so that the header
+// has nothing of one compiler in it.
 #pragma GCC visibility push(default)
 #include "kiv.h"
 #pragma GCC visibility pop

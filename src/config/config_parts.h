@@ -12,7 +12,8 @@
 
 namespace kivd {
 
-// Loads private/config_list.txt; a missing file is fine.
+// Loads private/config_list.txt; a missing file is fine. Parts that share an id or a name, as a
+// damaged list may have them, are dropped, since nobody knows whose payload it is.
 void load_config_list();
 void release_config_list();
 
@@ -32,8 +33,9 @@ template <auto unpack, auto free_unpacked>
 }
 
 // The steps of taking a new configuration: nothing is in force, then each of the new parts is put
-// in force, the list is saved, and the files of all others go. A part that cannot be stored is left
-// out; what failed has been logged and raised, but for a file that could not be created.
+// in force, the list is saved, and the files of all others go. A part that cannot be stored or has
+// the reserved name kivd:_last_id is left out; what failed has been logged and raised, but for a
+// file that could not be created.
 void retire_config_parts();
 void store_config_part(const char* package, const char* name, std::span<const uint8_t> payload);
 [[nodiscard]] bool save_config_list();

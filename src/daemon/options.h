@@ -10,8 +10,9 @@ struct options {
 };
 
 // Reads the command line into the modules that it concerns and gives the rest. Ends the process
-// when help is asked for, a certificate path does not exist, or a file is to be verified or sealed;
-// what it does not know is ignored.
+// when help is asked for, a certificate path does not exist, or a file is to be verified or sealed
+// (errors then go to the daemon of the base directory, if one runs). Unknown options are reported
+// on standard error and ignored.
 [[nodiscard]] options parse_options(int argc, char** argv);
 
 }  // namespace kivd

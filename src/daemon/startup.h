@@ -1,4 +1,5 @@
-// Starting and stopping the daemon, each step in its order.
+// Starting and stopping the daemon, each step in its order. Everything is found from the working
+// directory, the daemon's own sockets too, so that may be relative or long.
 #pragma once
 
 namespace kivd {

@@ -119,8 +119,8 @@ unique_fd open_write_file() {
     __android_log_print(ANDROID_LOG_INFO, tag, "Max file size reached, opening new file");
     const int32_t next = make_room(numbers);
     current = open_current(next);
-    // Not before the next file is there: were the compressed one the last, its number would be
-    // given out again, and it would hide the plain file of that number and then be replaced by it.
+    // The next file has to exist first: if we compressed before, a crash would reuse the number,
+    // and the new file would replace the compressed one.
     if (current.ok() && next > numbers.highest) start_compressor(numbers.highest);
     return current;
 }

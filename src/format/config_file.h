@@ -15,8 +15,9 @@
 
 namespace kivd {
 
-inline constexpr size_t max_config_file_size = 204799;        // bytes
-inline constexpr size_t max_config_package_size = 8U << 20U;  // bytes, decompressed
+inline constexpr size_t max_config_file_size = 204799;  // bytes
+// Decompressed, in bytes: the largest file might hold hundreds of MiB.
+inline constexpr size_t max_config_package_size = 8U << 20U;
 
 inline constexpr uint8_t config_signature_key = 0x0A;
 inline constexpr uint8_t config_package_key = 0x12;

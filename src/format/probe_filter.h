@@ -14,7 +14,9 @@ namespace kivd {
 
 // Items that are equal to each other clash: a filter can't hold both. Copies as many of the first
 // `items` as go together to `sorted`, which has as many places, in the order of compare_probes.
-// Gives their number: the item behind them, if there is one, clashes with one of them.
+// Gives their number: the item behind them, if there is one, clashes with one of them. There may be
+// a great many, so they are sorted rather than inserted one by one: items that clash are
+// neighbours.
 [[nodiscard]] size_t sort_compatible(std::span<const probe_key> items, std::span<probe_key> sorted);
 
 }  // namespace kivd

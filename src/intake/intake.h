@@ -15,7 +15,8 @@ void install_first_configuration();
 
 // Takes input/config and has everything follow it: settings, report header, filters, actions. False
 // when there is none, or when it was refused, which has been logged and raised; what was in force
-// then stays so. input/ is empty afterwards.
+// then stays so. input/ is empty afterwards, but for directories: nothing is deleted recursively.
+// Others write there, so input/config may be anything: a pipe counts as empty, a directory as none.
 bool take_new_configuration();
 
 }  // namespace kivd

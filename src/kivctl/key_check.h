@@ -22,9 +22,9 @@ enum class key_verdict : uint8_t {
 
 enum class key_use : uint8_t { seal_reports, verify_configurations };
 
-// Looks at the file as the daemon would: with the rights of `user`, and in the file system that the
-// process `pid` sees. Without a user, and for a user whose rights this process cannot have, the
-// answer is what is true for everybody, or unknown. The path is absolute.
+// Looks at the file as the daemon would: by a child with the rights of `user`, in the file system
+// that the process `pid` sees. Without a user, and for a user whose rights this process cannot
+// have, the answer is what is true for everybody, or unknown. The path is absolute.
 [[nodiscard]] key_verdict check_key(const std::string& path, key_use use,
                                     const std::optional<user_ids>& user, std::optional<pid_t> pid);
 

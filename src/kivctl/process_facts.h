@@ -1,4 +1,6 @@
-// The process that serves a working directory, as its lock file and /proc show it to anybody.
+// The process that serves a working directory, as its lock file and /proc show it to anybody. Who
+// holds the lock is read from /proc/locks: to try the lock could keep a daemon that is just
+// starting from having it.
 #pragma once
 
 #include <sys/types.h>

@@ -1,5 +1,7 @@
-// The Android log call on plain Linux: one line a message on standard error or, once the daemon has
-// detached, in the system log.
+// The Android log call on plain Linux: one line a message, on standard error in the layout of
+// `logcat -v threadtime` (but with tags as they are, not padded) or, once the daemon has detached,
+// in the system log. There syslog() would wait for a receiver that stopped reading, so lines go by
+// a datagram that doesn't. Control characters become blanks, so no client can forge a line.
 #pragma once
 
 #include <cstdint>
@@ -10,8 +12,8 @@ inline constexpr int ANDROID_LOG_INFO = 4;
 inline constexpr int ANDROID_LOG_WARN = 5;
 inline constexpr int ANDROID_LOG_ERROR = 6;
 
-// Writes one message. It never ends the daemon and hardly delays it: while nobody takes the lines
-// off they are dropped, and counted in the first line that gets through again.
+// Writes one message. It never ends the daemon and hardly delays it: while nobody reads them,
+// lines are dropped, and counted in the first one that gets through again.
 [[gnu::format(printf, 3, 4)]] int __android_log_print(int priority, const char* tag,
                                                       const char* format, ...);
 

@@ -44,7 +44,8 @@ struct group_id_list {
     size_t count = 0;
 };
 
-// "unknown" stands for a value that is not known, but for the IMEI and checksum: there it is empty.
+// "unknown" stands for a value that is not known, except that the IMEI and checksum are then empty.
+// Nothing in it is allocated, so filling it cannot fail.
 struct header_record {
     limited_text<63> product_id;
     limited_text<63> software_version;

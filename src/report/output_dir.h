@@ -16,8 +16,8 @@ inline constexpr uint64_t free_inodes_min = 8;
     return 2 * (max_report_size + overhead);
 }
 
-// The size that all files together stay below. Wraps in 32 bits when the limits are the wrong way
-// round: then only free space counts.
+// The size that all entries together stay below, each counted by its own size, directories and
+// links too. Wraps in 32 bits when the limits are the wrong way round: then only free space counts.
 [[nodiscard]] constexpr uint32_t output_size_budget(uint32_t max_output_dir_size,
                                                     uint32_t max_report_size) {
     return max_output_dir_size - max_report_size;
@@ -34,7 +34,7 @@ struct report_path {
     char text[64];
 };
 
-// The number of the report that follows the highest one.
+// The number of the report that follows the highest one; after 2147483647, the lowest that is free.
 [[nodiscard]] int64_t next_report_number(int32_t highest);
 
 // Deletes the report with that number, or with 0 every file but the configuration request.

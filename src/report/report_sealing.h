@@ -4,7 +4,8 @@
 
 namespace kivd {
 
-// Replaces the compacted data by its sealed form. A failure has been logged and raised.
+// Replaces the compacted data by its sealed form. After a failure, logged and raised, the data is
+// as it was: a report is sealed whole or not at all.
 [[nodiscard]] bool seal_compacted_data();
 
 }  // namespace kivd

@@ -8,8 +8,8 @@
 
 namespace kivd {
 
-// Reads the file into the values that it has lines for. A missing file is fine; another failure to
-// open it has been logged and raised.
+// Reads the file into the values that it has lines for; a line without a value changes nothing. A
+// missing file is fine; another failure to open it has been logged and raised.
 void state_load();
 
 // Replaces the file. Failures have been logged and raised; the old file is then still there.

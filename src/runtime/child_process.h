@@ -20,8 +20,10 @@ enum class child_kind : uint8_t {
     program,  // calls exec_program; no signal reaches it before that has succeeded
 };
 
-// fork(). The child may log and raise errors, and has lost every descriptor but 0 to 2 and the
-// inherited one; it has to end with _exit.
+// fork(), while no other thread is inside the log or the error facility, so the child may log and
+// raise errors. It has lost every descriptor but 0 to 2 and the inherited one (close_range, Linux
+// 5.9), so a client that hangs up is gone at once, whatever a child is doing. It has to end with
+// _exit.
 [[nodiscard]] pid_t fork_child(child_kind kind);
 
 // In such a child: becomes the program `arguments` begins with, which starts with default signal

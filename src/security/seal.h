@@ -30,8 +30,8 @@ struct sealing {
     }
 };
 
-// Starts one encryption with the report key. Nothing when no RSA key of up to 4096 bits could be
-// had, which has been logged and raised, or when the library failed.
+// Starts one encryption with the report key. Nothing when there is no RSA key of up to 4096 bits
+// and of whole bytes, which has been logged and raised, or when the library failed.
 [[nodiscard]] std::optional<sealing> start_sealing();
 
 // The size of the ciphertext of `size` bytes: padding adds 1 to 16.

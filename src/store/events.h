@@ -18,8 +18,8 @@ enum class event_file : bool {
 [[nodiscard]] event_file events_add(const char* package, const char* name,
                                     std::span<const char> payload);
 
-// Makes sure that private/events is open and begins with a header. Failures have been logged and
-// raised.
+// Makes sure that private/events is open and begins with a header; a new file whose header cannot
+// be written whole is removed. Failures have been logged and raised.
 void events_open();
 
 // Moves the event file, which is made if there is none, to private/flushed_data. False, with errno

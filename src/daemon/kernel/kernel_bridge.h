@@ -1,5 +1,9 @@
 // The kernel bridge: a thread that receives what the kernel reports over netlink and sends it on,
 // as ordinary requests, to the socket on which the daemon listens by default. It touches no store.
+//
+// Every local user can send to its netlink port, and to the daemon the bridge has the daemon's own
+// user id. So it passes on counters and events that it has translated itself, and nothing else. The
+// sockets stay open when it ends, so that nobody else takes the port.
 #pragma once
 
 #include <sys/un.h>
@@ -22,9 +26,9 @@ struct daemon_socket {
 [[nodiscard]] bool open_netlink_socket(unique_fd& netlink);
 [[nodiscard]] bool send_pid_to_kernel(int netlink);
 
-// Receives one message, waiting for it until the daemon is to stop, and sends on what it says. What
-// is wrong with it has been logged and raised, and so has a lack of memory for it, when it is still
-// there.
+// Receives one message, waiting for it until the daemon is to stop, and sends on what it says, for
+// which it waits while the daemon's queue is full. What is wrong with it has been logged and
+// raised, and so has a lack of memory for it, when it is still there.
 void receive_kernel_message(int netlink, daemon_socket& daemon);
 
 // The body of the thread: ends when the set-up fails or the daemon is to stop.

@@ -5,7 +5,9 @@
 
 namespace kivd {
 
-// Callbacks of the two listening sockets: accept one client and add it to the event loop.
+// Callbacks of the two listening sockets: accept one client and add it to the event loop. The last
+// 16 descriptors (a quarter if fewer than 64 are allowed) are kept for reports and saves: a client
+// that would get one is hung up on, which is logged and raised.
 void accept_seq_client(event_handler& handler);
 void accept_stream_client(event_handler& handler);
 

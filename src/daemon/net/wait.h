@@ -19,7 +19,9 @@ class stall_guard {
     stall_guard& operator=(const stall_guard&) = delete;
 };
 
-// Refuses descriptors on the socket, or else switches the stall guards on.
+// Has the kernel refuse descriptors that clients attach (SO_PASSRIGHTS, Linux 6.16), or else
+// switches the stall guards on: receives leave no room for descriptors, so the kernel drops them,
+// but that can be made to block.
 void refuse_descriptors(int fd);
 
 }  // namespace kivd
