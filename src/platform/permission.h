@@ -10,4 +10,7 @@ namespace kivd {
 // up once for each user, in the local group and user files only, and then kept.
 [[nodiscard]] bool check_permission(const char* permission, pid_t pid, uid_t uid);
 
+// Looks every answer up anew.
+void forget_permissions();
+
 }  // namespace kivd

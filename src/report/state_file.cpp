@@ -179,6 +179,12 @@ void state_save() {
     }
 }
 
+void state_release() {
+    last_flush = 0;
+    data_collection = false;
+    checksum_in_force = {};
+}
+
 int64_t get_last_flush() { return last_flush; }
 
 void set_last_flush(int64_t time_ms) { last_flush = time_ms; }

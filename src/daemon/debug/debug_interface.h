@@ -10,6 +10,9 @@ namespace kivd {
 // Listens on port 2305 of every interface. Ends the process when that fails.
 void debug_start();
 
+// Stops listening and hangs up.
+void debug_release();
+
 // Sends the packet to the client, if there is one.
 void debug_mirror_request(std::span<const char> packet);
 
