@@ -3,7 +3,6 @@
 
 #include "daemon/modules.h"
 #include "fuzz/harness.h"
-#include "record/header_record.h"
 #include "util/paths.h"
 
 namespace kivd {
@@ -12,7 +11,6 @@ namespace {
 // The file as the next stop would leave it, but for the line that tells the time.
 std::string load_and_save() {
     release_modules();
-    init_header(get_header_record());
     state_load();
     state_save();
     std::string saved = read_file(paths::state);

@@ -30,7 +30,6 @@ bool start_modules() {
     rescue_event_file(paths::events, record_header::expected);
     counters_init();
     static_data_init();
-    init_header(get_header_record());
     state_load();
     (void)prune_dir();
     ensure_device_id();
@@ -52,7 +51,7 @@ void release_modules() {
     release_header();
     release_filters();
     release_config_list();
-    init_settings();
+    limits_release();
     clear_report_key_path();
     clear_config_key_path();
     forget_permissions();

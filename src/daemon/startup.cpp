@@ -11,7 +11,6 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "config/limits.h"
 #include "daemon/debug/debug_interface.h"
 #include "daemon/kernel/kernel_bridge.h"
 #include "daemon/loop/event_loop.h"
@@ -187,7 +186,6 @@ void shut_down() {
 
 int run_daemon(int argc, char** argv) {
     open_standard_descriptors();
-    init_settings();
     set_default_key_paths();
     const options given = parse_options(argc, argv);
     install_signal_handlers();
