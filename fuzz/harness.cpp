@@ -16,16 +16,10 @@
 #include <fstream>
 #include <sstream>
 
-#include "config/config_parts.h"
-#include "config/filters.h"
-#include "config/limits.h"
+#include "daemon/modules.h"
 #include "diag/diag_store.h"
-#include "record/header_record.h"
 #include "report/state_file.h"
 #include "runtime/daemon_error.h"
-#include "store/counters.h"
-#include "store/events.h"
-#include "store/static_data.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -103,32 +97,20 @@ std::string read_file(const char* path) {
 
 bool exists(const char* path) { return access(path, F_OK) == 0; }
 
-void reset_state() {
-    init_settings();
-    init_header(get_header_record());
-    set_last_flush(0);
-    set_data_collection(true);
-    set_config_checksum({});
+void suppress_errors() {
     set_error_nr(INT_MAX);
     set_error_time(time(nullptr));
 }
 
 started_modules::started_modules() : open_descriptors_(count_open_descriptors()) {
-    reset_state();
-    counters_init();
-    static_data_init();
-    pack_report_header();
-    load_config_list();
-    (void)load_filters();
+    suppress_errors();
+    start_modules();
+    suppress_errors();  // whatever a state file says
+    set_data_collection(true);
 }
 
 started_modules::~started_modules() {
-    counters_release();
-    static_data_release();
-    release_header();
-    release_filters();
-    release_config_list();
-    if (events_pending()) (void)events_flush();  // which closes the file
+    release_modules();
     require(count_open_descriptors() == open_descriptors_, "a descriptor stays open");
 }
 
@@ -136,6 +118,5 @@ started_modules::~started_modules() {
 
 int LLVMFuzzerInitialize(int* /*argc*/, char*** /*argv*/) {
     kivd::enter_scratch_directory();
-    kivd::daemon_error_init(kivd::paths::working_dir);  // where no socket is
     return 0;
 }

@@ -32,12 +32,12 @@ void write_file(const char* path, input_bytes bytes);
 [[nodiscard]] std::string read_file(const char* path);  // empty when it is missing
 [[nodiscard]] bool exists(const char* path);
 
-// Puts the values that the state file keeps back to those of a first start, but for collection,
-// which is on, and the flood guard, which lets no error through: each would cost a connection.
-void reset_state();
+// From now on the flood guard lets no daemon error through: each would cost a connection.
+void suppress_errors();
 
-// The daemon's modules as after a start on the files that are there. In the end they are released,
-// and as many descriptors have to be open as before.
+// The daemon's modules as after a start on the files that are there, but for collection, which is
+// on, and daemon errors, of which none is sent. In the end they are released, and as many
+// descriptors have to be open as before.
 class started_modules {
  public:
     started_modules();

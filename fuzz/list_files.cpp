@@ -68,12 +68,14 @@ bool is_in_order(std::string_view file) {
 }
 
 std::string load_and_save(const list_kind& kind) {
+    enable_test_mode();
     const started_modules modules;
     kind.save();
     return read_file(kind.path);
 }
 
 bool load_and_match() {
+    enable_test_mode();
     const started_modules modules;
     (void)filter_match(filter_kind::events, "", "");
     return filter_match(filter_kind::events, "shop", "order");
@@ -84,7 +86,6 @@ bool load_and_match() {
 
 int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using namespace kivd;
-    enable_test_mode();
     input_bytes input = {data, size};
     const auto* const kind = std::ranges::find(kinds, take_choice(input), &list_kind::choice);
     if (kind == std::end(kinds)) return -1;

@@ -1,6 +1,7 @@
 // The state file: what is read from it, whatever it holds, survives being saved and read again.
 #include "report/state_file.h"
 
+#include "daemon/modules.h"
 #include "fuzz/harness.h"
 #include "util/paths.h"
 
@@ -9,7 +10,7 @@ namespace {
 
 // The file as the next stop would leave it, but for the line that tells the time.
 std::string load_and_save() {
-    reset_state();
+    release_modules();
     state_load();
     state_save();
     std::string saved = read_file(paths::state);

@@ -13,7 +13,7 @@ import re
 import sys
 
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"', re.MULTILINE)
-SUFFIXES = {".h", ".c", ".cc", ".cpp"}
+SUFFIXES = {".h", ".def", ".c", ".cc", ".cpp"}
 
 
 def read_modules(root):

@@ -152,7 +152,10 @@ bool load_filters() {
 }
 
 void release_filters() {
-    for (filter& each : filters) each.list.clear();
+    for (filter& each : filters) {
+        each.list.clear();
+        each.type = exclude_type;
+    }
 }
 
 void apply_filter_config() {

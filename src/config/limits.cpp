@@ -5,17 +5,16 @@
 namespace kivd {
 namespace {
 
-constexpr limits defaults = {
-    default_max_report_size, default_max_output_dir_size, default_expire_age,
-    default_expire_age,      default_expire_age,          default_expire_age,
-};
-constinit limits in_force = defaults;
+constinit limits in_force;
+constinit limits base;
 
 }  // namespace
 
-void init_settings() { in_force = defaults; }
-
 limits& get_limits() { return in_force; }
+
+limits& get_base_limits() { return base; }
+
+void limits_release() { in_force = base = default_limits; }
 
 int64_t expiry_cutoff_ms(uint32_t age_seconds) {
     return age_seconds == 0 ? 0 : now_ms() - int64_t{1000} * age_seconds;

@@ -6,24 +6,23 @@
 
 namespace kivd {
 
-inline constexpr uint32_t default_max_report_size = 409600;       // bytes
-inline constexpr uint32_t default_max_output_dir_size = 5242880;  // bytes
-inline constexpr uint32_t default_expire_age = 2592000;           // seconds; 30 days
-
+// The built-in defaults.
 struct limits {
-    uint32_t max_report_size;      // bytes; the event file that reaches it becomes a report
-    uint32_t max_output_dir_size;  // bytes
-    uint32_t expire_counters_age;  // seconds since the last update; 0 = no expiry
-    uint32_t expire_sdata_age;     // seconds since the value was last set; 0 = no expiry
-    // What the command line gave, and what a configuration without ages returns to.
-    uint32_t base_expire_counters_age;
-    uint32_t base_expire_sdata_age;
+    uint32_t max_report_size = 409600;       // bytes; the event file that reaches it is reported
+    uint32_t max_output_dir_size = 5242880;  // bytes
+    uint32_t expire_counters_age = 2592000;  // seconds since the last update; 0: no expiry
+    uint32_t expire_sdata_age = 2592000;     // seconds since the value was last set; 0: no expiry
 };
 
-// The built-in defaults.
-void init_settings();
+inline constexpr limits default_limits;
 
 [[nodiscard]] limits& get_limits();
+
+// What the command line gave: a configuration without a limit returns to these.
+[[nodiscard]] limits& get_base_limits();
+
+// Both back to the built-in defaults.
+void limits_release();
 
 // The time at or before which something of that age (in seconds) has expired, in milliseconds; 0
 // when nothing expires.

@@ -51,9 +51,9 @@ constexpr char usage[] =
 
 void set_expire_age(const char* seconds) {
     const auto age = static_cast<uint32_t>(parse_saturated(seconds));
-    limits& values = get_limits();
-    values.expire_counters_age = values.base_expire_counters_age = age;
-    values.expire_sdata_age = values.base_expire_sdata_age = age;
+    limits& base = get_base_limits();
+    base.expire_counters_age = base.expire_sdata_age = age;
+    get_limits() = base;
 }
 
 void set_certificate_path(const char* path) {

@@ -11,13 +11,11 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "config/config_parts.h"
-#include "config/filters.h"
-#include "config/limits.h"
 #include "daemon/debug/debug_interface.h"
 #include "daemon/kernel/kernel_bridge.h"
 #include "daemon/loop/event_loop.h"
 #include "daemon/loop/save_clock.h"
+#include "daemon/modules.h"
 #include "daemon/net/client_sockets.h"
 #include "daemon/options.h"
 #include "diag/diag_store.h"
@@ -25,14 +23,9 @@
 #include "intake/intake.h"
 #include "intake/run_actions.h"
 #include "platform/android_log.h"
-#include "record/header_record.h"
-#include "record/record_file.h"
-#include "report/identity.h"
-#include "report/output_dir.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
 #include "runtime/child_process.h"
-#include "runtime/daemon_error.h"
 #include "runtime/give_up.h"
 #include "runtime/stop.h"
 #include "security/key_paths.h"
@@ -172,30 +165,6 @@ void enter_working_directory(const options& given) {
     if (!stop_init()) give_up(tag, "Failed to create stop event: %s", strerror(errno));
 }
 
-void load_everything() {
-    daemon_error_init(paths::working_dir);
-    rescue_event_file(paths::events, record_header::expected);
-    counters_init();
-    static_data_init();
-    init_header(get_header_record());
-    state_load();
-    (void)prune_dir();
-    ensure_device_id();
-    update_header_info();
-    write_config_request();
-    load_config_list();
-    if (!load_filters() && !is_test_mode()) install_first_configuration();
-    (void)take_new_configuration();
-}
-
-void release_all() {
-    counters_release();
-    static_data_release();
-    release_header();
-    release_filters();
-    release_config_list();
-}
-
 void shut_down() {
     join_kernel_bridge();
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting down...");
@@ -206,8 +175,10 @@ void shut_down() {
     diag_wait_for_compressor();
     // The lock file goes last: as soon as it is gone a new daemon may make sockets of its own.
     remove_client_sockets();
+    debug_release();
+    event_loop_release();
     (void)unlink(paths::lock_file);
-    release_all();
+    release_modules();
     __android_log_print(ANDROID_LOG_INFO, tag, "Exiting.");
 }
 
@@ -215,7 +186,6 @@ void shut_down() {
 
 int run_daemon(int argc, char** argv) {
     open_standard_descriptors();
-    init_settings();
     set_default_key_paths();
     const options given = parse_options(argc, argv);
     install_signal_handlers();
@@ -224,7 +194,10 @@ int run_daemon(int argc, char** argv) {
 
     __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
     create_directories();
-    load_everything();
+    const bool has_filter = start_modules();
+    write_config_request();
+    if (!has_filter && !is_test_mode()) install_first_configuration();
+    (void)take_new_configuration();
 
     if (!event_loop_init()) exit(1);
     create_client_sockets();

@@ -92,4 +92,6 @@ int32_t next_diag_file(int32_t number) {
     return static_cast<int32_t>(std::max(next, int64_t{exported.lowest}));
 }
 
+void diag_files_release() { exported = {}; }
+
 }  // namespace kivd

@@ -38,4 +38,7 @@ void delete_all_diag_entries();
 // there.
 [[nodiscard]] int32_t next_diag_file(int32_t number);
 
+// Forgets what next_diag_file last found.
+void diag_files_release();
+
 }  // namespace kivd

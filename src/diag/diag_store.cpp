@@ -171,4 +171,10 @@ uint32_t diag_space_reserve() { return active != 0 ? diag_reserved_space : 0; }
 
 void diag_wait_for_compressor() { wait_for_child(compressor_pid); }
 
+void diag_release() {
+    diag_wait_for_compressor();
+    active = 0;
+    diag_files_release();
+}
+
 }  // namespace kivd

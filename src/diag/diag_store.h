@@ -28,4 +28,7 @@ void diag_add_event(const char* package, const char* name, std::span<const char>
 // Waits until no compressor runs.
 void diag_wait_for_compressor();
 
+// Waits like that; the store is then inactive, and its files stay.
+void diag_release();
+
 }  // namespace kivd

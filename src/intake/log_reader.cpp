@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <utility>
 
 #include "runtime/child_process.h"
 #include "runtime/log_and_raise.h"
@@ -54,6 +55,10 @@ void stop_log_reader() {
     pollfd awaited[] = {{reader.get(), POLLIN, 0}, {stop_event_fd(), POLLIN, 0}};
     while (poll(awaited, 2, -1) < 0 && errno == EINTR) {
     }
+}
+
+void log_reader_release() {
+    if (log_reader_fd >= 0) (void)close(std::exchange(log_reader_fd, -1));
 }
 
 }  // namespace kivd

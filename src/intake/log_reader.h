@@ -11,4 +11,7 @@ void start_log_reader();
 // the daemon is to stop.
 void stop_log_reader();
 
+// Lets go of it without stopping it.
+void log_reader_release();
+
 }  // namespace kivd

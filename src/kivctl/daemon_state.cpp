@@ -67,8 +67,8 @@ std::optional<saved_state> read_saved_state() {
     if (!file || fstat(fileno(file.get()), &status) != 0) return std::nullopt;
     saved_state state;
     state.saved_at = status.st_mtime;
-    state.max_report_size = default_max_report_size;
-    state.max_output_dir_size = default_max_output_dir_size;
+    state.max_report_size = default_limits.max_report_size;
+    state.max_output_dir_size = default_limits.max_output_dir_size;
     char line[line_size];
     while (fgets(line, sizeof line, file.get()) != nullptr) read_state_line(line, state);
     return ferror(file.get()) == 0 ? std::optional(state) : std::nullopt;

@@ -4,8 +4,8 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
-#include <iterator>
 
+#include "format/request_table.h"
 #include "toolkit/text_escape.h"
 
 namespace kivd {
@@ -16,40 +16,6 @@ using std::string_view;
 constexpr string_view delimiters = " \t\r\n";
 constexpr size_t text_characters = 120;  // what is shown at most, of any part of a packet
 constexpr size_t hex_bytes = 32;
-
-enum class target : uint8_t { probe, none };
-enum class rest : uint8_t { words, text, bytes };
-
-struct layout {
-    string_view command;
-    target names;
-    rest carries;
-};
-// clang-format off
-constexpr layout layouts[] = {
-    {"EV", target::probe, rest::bytes},
-    {"CS", target::probe, rest::words},
-    {"CI", target::probe, rest::words},
-    {"SD", target::probe, rest::text},
-    {"PA", target::probe, rest::words},
-    {"GC", target::probe, rest::words},
-    {"IA", target::none,  rest::words},
-    {"FL", target::none,  rest::words},
-    {"FS", target::none,  rest::words},
-    {"NC", target::none,  rest::words},
-    {"WC", target::none,  rest::bytes},
-    {"GD", target::none,  rest::words},
-    {"DC", target::none,  rest::words},
-    {"RM", target::none,  rest::words},
-    {"FN", target::none,  rest::words},
-    {"FG", target::none,  rest::words},
-    {"SN", target::none,  rest::words},
-    {"IM", target::none,  rest::words},
-    {"SG", target::none,  rest::words},
-    {"DG", target::none,  rest::words},
-    {"RG", target::none,  rest::words},
-};
-// clang-format on
 
 string_view until_nul(string_view bytes) { return bytes.substr(0, bytes.find('\0')); }
 
@@ -67,7 +33,7 @@ string_view take_word(string_view& left) {
 
 // A packet as the daemon understands it.
 struct parts {
-    const layout* shape = nullptr;  // null: no known command
+    const request_row* shape = nullptr;  // null: no known command
     string_view package, name;
     string_view left;  // with what ended the last of these; the packet when there is no command
 };
@@ -76,10 +42,9 @@ parts take_apart(string_view packet) {
     parts found;
     found.left = packet;
     const string_view command = take_word(found.left);
-    const auto* const shape = std::ranges::find(layouts, command, &layout::command);
-    if (shape == std::end(layouts)) return {nullptr, {}, {}, packet};
-    found.shape = shape;
-    if (shape->names == target::none) return found;
+    found.shape = find_request(command);
+    if (found.shape == nullptr) return {nullptr, {}, {}, packet};
+    if (found.shape->target == request_target::none) return found;
     found.package = take_word(found.left);
     found.name = take_word(found.left);
     return found;
@@ -117,9 +82,9 @@ std::string with_size(string_view bytes) {
 
 std::string describe_rest(const parts& p) {
     if (p.shape == nullptr) return with_size(p.left);
-    const bool is_binary = p.shape->carries == rest::bytes;
+    const bool is_binary = p.shape->rest == request_rest::bytes;
     string_view left = is_binary ? p.left : until_nul(p.left);
-    if (p.shape->carries == rest::words) {
+    if (p.shape->rest == request_rest::words) {
         return printable(without_blanks_before(left), text_characters);
     }
     left.remove_prefix(std::min<size_t>(1, left.size()));  // one delimiter; more are part of it
@@ -136,7 +101,7 @@ std::string describe_request(string_view packet) {
     const std::string size = std::to_string(packet.size());
     std::string line(size.size() < 5 ? 5 - size.size() : 0, ' ');
     line += size + "  ";
-    line += p.shape == nullptr ? "??" : p.shape->command;
+    line += p.shape == nullptr ? "??" : p.shape->name;
     line += column(printable(p.package, text_characters));
     if (!p.name.empty()) line += ' ' + printable(p.name, text_characters);
     return line + column(describe_rest(p));

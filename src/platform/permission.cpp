@@ -48,6 +48,7 @@ struct answer {
     uid_t uid;
     bool granted;
 };
+constinit std::array<std::optional<answer>, 256> cache = {};
 
 }  // namespace
 
@@ -55,10 +56,11 @@ bool check_permission(const char* permission, pid_t /*pid*/, uid_t uid) {
     if (uid == 0) return true;
     if (strcmp(permission, private_permission) != 0) return false;
 
-    static constinit std::array<std::optional<answer>, 256> cache = {};
     std::optional<answer>& cached = cache[uid % cache.size()];
     if (!cached || cached->uid != uid) cached = answer{uid, is_private_user(uid)};
     return cached->granted;
 }
+
+void forget_permissions() { cache = {}; }
 
 }  // namespace kivd

@@ -11,4 +11,7 @@ namespace kivd {
 // ask the network, and the caller must not wait for that.
 [[nodiscard]] bool check_permission(const char* permission, pid_t pid, uid_t uid);
 
+// Looks every answer up anew.
+void forget_permissions();
+
 }  // namespace kivd

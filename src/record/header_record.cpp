@@ -3,10 +3,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 
-#include "report.pb-c.h"
 #include "runtime/log_and_raise.h"
 #include "util/file_io.h"
+#include "util/text_scan.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
@@ -27,24 +28,23 @@ void release(packed_header& header) {
     header = {};
 }
 
-// The texts that a header always carries, with the places in the message that they go to.
-Kiv__Header message_of(header_record& header, std::span<char*, max_group_ids> group_ids) {
+// Packing reads the texts, although the message could change them.
+char* packed(const char* text) { return const_cast<char*>(text); }
+
+Kiv__Header message_of(const header_record& header, std::span<char*, max_group_ids> group_ids) {
     Kiv__Header message = KIV__HEADER__INIT;
-    message.product_id = header.product_id.data();
-    message.software_version = header.software_version.data();
-    message.software_variant = header.software_variant.data();
-    message.device_id = header.device_id.data();
-    message.build_type = header.build_type.data();
+    for (const header_field& field : header_fields) {
+        message.*field.packed = packed(field.get(header));
+    }
     message.has_family = true;
     message.family = KIV__FAMILY__ANDROID;
-    message.config_checksum = header.config_checksum.data();
-    message.report_uuid = header.report_uuid.data();
+    message.config_checksum = packed(header.config_checksum.get());
+    message.report_uuid = packed("");  // there, but no report has one
     message.has_timezone = true;
     message.timezone = header.timezone;
-    message.cdf_id = header.cdf_id.data();
-    message.serial_number = header.serial_number.data();
-    message.device_imei = header.device_imei.data();
-    for (size_t i = 0; i < header.groups.count; ++i) group_ids[i] = header.groups.ids[i].data();
+    for (size_t i = 0; i < header.groups.count; ++i) {
+        group_ids[i] = packed(header.groups.ids[i].get());
+    }
     message.n_group_id = header.groups.count;
     message.group_id = group_ids.data();
     return message;
@@ -52,15 +52,20 @@ Kiv__Header message_of(header_record& header, std::span<char*, max_group_ids> gr
 
 }  // namespace
 
-void init_header(header_record& header) {
-    header = {};
-    header.product_id.set("unknown");
-    header.software_version.set("unknown");
-    header.software_variant.set("unknown");
-    header.device_id.set("unknown");
-    header.build_type.set("unknown");
-    header.cdf_id.set("unknown");
-    header.serial_number.set("unknown");
+void header_field::set(header_record& header, std::string_view value) const {
+    (header.*text).set(value.substr(0, capacity));
+}
+
+void header_field::set_from_line(header_record& header, const char* line) const {
+    const std::string_view word = scan_word(line, capacity);
+    if (!word.empty()) set(header, word);
+}
+
+const char* header_field::get(const header_record& header) const { return (header.*text).get(); }
+
+bool header_field::is_known(const header_record& header) const {
+    static constexpr header_record initial;
+    return !(header.*text == initial.*text);
 }
 
 header_record& get_header_record() { return record; }
@@ -84,17 +89,9 @@ bool add_group_id(group_id_list& groups, std::string_view id) {
 }
 
 void copy_known_values(header_record& destination, const header_record& source) {
-    const auto copy_known = [](auto& to, const auto& from) {
-        if (from.is_known()) to = from;
-    };
-    copy_known(destination.product_id, source.product_id);
-    copy_known(destination.software_version, source.software_version);
-    copy_known(destination.software_variant, source.software_variant);
-    copy_known(destination.build_type, source.build_type);
-    copy_known(destination.cdf_id, source.cdf_id);
-    copy_known(destination.device_id, source.device_id);
-    copy_known(destination.serial_number, source.serial_number);
-    if (!source.device_imei.empty()) destination.device_imei = source.device_imei;
+    for (const header_field& field : header_fields) {
+        if (field.is_known(source)) destination.*field.text = source.*field.text;
+    }
     destination.config_checksum = source.config_checksum;
     destination.timezone = source.timezone;
 }
@@ -127,10 +124,9 @@ std::span<const uint8_t> get_empty_report_header() {
     static constinit size_t packed_size = 0;
     if (packed_size > 0) return {bytes.data(), packed_size};
 
-    char empty[] = "";
     Kiv__Header header = KIV__HEADER__INIT;
-    header.product_id = header.software_version = empty;
-    header.software_variant = header.device_id = empty;
+    header.product_id = header.software_version = packed("");
+    header.software_variant = header.device_id = packed("");
     Kiv__Report report = KIV__REPORT__INIT;
     report.header = &header;
     const size_t size = kiv__report__get_packed_size(&report);

@@ -5,9 +5,11 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
+#include <iterator>
 #include <span>
 #include <string_view>
+
+#include "report.pb-c.h"
 
 namespace kivd {
 
@@ -17,16 +19,18 @@ class limited_text {
  public:
     static constexpr size_t capacity = limit;
 
-    void set(std::string_view text) {
+    constexpr limited_text() = default;
+    constexpr explicit limited_text(std::string_view text) { set(text); }
+
+    constexpr void set(std::string_view text) {
         const size_t size = text.copy(text_.data(), limit);
         text_[size] = '\0';
     }
-    [[nodiscard]] const char* get() const { return text_.data(); }
-    [[nodiscard]] char* data() { return text_.data(); }
-    [[nodiscard]] bool empty() const { return text_[0] == '\0'; }
-    [[nodiscard]] bool is_known() const { return !(*this == "unknown"); }
+    [[nodiscard]] constexpr const char* get() const { return text_.data(); }
 
-    bool operator==(const limited_text& other) const { return strcmp(get(), other.get()) == 0; }
+    bool operator==(const limited_text& other) const {
+        return *this == std::string_view(other.get());
+    }
     bool operator==(std::string_view text) const { return get() == text; }
 
  private:
@@ -44,27 +48,71 @@ struct group_id_list {
     size_t count = 0;
 };
 
-// "unknown" stands for a value that is not known, except that the IMEI and checksum are then empty.
-// Nothing in it is allocated, so filling it cannot fail.
+using header_text = limited_text<63>;
+inline constexpr std::string_view unknown_value = "unknown";
+
+// The initial values: a text that still has its own is not known. Nothing in it is allocated, so
+// filling it cannot fail.
 struct header_record {
-    limited_text<63> product_id;
-    limited_text<63> software_version;
-    limited_text<63> software_variant;
-    limited_text<40> device_id;
-    limited_text<63> build_type;
-    limited_text<63> config_checksum;  // 40 hexadecimal digits
-    limited_text<63> report_uuid;      // always empty
-    int32_t timezone = -1;             // seconds east of UTC
-    limited_text<63> cdf_id;
-    limited_text<11> serial_number;
-    limited_text<40> device_imei;
+    header_text product_id{unknown_value};
+    header_text software_version{unknown_value};
+    header_text software_variant{unknown_value};
+    header_text device_id{unknown_value};
+    header_text build_type{unknown_value};
+    header_text cdf_id{unknown_value};
+    header_text serial_number{unknown_value};
+    header_text device_imei;
+    header_text config_checksum;  // 40 hexadecimal digits
+    int32_t timezone = -1;        // seconds east of UTC
     group_id_list groups;
 };
 
-// Gives a header its initial values.
-void init_header(header_record& header);
+// What there is to know about a text of the header: where its values come from and go to.
+struct header_field {
+    header_text header_record::*text;
+    char* Kiv__Header::*packed;
+    size_t capacity;             // longer values are cut
+    std::string_view state_key;  // of its line in the state file
+    std::string_view info_key;   // of its line in header_info.conf
+    const char* property;        // of the system; null: none
+    const char* substitute;      // the property for when that one is not there; null: none
+    std::string_view test_value;
 
-// The header record of the process.
+    void set(header_record& header, std::string_view value) const;
+    // Sets it to the first word of `line`, if there is one.
+    void set_from_line(header_record& header, const char* line) const;
+    [[nodiscard]] const char* get(const header_record& header) const;
+    [[nodiscard]] bool is_known(const header_record& header) const;
+};
+
+// A row has all of a field; with it, the field is gathered, remembered, compared and packed. The
+// state file has their lines in this order, the first before those of sizes. Beside the table stand
+// the configuration checksum, the time zone, the group ids, and the two properties of the cdf_id.
+// clang-format off
+inline constexpr header_field header_fields[] = {
+    {&header_record::device_id, &Kiv__Header::device_id, 40, "device_id:", "device id:",
+     nullptr, nullptr, "2543c433-e716-46bb-a9f4-44481a876b6e"},
+    {&header_record::product_id, &Kiv__Header::product_id, 63, "product:", "id:",
+     "ro.qeli.version.sw", "ro.build.product_id", "test_id"},
+    {&header_record::software_version, &Kiv__Header::software_version, 63, "sw_version:", "revision:",
+     "ro.qeli.version.sw_revision", "ro.build.id", "test_rev"},
+    {&header_record::software_variant, &Kiv__Header::software_variant, 63, "variant:", "variant:",
+     "ro.qeli.version.sw_variant", nullptr, "test_var"},
+    {&header_record::build_type, &Kiv__Header::build_type, 63, "build_type:", "type:",
+     "ro.qeli.version.sw_type", "ro.build.type", "eng"},
+    {&header_record::cdf_id, &Kiv__Header::cdf_id, 63, "cdf_id:", "cdf_id:",
+     nullptr, nullptr, "1234-5678_R6D"},
+    {&header_record::serial_number, &Kiv__Header::serial_number, 11, "serial_num:", "serial num:",
+     nullptr, nullptr, "ABCDEFGHIJ"},
+    {&header_record::device_imei, &Kiv__Header::device_imei, 40, "device_imei:", "device imei:",
+     nullptr, nullptr, "1234567890"},
+};
+// clang-format on
+static_assert(offsetof(header_record, config_checksum) ==
+                  std::size(header_fields) * sizeof(header_text),
+              "each text before the checksum has a row");
+
+// The header record in force.
 [[nodiscard]] header_record& get_header_record();
 
 // The position of `id`, or max_group_ids when it is not there.

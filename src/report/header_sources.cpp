@@ -20,17 +20,20 @@ constexpr size_t cdf_id_limit = 62;
 
 class property {
  public:
-    explicit property(const char* name) { property_get(name, value_, "unknown"); }
-    [[nodiscard]] bool is_known() const { return get() != "unknown"; }
+    explicit property(const char* name) { property_get(name, value_, unknown_value.data()); }
+    [[nodiscard]] bool is_known() const { return get() != unknown_value; }
     [[nodiscard]] std::string_view get() const { return value_; }
 
  private:
     char value_[PROPERTY_VALUE_MAX];
 };
 
-void set_from_properties(auto& field, const char* name, const char* fallback) {
-    field.set(property(name).get());
-    if (!field.is_known() && fallback != nullptr) field.set(property(fallback).get());
+void set_from_properties(header_record& candidate, const header_field& field) {
+    for (const char* const name : {field.property, field.substitute}) {
+        if (name != nullptr && !field.is_known(candidate)) {
+            field.set(candidate, property(name).get());
+        }
+    }
 }
 
 void set_cdf_id(header_record& candidate) {
@@ -45,14 +48,6 @@ void set_cdf_id(header_record& candidate) {
     candidate.cdf_id.set(std::string_view(text, static_cast<size_t>(size)).substr(0, cdf_id_limit));
 }
 
-template <auto field>
-void set_text(header_record& header, const char* value) {
-    auto& text = header.*field;
-    if (const std::string_view word = scan_word(value, text.capacity); !word.empty()) {
-        text.set(word);
-    }
-}
-
 void set_timezone(header_record& header, const char* value) {
     if (const auto number = scan_number(value)) header.timezone = saturate_int32(*number);
 }
@@ -62,35 +57,21 @@ void add_group(header_record& header, const char* value) {
     if (!word.empty()) add_group_id(header.groups, word);
 }
 
-struct line_pattern {
-    std::string_view key;
-    void (*apply)(header_record& header, const char* value);
-};
-// clang-format off
-constexpr line_pattern line_patterns[] = {
-    {"id:",          set_text<&header_record::product_id>},
-    {"revision:",    set_text<&header_record::software_version>},
-    {"variant:",     set_text<&header_record::software_variant>},
-    {"type:",        set_text<&header_record::build_type>},
-    {"timezone:",    set_timezone},
-    {"device id:",   set_text<&header_record::device_id>},
-    {"cdf_id:",      set_text<&header_record::cdf_id>},
-    {"serial num:",  set_text<&header_record::serial_number>},
-    {"device imei:", set_text<&header_record::device_imei>},
-    {"group id:",    add_group},
-};
-// clang-format on
+void apply_line(header_record& candidate, const char* line) {
+    for (const header_field& field : header_fields) {
+        if (const char* const value = scan_key(line, field.info_key)) {
+            field.set_from_line(candidate, value);
+        }
+    }
+    if (const char* const value = scan_key(line, "timezone:")) set_timezone(candidate, value);
+    if (const char* const value = scan_key(line, "group id:")) add_group(candidate, value);
+}
 
 void apply_header_info(header_record& candidate) {
     const unique_file file = open_to_read(paths::header_info);
     if (!file) return;
     char line[line_size];
-    while (fgets(line, sizeof line, file.get()) != nullptr) {
-        for (const line_pattern& pattern : line_patterns) {
-            const char* const value = scan_key(line, pattern.key);
-            if (value != nullptr) pattern.apply(candidate, value);
-        }
-    }
+    while (fgets(line, sizeof line, file.get()) != nullptr) apply_line(candidate, line);
 }
 
 }  // namespace
@@ -106,11 +87,8 @@ int32_t local_utc_offset() {
 }
 
 void gather_header(header_record& candidate) {
-    init_header(candidate);
-    set_from_properties(candidate.product_id, "ro.qeli.version.sw", "ro.build.product_id");
-    set_from_properties(candidate.software_version, "ro.qeli.version.sw_revision", "ro.build.id");
-    set_from_properties(candidate.software_variant, "ro.qeli.version.sw_variant", nullptr);
-    set_from_properties(candidate.build_type, "ro.qeli.version.sw_type", "ro.build.type");
+    candidate = {};
+    for (const header_field& field : header_fields) set_from_properties(candidate, field);
     set_cdf_id(candidate);
     candidate.timezone = local_utc_offset();
     apply_header_info(candidate);
@@ -123,17 +101,9 @@ void add_group_id_property(header_record& candidate) {
 }
 
 void set_test_identity(header_record& header) {
-    header.product_id.set("test_id");
-    header.software_version.set("test_rev");
-    header.software_variant.set("test_var");
-    header.device_id.set("2543c433-e716-46bb-a9f4-44481a876b6e");
-    header.build_type.set("eng");
+    for (const header_field& field : header_fields) field.set(header, field.test_value);
     header.config_checksum.set("fedcba9876543210fedcba9876543210fedcba98");
-    header.report_uuid.set("");
     header.timezone = 0;
-    header.cdf_id.set("1234-5678_R6D");
-    header.serial_number.set("ABCDEFGHIJ");
-    header.device_imei.set("1234567890");
 }
 
 }  // namespace kivd

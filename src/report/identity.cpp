@@ -24,16 +24,6 @@ void add_group_ids(group_id_list& to, const group_id_list& from) {
     for (size_t i = 0; i < from.count; ++i) add_group_id(to, from.ids[i].get());
 }
 
-// What no source gives is taken from what is remembered.
-void fill_from_record(header_record& candidate, const header_record& record) {
-    add_group_ids(candidate.groups, record.groups);
-    add_group_id_property(candidate);
-    if (!candidate.device_id.is_known()) candidate.device_id = record.device_id;
-    if (!candidate.serial_number.is_known()) candidate.serial_number = record.serial_number;
-    if (candidate.device_imei.empty()) candidate.device_imei = record.device_imei;
-    candidate.config_checksum.set(text_of_checksum(get_config_checksum()).data());
-}
-
 bool same_group_ids(const group_id_list& a, const group_id_list& b) {
     if (a.count != b.count) return false;
     for (size_t i = 0; i < a.count; ++i) {
@@ -44,36 +34,32 @@ bool same_group_ids(const group_id_list& a, const group_id_list& b) {
 
 // A value that is not known any more is no change.
 bool is_changed(const header_record& candidate, const header_record& previous) {
-    const auto changed = [](const auto& now, const auto& before) {
-        return now.is_known() && !(now == before);
-    };
-    return changed(candidate.product_id, previous.product_id) ||
-           changed(candidate.software_version, previous.software_version) ||
-           changed(candidate.software_variant, previous.software_variant) ||
-           changed(candidate.build_type, previous.build_type) ||
-           !(candidate.config_checksum == previous.config_checksum) ||
-           changed(candidate.cdf_id, previous.cdf_id) ||
-           changed(candidate.serial_number, previous.serial_number) ||
-           !(candidate.device_imei == previous.device_imei) ||
-           changed(candidate.device_id, previous.device_id) ||
+    const bool is_text_changed = std::ranges::any_of(header_fields, [&](const auto& field) {
+        return field.is_known(candidate) && !(candidate.*field.text == previous.*field.text);
+    });
+    return is_text_changed || !(candidate.config_checksum == previous.config_checksum) ||
            !same_group_ids(candidate.groups, previous.groups);
 }
 
+// What no source gives stays as it is remembered.
 void rebuild_header(header_record& record) {
     header_record candidate;
     gather_header(candidate);
-    fill_from_record(candidate, record);
-    header_record previous;
-    init_header(previous);
-    copy_known_values(previous, record);
-    add_group_ids(previous.groups, record.groups);
+    add_group_ids(candidate.groups, record.groups);
+    add_group_id_property(candidate);
+    candidate.config_checksum.set(text_of_checksum(get_config_checksum()).data());
+    header_record previous = record;
+    previous.groups = {};
+    add_group_ids(previous.groups, record.groups);  // one that was replaced may stand there twice
 
     copy_known_values(record, candidate);
     add_group_ids(record.groups, candidate.groups);
     pack_report_header();
 
     if (!is_changed(candidate, previous)) return;
-    if (previous.product_id.is_known() && previous.device_id.is_known()) (void)generate_report();
+    if (previous.product_id != unknown_value && previous.device_id != unknown_value) {
+        (void)generate_report();
+    }
     state_save();
 }
 
@@ -97,7 +83,7 @@ void update_header_info() {
 
 void ensure_device_id() {
     header_record& record = get_header_record();
-    if (record.device_id.is_known()) return;
+    if (record.device_id != unknown_value) return;
     const unique_file file(fopen(paths::random_uuid, "re"));
     if (!file) {
         log_and_raise(tag, "Failed to open uuid file: %s", strerror(errno));

@@ -102,4 +102,9 @@ void set_output_compression(bool enabled) {
     compression = enabled ? gzip_level::best : gzip_level::stored;
 }
 
+void report_generation_release() {
+    wait_for_compactor();
+    set_output_compression(true);
+}
+
 }  // namespace kivd

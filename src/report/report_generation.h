@@ -24,4 +24,7 @@ void wait_for_compactor();
 // Switches compression off (gzip framing around stored data) or on again.
 void set_output_compression(bool enabled);
 
+// Waits until no compactor runs; compression is on.
+void report_generation_release();
+
 }  // namespace kivd

@@ -5,9 +5,10 @@
 #include <cstdio>
 #include <cstring>
 #include <optional>
+#include <span>
 #include <string_view>
 
-#include "config/limits.h"
+#include "config/settings.h"
 #include "record/header_record.h"
 #include "runtime/daemon_error.h"
 #include "runtime/log_and_raise.h"
@@ -54,32 +55,6 @@ void read_shutdown_time(const char* text) {
 
 void write_shutdown_time(FILE* file) { fprintf(file, "%lld", static_cast<long long>(now_ms())); }
 
-template <auto field>
-void read_text(const char* text) {
-    auto& value = get_header_record().*field;
-    if (const std::string_view word = scan_word(text, value.capacity); !word.empty()) {
-        value.set(word);
-    }
-}
-
-template <auto field>
-void write_text(FILE* file) {
-    fputs((get_header_record().*field).get(), file);
-}
-
-// The file has these unsigned values in signed form.
-template <auto field>
-void read_limit(const char* text) {
-    if (const auto number = scan_number(text)) {
-        get_limits().*field = static_cast<uint32_t>(saturate_int32(*number));
-    }
-}
-
-template <auto field>
-void write_limit(FILE* file) {
-    fprintf(file, "%d", static_cast<int32_t>(get_limits().*field));
-}
-
 void read_data_collection(const char* text) {
     if (const auto digit = scan_number(text, 1)) set_data_collection(*digit != 0);
 }
@@ -103,49 +78,73 @@ void read_group_id(const char* text) {
     if (!id.empty()) add_group_id(get_header_record().groups, id);
 }
 
-// One row for each line but those of the group ids, in the order in which they are written.
+// A line that is no header field's and no limit's.
 struct state_value {
-    std::string_view key;
+    std::string_view state_key;
     void (*read)(const char* text);  // leaves the value as it is when `text` holds none
     void (*write)(FILE* file);
 };
 // clang-format off
-constexpr state_value state_values[] = {
-    {"config-checksum:",     read_checksum,        write_checksum},
-    {"last-flush:",          read_last_flush,      write_last_flush},
-    {"shutdown-time:",       read_shutdown_time,   write_shutdown_time},
-    {"device_id:",           read_text<&header_record::device_id>,        write_text<&header_record::device_id>},
-    {"report-max-size:",     read_limit<&limits::max_report_size>,        write_limit<&limits::max_report_size>},
-    {"output-dir-max-size:", read_limit<&limits::max_output_dir_size>,    write_limit<&limits::max_output_dir_size>},
-    {"product:",             read_text<&header_record::product_id>,       write_text<&header_record::product_id>},
-    {"sw_version:",          read_text<&header_record::software_version>, write_text<&header_record::software_version>},
-    {"variant:",             read_text<&header_record::software_variant>, write_text<&header_record::software_variant>},
-    {"build_type:",          read_text<&header_record::build_type>,       write_text<&header_record::build_type>},
-    {"cdf_id:",              read_text<&header_record::cdf_id>,           write_text<&header_record::cdf_id>},
-    {"serial_num:",          read_text<&header_record::serial_number>,    write_text<&header_record::serial_number>},
-    {"device_imei:",         read_text<&header_record::device_imei>,      write_text<&header_record::device_imei>},
-    {"expire-counters:",     read_limit<&limits::expire_counters_age>,    write_limit<&limits::expire_counters_age>},
-    {"expire-sdata:",        read_limit<&limits::expire_sdata_age>,       write_limit<&limits::expire_sdata_age>},
-    {"data-collection:",     read_data_collection, write_data_collection},
-    {"error_nr:",            read_error_nr,        write_error_nr},
-    {"error_time:",          read_error_time,      write_error_time},
+constexpr state_value first_values[] = {
+    {"config-checksum:", read_checksum,        write_checksum},
+    {"last-flush:",      read_last_flush,      write_last_flush},
+    {"shutdown-time:",   read_shutdown_time,   write_shutdown_time},
+};
+constexpr state_value last_values[] = {
+    {"data-collection:", read_data_collection, write_data_collection},
+    {"error_nr:",        read_error_nr,        write_error_nr},
+    {"error_time:",      read_error_time,      write_error_time},
 };
 // clang-format on
 constexpr std::string_view group_id_key = "group_id:";
 
-void read_line(const char* line) {
-    for (const state_value& value : state_values) {
-        if (const char* const text = scan_key(line, value.key)) return value.read(text);
+// Calls `visit` with the row of each line but those of the group ids, in the order in which they
+// are written.
+void for_each_line(auto visit) {
+    constexpr size_t identity = 1;  // of the header fields
+    constexpr size_t sizes = 2;     // of the limits
+    for (const state_value& each : first_values) visit(each);
+    for (const header_field& each : std::span(header_fields).first(identity)) visit(each);
+    for (const setting& each : std::span(settings).first(sizes)) visit(each);
+    for (const header_field& each : std::span(header_fields).subspan(identity)) visit(each);
+    for (const setting& each : std::span(settings).subspan(sizes)) visit(each);
+    for (const state_value& each : last_values) visit(each);
+}
+
+void read_value(const state_value& row, const char* text) { row.read(text); }
+
+void read_value(const header_field& row, const char* text) {
+    row.set_from_line(get_header_record(), text);
+}
+
+// The file has these unsigned values in signed form.
+void read_value(const setting& row, const char* text) {
+    if (const auto number = scan_number(text)) {
+        get_limits().*row.limit = static_cast<uint32_t>(saturate_int32(*number));
     }
+}
+
+void write_value(const state_value& row, FILE* file) { row.write(file); }
+
+void write_value(const header_field& row, FILE* file) { fputs(row.get(get_header_record()), file); }
+
+void write_value(const setting& row, FILE* file) {
+    fprintf(file, "%d", static_cast<int32_t>(get_limits().*row.limit));
+}
+
+void read_line(const char* line) {
+    for_each_line([line](const auto& row) {
+        if (const char* const text = scan_key(line, row.state_key)) read_value(row, text);
+    });
     if (const char* const text = scan_key(line, group_id_key)) read_group_id(text);
 }
 
 void write_lines(FILE* file) {
-    for (const state_value& value : state_values) {
-        fprintf(file, "%s ", value.key.data());
-        value.write(file);
+    for_each_line([file](const auto& row) {
+        fprintf(file, "%s ", row.state_key.data());
+        write_value(row, file);
         fputc('\n', file);
-    }
+    });
     const group_id_list& groups = get_header_record().groups;
     for (size_t i = 0; i < groups.count; ++i) {
         fprintf(file, "%s %s\n", group_id_key.data(), groups.ids[i].get());
@@ -177,6 +176,12 @@ void state_save() {
     if (rename(paths::state_new, paths::state) != 0) {
         log_and_raise(tag, "Failed to rename configuration file: %s", strerror(errno));
     }
+}
+
+void state_release() {
+    last_flush = 0;
+    data_collection = false;
+    checksum_in_force = {};
 }
 
 int64_t get_last_flush() { return last_flush; }

@@ -15,6 +15,9 @@ void state_load();
 // Replaces the file. Failures have been logged and raised; the old file is then still there.
 void state_save();
 
+// Returns the three values to those of a first start.
+void state_release();
+
 // The time of the last report flush, in ms: what changed then or later belongs to the next report.
 [[nodiscard]] int64_t get_last_flush();
 void set_last_flush(int64_t time_ms);

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <mutex>
 #include <optional>
+#include <utility>
 
 #include "client/kiv.h"
 #include "daemon_error.pb-c.h"
@@ -99,6 +100,16 @@ void daemon_error_init(const char* directory) {
     const std::lock_guard lock(mutex);
     connection_directory = directory;
     if (is_test_mode()) flood_interval = error_flood_interval_in_test_mode;
+}
+
+void daemon_error_release() {
+    const std::lock_guard lock(mutex);
+    error_nr = 0;
+    error_time = 0;
+    notice_logged = false;
+    flood_interval = error_flood_interval;
+    connection_directory = nullptr;
+    kiv_destroy(std::exchange(connection, nullptr));
 }
 
 void raise_daemon_error(const char* format, ...) {

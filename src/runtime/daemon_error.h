@@ -20,6 +20,9 @@ inline constexpr time_t error_flood_interval_in_test_mode = 6;
 // `directory` is where the daemon's own sockets are; the text is kept by the caller.
 void daemon_error_init(const char* directory);
 
+// Hangs up and begins a new period, without a directory.
+void daemon_error_release();
+
 // Formats a text and sends it; never waits and never fails towards the caller. Keeps errno.
 [[gnu::format(printf, 1, 2)]] void raise_daemon_error(const char* format, ...);
 

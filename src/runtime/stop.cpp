@@ -25,6 +25,11 @@ bool stop_init() {
     return stop_event >= 0;
 }
 
+void stop_release() {
+    stop_flag = 0;
+    if (const int event = stop_event.exchange(-1); event >= 0) (void)close(event);
+}
+
 int stop_event_fd() { return stop_event; }
 
 void request_stop() {

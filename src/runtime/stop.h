@@ -6,6 +6,9 @@ namespace kivd {
 // Makes the event that request_stop signals. False, with errno set, when it cannot be made.
 [[nodiscard]] bool stop_init();
 
+// Closes it, and no stop is requested any more.
+void stop_release();
+
 // Readable once a stop has been requested; -1 when there is none.
 [[nodiscard]] int stop_event_fd();
 

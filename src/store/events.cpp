@@ -21,7 +21,6 @@ namespace {
 
 constexpr char tag[] = "kivd-events";
 
-// Not a unique_fd: the descriptor stays open until the process ends, after all else is released.
 constinit int events_fd = -1;
 constinit uint64_t events_size = 0;
 
@@ -70,11 +69,16 @@ event_file events_add(const char* package, const char* name, std::span<const cha
 
 bool events_flush() {
     events_open();
-    if (events_fd >= 0) (void)close(events_fd);
-    events_fd = -1;
+    events_release();
     return rename(paths::events, paths::flushed_data) == 0;
 }
 
 bool events_pending() { return access(paths::events, F_OK) == 0; }
+
+void events_release() {
+    if (events_fd >= 0) (void)close(events_fd);
+    events_fd = -1;
+    events_size = 0;
+}
 
 }  // namespace kivd

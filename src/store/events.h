@@ -29,4 +29,7 @@ void events_open();
 // Whether there is an event file.
 [[nodiscard]] bool events_pending();
 
+// Closes the event file, which stays.
+void events_release();
+
 }  // namespace kivd

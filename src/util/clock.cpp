@@ -9,7 +9,8 @@ namespace kivd {
 namespace {
 
 constinit bool test_mode = false;
-constinit int64_t test_clock_seconds = 1262325600;  // 2010-01-01 06:00:00 UTC
+constexpr int64_t test_clock_start = 1262325600;  // 2010-01-01 06:00:00 UTC
+constinit int64_t test_clock_seconds = test_clock_start;
 
 }  // namespace
 
@@ -21,6 +22,11 @@ int64_t now_ms() {
 }
 
 void enable_test_mode() { test_mode = true; }
+
+void leave_test_mode() {
+    test_mode = false;
+    test_clock_seconds = test_clock_start;
+}
 
 bool is_test_mode() { return test_mode; }
 

@@ -252,7 +252,7 @@ TEST_F(intake, what_cannot_be_stored_is_said_and_the_rest_goes_on) {
     EXPECT_EQ(part("c", "z") + part("b", "y"), "servednone");
     EXPECT_TRUE(exists("private/conf_2.bin"));
     EXPECT_EQ(read_file("private/config_list.txt"), list);
-    EXPECT_EQ(get_limits().max_report_size, default_max_report_size);
+    EXPECT_EQ(get_limits().max_report_size, default_limits.max_report_size);
 
     fs::remove("input");
     replace_config_file({});
@@ -266,7 +266,7 @@ TEST_F(intake, what_cannot_be_stored_is_said_and_the_rest_goes_on) {
 }
 
 TEST_F(intake, settings_come_and_go_with_their_part) {
-    get_limits().base_expire_counters_age = 77;
+    get_base_limits().expire_counters_age = 77;
     const struct {
         const char* text;
         uint32_t expected[4];  // report, output, counters, static data
@@ -299,7 +299,7 @@ TEST_F(intake, settings_come_and_go_with_their_part) {
         EXPECT_NE(log.find(expected_log), std::string::npos) << log;
         expect_limits(each.expected);
         restart();  // remembered
-        get_limits().base_expire_counters_age = 77;
+        get_base_limits().expire_counters_age = 77;
         expect_limits(each.expected);
     }
     ASSERT_TRUE(take(config_file({{"kivd", "Settings", "\xff"}})));

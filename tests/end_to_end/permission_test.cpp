@@ -7,6 +7,7 @@
 #include <sys/wait.h>
 
 #include "daemon_test.h"
+#include "format/request_table.h"
 
 namespace kivd {
 namespace {
@@ -15,23 +16,6 @@ using enum socket_kind;
 
 constexpr uid_t stranger = 65534;
 constexpr uid_t other_stranger = 65533;
-
-const struct {
-    std::string request;
-    const char* refusal;
-} privileged[] = {
-    {"FL", "W kivd: flush (FL) request denied due to permission!"},
-    {"FS", "W kivd: forceSave (FS) request denied due to permission!"},
-    {"WC p", "W kivd: writeConfiguration (WC) request denied due to permission!"},
-    {"NC", "W kivd: notifyNewConfiguration (NC) request denied due to permission!"},
-    {"FN 750 0", "W kivd: fileIteratorNext (FN) request denied due to permission!"},
-    {"FG 750 1", "W kivd: fileGet (FG) request denied due to permission!"},
-    {"GD", "W kivd: getDeviceId (GD) request denied due to permission!"},
-    {"DC 0", "W kivd: setDataCollectionEnable (DC) request denied due to permission!"},
-    {"RM 0", "W kivd: removeReport (RM) request denied due to permission!"},
-    {"SN 1", "W kivd: setSerialNumber (SN) request denied due to permission!"},
-    {"IM 1", "W kivd: setImei (IM) request denied due to permission!"},
-};
 
 // Sends the requests on a socket of that kind as somebody else, and an IA behind them where there
 // are replies. Gives all replies in one text.
@@ -81,15 +65,20 @@ TEST_F(permission, strangers_are_refused_every_privileged_request_on_every_socke
     EXPECT_EQ(wait_report(1).events_size(), 1);
     const std::string state = read_file("private/kivd.state");
     std::vector<std::string> requests;
-    for (const auto& each : privileged) requests.push_back(each.request);
+    std::vector<std::string> refusals;
+    for (const request_row& row : request_table) {
+        if (row.access == request_access::everyone) continue;
+        requests.push_back(std::string(row.name) + " 1 1");  // all that any of them needs
+        refusals.push_back(std::string("W kivd: ") + row.refusal);
+    }
+    EXPECT_EQ(refusals.front(), "W kivd: flush (FL) request denied due to permission!");
 
     size_t sockets = 0;
     for (const socket_kind kind : {datagram, packets, stream}) {
         EXPECT_EQ(ask_as(stranger, kind, requests), kind == datagram ? "" : "0-1FAIL1");
         ++sockets;
-        for (const auto& each : privileged) {
-            ASSERT_TRUE(wait_until([&] { return daemon.count_in_log(each.refusal) == sockets; }))
-                << each.refusal;
+        for (const std::string& each : refusals) {
+            ASSERT_TRUE(wait_until([&] { return daemon.count_in_log(each) == sockets; })) << each;
         }
     }
     EXPECT_EQ(report_paths().size(), 1U);

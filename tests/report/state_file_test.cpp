@@ -13,8 +13,8 @@ class state_file : public scratch_directory {
  protected:
     // What is saved after a start with `text`.
     static std::string reloaded(const std::string& text) {
-        init_settings();
-        init_header(get_header_record());
+        limits_release();
+        release_header();
         set_config_checksum({});
         write_file(paths::state, text);
         state_load();

@@ -10,32 +10,13 @@
 #include <fstream>
 #include <sstream>
 
-#include "config/config_parts.h"
-#include "config/filters.h"
-#include "config/limits.h"
+#include "daemon/modules.h"
 #include "report.pb.h"
-#include "report/identity.h"
 #include "report/report_generation.h"
-#include "report/state_file.h"
-#include "runtime/daemon_error.h"
-#include "store/counters.h"
-#include "store/static_data.h"
 #include "support/daemon_process.h"
+#include "util/clock.h"
 
 namespace kivd {
-namespace {
-
-void release_all() {
-    wait_for_compactor();
-    counters_release();
-    static_data_release();
-    release_header();
-    release_filters();
-    release_config_list();
-}
-
-}  // namespace
-
 directory_in_memory::directory_in_memory() {
     if (access("/dev/shm", W_OK) == 0) setenv("TEST_TMPDIR", "/dev/shm/", 0);
 }
@@ -50,28 +31,21 @@ scratch_directory::scratch_directory() {
     receiver_.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
     EXPECT_EQ(bind(receiver_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address),
               0);
-    daemon_error_init(directory.c_str());
     properties = {{"ro.qeli.version.sw", "P1"}};
     restart();
 }
 
 scratch_directory::~scratch_directory() {
-    release_all();
+    release_modules();
     fs::current_path("/");
     fs::remove_all(directory);
 }
 
 void scratch_directory::restart() {
-    release_all();
-    init_settings();
-    counters_init();
-    static_data_init();
-    init_header(get_header_record());
-    state_load();
-    ensure_device_id();
-    update_header_info();
-    load_config_list();
-    (void)load_filters();
+    const bool in_test_mode = is_test_mode();
+    release_modules();
+    if (in_test_mode) enable_test_mode();
+    start_modules();
 }
 
 std::string scratch_directory::next_report() {

@@ -28,12 +28,14 @@ void read_debug_client(event_handler& handler);
 constinit event_handler listener = {accept_debug_client, -1};
 constinit event_handler client = {read_debug_client, -1};
 
-void close_client() {
-    if (client.fd < 0) return;
-    event_loop_remove(client);
-    (void)close(client.fd);
-    client.fd = -1;
+void close_handler(event_handler& handler) {
+    if (handler.fd < 0) return;
+    event_loop_remove(handler);
+    (void)close(handler.fd);
+    handler.fd = -1;
 }
+
+void close_client() { close_handler(client); }
 
 // A new client takes the place of the one before.
 void accept_debug_client(event_handler& handler) {
@@ -63,6 +65,11 @@ void debug_start() {
     if (listen(listener.fd, listen_backlog) != 0 || !event_loop_add(listener)) {
         give_up(tag, "Failed to listen to di-socket: %s", strerror(errno));
     }
+}
+
+void debug_release() {
+    close_client();
+    close_handler(listener);
 }
 
 void debug_mirror_request(std::span<const char> packet) {

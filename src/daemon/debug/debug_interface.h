@@ -10,6 +10,9 @@ namespace kivd {
 // Listens on port 2305 of every interface. Ends the process when that fails.
 void debug_start();
 
+// Stops listening and hangs up.
+void debug_release();
+
 // Sends the packet to the client, if there is one, without waiting. A frame that finds no room is
 // lost, with a log line. After one that was sent in part the client is dropped, since it could not
 // find the start of the next.

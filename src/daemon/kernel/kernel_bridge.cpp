@@ -213,6 +213,7 @@ bool start_kernel_bridge() {
 void join_kernel_bridge() {
     if (thread_started) (void)pthread_join(thread, nullptr);
     thread_started = false;
+    is_set_up = false;
 }
 
 }  // namespace kivd

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstring>
 #include <span>
+#include <utility>
 
 #include "daemon/loop/save_clock.h"
 #include "platform/android_log.h"
@@ -43,6 +44,10 @@ bool event_loop_init() {
     stop_handler.fd = stop_event_fd();
     (void)event_loop_add(stop_handler);
     return true;
+}
+
+void event_loop_release() {
+    if (epoll_fd >= 0) (void)close(std::exchange(epoll_fd, -1));
 }
 
 bool event_loop_add(event_handler& handler) {

@@ -14,6 +14,9 @@ struct event_handler {
 // Makes the loop. A failure has been logged.
 [[nodiscard]] bool event_loop_init();
 
+// Ends it, whatever is still in it.
+void event_loop_release();
+
 // Adds a handler with its descriptor, or takes it out. False, with errno set, when it cannot be
 // added.
 [[nodiscard]] bool event_loop_add(event_handler& handler);

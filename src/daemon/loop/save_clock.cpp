@@ -12,7 +12,9 @@ namespace {
 
 constexpr int32_t max_interval = INT32_MAX / 1000;  // the loop waits in 32-bit milliseconds
 
-constinit int32_t save_interval = 600;
+constexpr int32_t usual_interval = 600;
+
+constinit int32_t save_interval = usual_interval;
 constinit int64_t last_save = 0;  // seconds since the epoch
 
 }  // namespace
@@ -31,6 +33,11 @@ void save_data() {
     counters_save();
     static_data_save();
     mark_saved();
+}
+
+void save_clock_release() {
+    save_interval = usual_interval;
+    last_save = 0;
 }
 
 }  // namespace kivd

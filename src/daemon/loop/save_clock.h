@@ -17,4 +17,7 @@ void mark_saved();
 // Saves counters and static data, and marks it.
 void save_data();
 
+// Back to the usual interval, and to no save as yet.
+void save_clock_release();
+
 }  // namespace kivd

@@ -10,6 +10,8 @@ namespace kivd {
 void set_receive_delay(int32_t delay_ms);
 void set_send_delay(int32_t delay_ms);
 
+void delays_release();  // none again
+
 [[nodiscard]] int32_t get_receive_delay();
 void wait_before_receive();
 void wait_before_send();

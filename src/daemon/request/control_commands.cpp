@@ -1,10 +1,10 @@
-#include "daemon/request/control_commands.h"
-
+// The commands that control the daemon, and those that say who the device is.
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
 
 #include "daemon/loop/save_clock.h"
+#include "daemon/request/commands.h"
 #include "diag/diag_store.h"
 #include "diag/file_export.h"
 #include "intake/intake.h"
@@ -51,7 +51,7 @@ answer announce_configuration(request& r) {
 answer write_configuration(request& r) {
     constexpr size_t command_size = 3;  // with the delimiter behind it
     if (r.packet.size() < command_size) {
-        log_and_raise(tag, "Badly formatted packet (WC) - dropping.");
+        log_and_raise(tag, "Badly formatted packet (%s) - dropping.", r.command);
         return no_answer();
     }
     replace_config_file(r.packet.subspan(command_size));
@@ -92,7 +92,7 @@ answer get_file(request& r) {
     const char* const set = next_token(r);
     const char* const number = next_token(r);
     if (set == nullptr || number == nullptr) {
-        log_and_raise(tag, "Badly formatted packet (FG) - dropping.");
+        log_and_raise(tag, "Badly formatted packet (%s) - dropping.", r.command);
         return answer_with(r, "FAIL");
     }
     return answer_with(r, open_exported_file(set, number));

@@ -1,7 +1,7 @@
-#include "daemon/request/data_commands.h"
-
+// The commands that every client may send: probe data and queries.
 #include "config/config_parts.h"
 #include "config/filters.h"
+#include "daemon/request/commands.h"
 #include "diag/diag_store.h"
 #include "format/request_words.h"
 #include "report/report_generation.h"
@@ -17,11 +17,11 @@ namespace {
 
 constexpr char tag[] = "kivd";
 
-void update_counter(request& r, const char* command, counter_mode mode) {
+void update_counter(request& r, counter_mode mode) {
     probe_id probe = {};
-    if (!take_probe_id(r, command, probe)) return;
+    if (!take_probe_id(r, probe)) return;
     const char* const value = next_token(r);
-    if (!check_probe_value(command, probe, value)) return;
+    if (!check_probe_value(r, probe, value)) return;
     counters_update(probe.package, probe.name, parse_saturated(value), mode);
 }
 
@@ -29,7 +29,7 @@ void update_counter(request& r, const char* command, counter_mode mode) {
 
 answer add_event(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "EV", probe)) return no_answer();
+    if (!take_probe_id(r, probe)) return no_answer();
     const std::span<const char> payload = raw_rest(r);
     if (payload.size() > max_payload_size) {
         log_and_raise(tag, "Too large event - dropping. [%s:%s] %zu bytes", probe.package,
@@ -42,20 +42,20 @@ answer add_event(request& r) {
 }
 
 answer set_counter(request& r) {
-    update_counter(r, "CS", counter_mode::set);
+    update_counter(r, counter_mode::set);
     return no_answer();
 }
 
 answer increment_counter(request& r) {
-    update_counter(r, "CI", counter_mode::increment);
+    update_counter(r, counter_mode::increment);
     return no_answer();
 }
 
 answer set_static_data(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "SD", probe)) return no_answer();
+    if (!take_probe_id(r, probe)) return no_answer();
     const char* const value = text_rest(r);
-    if (check_probe_value("SD", probe, value)) static_data_set(probe.package, probe.name, value);
+    if (check_probe_value(r, probe, value)) static_data_set(probe.package, probe.name, value);
     return no_answer();
 }
 
@@ -63,7 +63,7 @@ answer is_alive(request& r) { return answer_with(r, "1"); }
 
 answer is_probe_active(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "PA", probe)) return no_answer();
+    if (!take_probe_id(r, probe)) return no_answer();
     const bool wanted = filter_match(filter_kind::events, probe.package, probe.name) ||
                         diag_wants_probe(probe.package, probe.name);
     return answer_with(r, wanted ? "1" : "0");
@@ -71,7 +71,7 @@ answer is_probe_active(request& r) {
 
 answer get_config_part(request& r) {
     probe_id probe = {};
-    if (!take_probe_id(r, "GC", probe)) return no_answer();
+    if (!take_probe_id(r, probe)) return no_answer();
     return answer_with(r, get_config_fd(probe.package, probe.name));
 }
 

@@ -16,7 +16,9 @@ const char* or_null(const char* text) { return text != nullptr ? text : "null"; 
 }  // namespace
 
 request make_request(int fd, std::span<char> packet, const msghdr* message) {
-    return {fd, packet, message, packet.data(), packet.data()};
+    request r = {fd, packet, message, packet.data(), packet.data(), nullptr};
+    r.command = next_token(r);
+    return r;
 }
 
 const char* next_token(request& r) {
@@ -45,24 +47,24 @@ answer answer_with(request& r, unique_fd descriptor) {
     return {0, std::move(descriptor)};
 }
 
-bool take_probe_id(request& r, const char* command, probe_id& probe) {
+bool take_probe_id(request& r, probe_id& probe) {
     probe.package = next_token(r);
     probe.name = next_token(r);
     if (probe.package == nullptr || probe.name == nullptr) {
-        return log_and_raise(tag, "[%s] Null in probe id - dropping. [%s:%s]", command,
+        return log_and_raise(tag, "[%s] Null in probe id - dropping. [%s:%s]", r.command,
                              or_null(probe.package), or_null(probe.name));
     }
     const size_t size = strlen(probe.package) + strlen(probe.name);
     if (size > max_probe_id_size) {
-        return log_and_raise(tag, "[%s] To large probe id, %zu > %d - dropping. [%s:%s]", command,
+        return log_and_raise(tag, "[%s] To large probe id, %zu > %d - dropping. [%s:%s]", r.command,
                              size, static_cast<int>(max_probe_id_size), probe.package, probe.name);
     }
     return true;
 }
 
-bool check_probe_value(const char* command, const probe_id& probe, const char* value) {
+bool check_probe_value(const request& r, const probe_id& probe, const char* value) {
     if (value != nullptr && *value != '\0') return true;
-    return log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", command,
+    return log_and_raise(tag, "[%s] Null in probe value - dropping. [%s:%s]", r.command,
                          probe.package, probe.name);
 }
 

@@ -18,8 +18,10 @@ struct request {
     const msghdr* message;   // of a datagram: carries its sender's credentials
     char* token_end;         // the NUL behind the last token taken
     char* rest;              // where the next token is looked for
+    const char* command;     // the first token; null when there is none
 };
 
+// Takes the command off the packet.
 [[nodiscard]] request make_request(int fd, std::span<char> packet, const msghdr* message);
 
 // The next token, or null when there is none left.
@@ -54,9 +56,9 @@ struct probe_id {
 
 // Takes the next two tokens as a probe's id. False, logged and raised, when one is missing or
 // together they are too long.
-[[nodiscard]] bool take_probe_id(request& r, const char* command, probe_id& probe);
+[[nodiscard]] bool take_probe_id(request& r, probe_id& probe);
 
 // Whether a value is there and not empty; otherwise that has been logged and raised.
-[[nodiscard]] bool check_probe_value(const char* command, const probe_id& probe, const char* value);
+[[nodiscard]] bool check_probe_value(const request& r, const probe_id& probe, const char* value);
 
 }  // namespace kivd

@@ -115,10 +115,10 @@ std::optional<message> decode(const part_content* part, const char* effect,
 }
 
 void lint_limits(const part_content& part, const Settings& settings, lint_findings& findings) {
-    const uint32_t report =
-        settings.has_max_report_size() ? settings.max_report_size() : default_max_report_size;
+    const uint32_t report = settings.has_max_report_size() ? settings.max_report_size()
+                                                           : default_limits.max_report_size;
     const uint32_t output = settings.has_max_output_dir_size() ? settings.max_output_dir_size()
-                                                               : default_max_output_dir_size;
+                                                               : default_limits.max_output_dir_size;
     if (report <= output) return;
     const int field = settings.has_max_report_size() ? Settings::kMaxReportSizeFieldNumber
                                                      : Settings::kMaxOutputDirSizeFieldNumber;
@@ -129,8 +129,8 @@ void lint_limits(const part_content& part, const Settings& settings, lint_findin
                               ", is above max_output_dir_size, " + std::to_string(output) +
                               (settings.has_max_output_dir_size() ? "" : " unless given") +
                               "; the daemon returns both to " +
-                              std::to_string(default_max_report_size) + " and " +
-                              std::to_string(default_max_output_dir_size));
+                              std::to_string(default_limits.max_report_size) + " and " +
+                              std::to_string(default_limits.max_output_dir_size));
 }
 
 void lint_actions(std::span<const part_content> parts, lint_findings& findings) {
