@@ -371,8 +371,6 @@ TEST_F(configurations, are_made_and_shown_from_the_command_line) {
         {"config build -o c.bin p:=part", 2, "is not"},
         {"report --key key.pem c.bin", 1, "c.bin: "},
         {"report - <c.bin", 1, "-: stopped at byte"},
-        {"report summary --key key.pem --plot no/p.svg c.bin", 1, "no/p.svg: cannot be written"},
-        {"report csv --plot p.svg c.bin", 2, "--plot"},
         {"report jsonl", 2, "required"},
     };
     for (const auto& line : cases) {
