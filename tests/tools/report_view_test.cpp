@@ -90,11 +90,11 @@ TEST_F(report_views, keep_names_apart_that_are_not_utf8) {
     EXPECT_EQ(through_json(report.SerializeAsString()).header().group_id(1), "\\xFF");
 }
 
-// Records in an order that the daemon doesn't write, too.
+// Whatever comes first; but a list has one place.
 TEST_F(report_views, of_json_keep_every_value_and_do_without_a_header) {
     const std::string parts[] = {event_text("n", INT64_MAX, "\\000\\377 payload"),
-                                 counter_text("n", INT64_MIN, 1), static_text("n", "one\\ntwo"),
-                                 event_text("m", 5, "4444"), counter_text("m", 7, 8)};
+                                 event_text("m", 5, "4444"), counter_text("n", INT64_MIN, 1),
+                                 counter_text("m", 7, 8), static_text("n", "one\\ntwo")};
     std::string records;
     for (const std::string& part : parts) records += records_of(part);
     const std::string trailer =
@@ -111,6 +111,10 @@ TEST_F(report_views, of_json_keep_every_value_and_do_without_a_header) {
     const std::string two = write("two", header + header + trailer);
     const std::string err = show({two}, {report_format::json}).err;
     EXPECT_NE(err.find("JSON has room for one header"), std::string::npos) << err;
+    const std::string event = records_of(parts[0]), value = records_of(parts[4]);
+    const shown torn = show({write("torn", event + value + event)}, {report_format::json});
+    EXPECT_EQ(torn.out, show_records(event + value, report_format::json));
+    EXPECT_NE(torn.err.find("one list of events, those behind"), std::string::npos) << torn.err;
     const std::string lines = view({two}, {report_format::jsonl});
     EXPECT_NE(lines.find("\"test_id\""), lines.rfind("\"test_id\"")) << lines;
 }
