@@ -1,7 +1,5 @@
 #include "kivtool/config/config_build.h"
 
-#include <utility>
-
 #include "config.pb.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/config_lint.h"
@@ -24,10 +22,10 @@ std::string read_parts(const std::vector<part_source>& sources, std::vector<part
     return problem;
 }
 
-std::string lint(const std::vector<part_content>& parts, const std::string& path,
-                 std::ostream& err) {
+std::string lint(const kiv::config::ConfigResponse& file, const std::vector<part_content>& parts,
+                 const std::string& path, std::ostream& err) {
     lint_findings findings;
-    lint_config(parts, path, findings);
+    lint_config(file.SerializeAsString(), parts, path, findings);
     findings.print(err);
     if (!findings.has_errors()) return "";
     return printable(path) +
@@ -46,21 +44,13 @@ std::string build(const std::vector<part_source>& sources, const config_build_op
                   std::ostream& err) {
     std::vector<part_content> parts;
     std::string problem = read_parts(sources, parts);
-    if (problem.empty() && !options.no_lint) problem = lint(parts, options.output_path, err);
     if (!problem.empty()) return problem;
-    kiv::config::ConfigPackage package;
-    for (part_content& part : parts) {
-        kiv::config::ConfigPart& packed = *package.add_parts();
-        packed.set_package(std::move(part.package));
-        packed.set_name(std::move(part.name));
-        packed.set_payload(std::move(part.payload));
-    }
-
     const std::string output = printable(options.output_path) + ": ";
     kiv::config::ConfigResponse file;
-    problem = compress_package(package, *file.mutable_compressed_data());
+    problem = pack_parts(parts, file);
     if (!problem.empty()) return output + problem;
-    if (options.key_path) problem = add_signature(*options.key_path, file);
+    if (!options.no_lint) problem = lint(file, parts, options.output_path, err);
+    if (problem.empty() && options.key_path) problem = add_signature(*options.key_path, file);
     if (!problem.empty()) return problem;
 
     // Fields are written by their numbers, the signature first.

@@ -1,10 +1,11 @@
 #include "kivtool/config/config_file.h"
 
+#include <google/protobuf/io/gzip_stream.h>
+#include <google/protobuf/io/zero_copy_stream_impl_lite.h>
 #include <zlib.h>
 
 #include <cstdint>
 #include <cstdio>
-#include <new>
 
 #include "toolkit/length_varint.h"
 #include "toolkit/unpacked_bytes.h"
@@ -12,10 +13,10 @@
 namespace kivd {
 namespace {
 
+namespace protobuf = google::protobuf;
+
 constexpr char signature_key = 0x0a;
 constexpr char compressed_data_key = 0x12;
-constexpr int gzip_framing = 16;  // added to the window's bits
-constexpr int memory_level = 8;
 
 // Takes the field whose key has been taken off the start of `bytes`.
 std::string take_field(const std::string& what, std::string_view& bytes,
@@ -74,20 +75,11 @@ std::string compress_package(const kiv::config::ConfigPackage& package,
         return "the parts take " + std::to_string(size) + " bytes, a package has at most " +
                std::to_string(max_package_size);
     }
-    std::string packed = package.SerializeAsString();
-    z_stream stream{};
-    if (deflateInit2(&stream, Z_BEST_COMPRESSION, Z_DEFLATED, gzip_framing + MAX_WBITS,
-                     memory_level, Z_DEFAULT_STRATEGY) != Z_OK) {
-        throw std::bad_alloc();
-    }
-    compressed_data.resize(deflateBound(&stream, packed.size()));
-    stream.next_in = reinterpret_cast<Bytef*>(packed.data());
-    stream.avail_in = static_cast<uInt>(packed.size());
-    stream.next_out = reinterpret_cast<Bytef*>(compressed_data.data());
-    stream.avail_out = static_cast<uInt>(compressed_data.size());
-    const bool is_done = deflate(&stream, Z_FINISH) == Z_STREAM_END;
-    compressed_data.resize(stream.total_out);
-    deflateEnd(&stream);
+    protobuf::io::StringOutputStream bytes(&compressed_data);
+    protobuf::io::GzipOutputStream::Options options;
+    options.compression_level = Z_BEST_COMPRESSION;
+    protobuf::io::GzipOutputStream gzip(&bytes, options);
+    const bool is_done = package.SerializeToZeroCopyStream(&gzip) && gzip.Close();
     return is_done ? "" : "the parts cannot be compressed";
 }
 

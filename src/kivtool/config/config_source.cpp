@@ -34,4 +34,17 @@ std::string read_part(const part_source& source, part_content& part) {
     return text_problem.empty() ? "" : printable(source.path) + ":" + text_problem;
 }
 
+std::string pack_parts(std::span<const part_content> parts, kiv::config::ConfigResponse& file) {
+    kiv::config::ConfigPackage package;
+    for (const part_content& part : parts) {
+        kiv::config::ConfigPart& packed = *package.add_parts();
+        packed.set_package(part.package);
+        packed.set_name(part.name);
+        packed.set_payload(part.payload);
+    }
+    const std::string problem = compress_package(package, *file.mutable_compressed_data());
+    config_file ignored;
+    return problem.empty() ? split_config_file(file.SerializeAsString(), ignored) : problem;
+}
+
 }  // namespace kivd

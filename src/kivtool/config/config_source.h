@@ -5,7 +5,10 @@
 
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
+
+#include "config.pb.h"
 
 namespace kivd {
 
@@ -32,5 +35,10 @@ struct part_content {
 // Reads the part's file, and encodes it when it is the daemon's. Gives what is wrong as a sentence
 // that starts with the path, empty when it is done.
 [[nodiscard]] std::string read_part(const part_source& source, part_content& part);
+
+// Makes an unsigned configuration file; the same parts give the same bytes. Gives what is wrong as
+// the end of a sentence about the file, empty when the daemon takes a file of that size.
+[[nodiscard]] std::string pack_parts(std::span<const part_content> parts,
+                                     kiv::config::ConfigResponse& file);
 
 }  // namespace kivd
