@@ -2,7 +2,8 @@
 
 #include <cstdint>
 
-#include "toolkit/length_varint.h"
+#include "format/varint.h"
+#include "util/bytes.h"
 
 namespace kivd {
 namespace {
@@ -21,10 +22,9 @@ size_t read_head(std::string_view head) {
 // The packet in a message; none when the message holds anything else.
 std::optional<std::string_view> find_packet(std::string_view message) {
     if (message[0] != packet_key) return std::nullopt;
-    const length_varint length = read_length(message.substr(1));
-    const std::string_view packet = message.substr(1 + length.size);
-    if (length.size == 0 || length.value != packet.size()) return std::nullopt;
-    return packet;
+    std::span<const uint8_t> packet = bytes_of(message.substr(1));
+    const std::optional<uint64_t> length = take_varint(packet, max_varint32_size);
+    return length == packet.size() ? std::optional(text_of(packet)) : std::nullopt;
 }
 
 }  // namespace

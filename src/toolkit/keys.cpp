@@ -3,28 +3,23 @@
 #include <openssl/err.h>
 #include <openssl/pem.h>
 
-#include <array>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
 #include <new>
 
+#include "format/config_file.h"
 #include "toolkit/text_escape.h"
+#include "util/bytes.h"
 
 namespace kivd {
 namespace {
-
-using unique_digest = std::unique_ptr<EVP_MD_CTX, releaser<EVP_MD_CTX_free>>;
 
 unique_digest new_digest() {
     unique_digest digest(EVP_MD_CTX_new());
     if (!digest) throw std::bad_alloc();
     return digest;
-}
-
-const uint8_t* bytes_of(std::string_view text) {
-    return reinterpret_cast<const uint8_t*>(text.data());
 }
 
 }  // namespace
@@ -46,11 +41,11 @@ std::string sign(EVP_PKEY& private_key, std::string_view data, std::string& sign
     size_t size = 0;
     bool is_signed =
         EVP_DigestSignInit(digest.get(), nullptr, EVP_sha1(), nullptr, &private_key) == 1 &&
-        EVP_DigestSign(digest.get(), nullptr, &size, bytes_of(data), data.size()) == 1;
+        EVP_DigestSign(digest.get(), nullptr, &size, bytes_of(data).data(), data.size()) == 1;
     if (is_signed) {
         signature.resize(size);
         is_signed = EVP_DigestSign(digest.get(), reinterpret_cast<uint8_t*>(signature.data()),
-                                   &size, bytes_of(data), data.size()) == 1;
+                                   &size, bytes_of(data).data(), data.size()) == 1;
         signature.resize(size);
     }
     ERR_clear_error();
@@ -65,25 +60,18 @@ bool signature_holds(EVP_PKEY& public_key, std::string_view data, std::string_vi
     const unique_digest digest = new_digest();
     const bool holds =
         EVP_DigestVerifyInit(digest.get(), nullptr, EVP_sha1(), nullptr, &public_key) == 1 &&
-        EVP_DigestVerify(digest.get(), bytes_of(signature), signature.size(), bytes_of(data),
-                         data.size()) == 1;
+        EVP_DigestVerify(digest.get(), bytes_of(signature).data(), signature.size(),
+                         bytes_of(data).data(), data.size()) == 1;
     ERR_clear_error();
     return holds;
 }
 
 std::string sha1_text(std::string_view data) {
-    std::array<uint8_t, EVP_MAX_MD_SIZE> digest;
-    unsigned size = 0;
-    if (EVP_Digest(data.data(), data.size(), digest.data(), &size, EVP_sha1(), nullptr) != 1) {
+    config_checksum digest;
+    if (EVP_Digest(data.data(), data.size(), digest.data(), nullptr, EVP_sha1(), nullptr) != 1) {
         throw std::bad_alloc();
     }
-    std::string text;
-    for (unsigned i = 0; i < size; ++i) {
-        char digits[3];
-        snprintf(digits, sizeof digits, "%02x", digest[i]);
-        text += digits;
-    }
-    return text;
+    return text_of_checksum(digest).data();
 }
 
 }  // namespace kivd

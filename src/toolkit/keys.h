@@ -4,15 +4,12 @@
 #include <openssl/evp.h>
 
 #include <cstddef>
-#include <memory>
 #include <string>
 #include <string_view>
 
-#include "util/unique_fd.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
-
-using unique_pkey = std::unique_ptr<EVP_PKEY, releaser<EVP_PKEY_free>>;
 
 enum class key_half { private_half, public_half };
 

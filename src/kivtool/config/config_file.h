@@ -12,10 +12,6 @@
 
 namespace kivd {
 
-// What the daemon takes, in bytes.
-inline constexpr size_t max_config_file_size = 204799;
-inline constexpr size_t max_package_size = size_t{8} << 20;  // decompressed
-
 struct config_file {
     std::optional<std::string_view> signature;
     std::string_view compressed_data;

@@ -7,6 +7,8 @@
 #include <utility>
 
 #include "config.pb.h"
+#include "format/config_file.h"
+#include "format/list_record.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/config_trial.h"
 #include "kivtool/config/filter_lint.h"
@@ -20,7 +22,6 @@ namespace {
 // Around package and name in a record of the daemon's list of parts: NULs, a line feed, whether it
 // is in use, and an id of up to 10 digits.
 constexpr size_t max_record_overhead = 17;
-constexpr size_t max_list_record = 1024;
 
 constexpr size_t near = 2;           // letters in which two names differ
 constexpr size_t longest_near = 64;  // letters of a name that may be near another
@@ -66,10 +67,10 @@ void lint_id(const part_content& part, lint_findings& findings) {
     lint_text(place_of(part), "package", part.package, nobody, findings);
     lint_text(place_of(part), "name", part.name, nobody, findings);
     const size_t size = part.package.size() + part.name.size() + max_record_overhead;
-    if (size <= max_list_record) return;
+    if (size <= list_record_size_max) return;
     findings.warning(place_of(part), "package and name make a record of up to " +
                                          std::to_string(size) + " bytes; the daemon reads " +
-                                         std::to_string(max_list_record) +
+                                         std::to_string(list_record_size_max) +
                                          " at most and forgets this part and others at its next "
                                          "start");
 }
@@ -137,7 +138,7 @@ int run_config_lint(const std::vector<std::string>& arguments, std::ostream& out
             continue;
         }
         std::string bytes;
-        const std::string problem = read_whole_file(argument, max_package_size, bytes);
+        const std::string problem = read_whole_file(argument, max_config_package_size, bytes);
         if (!problem.empty()) {
             problems.push_back(printable(argument) + ": " + problem);
             continue;

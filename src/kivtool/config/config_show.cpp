@@ -3,6 +3,7 @@
 #include <string_view>
 #include <vector>
 
+#include "format/config_file.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/part_text.h"
 #include "toolkit/keys.h"

@@ -2,6 +2,7 @@
 
 #include <utility>
 
+#include "format/config_file.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/part_text.h"
 #include "toolkit/text_escape.h"
@@ -22,7 +23,7 @@ std::optional<part_source> read_part_argument(const std::string& argument) {
 std::string read_part(const part_source& source, part_content& part) {
     part = {source.package, source.name, "", source.path, nullptr};
     std::string content;
-    const std::string problem = read_whole_file(source.path, max_package_size, content);
+    const std::string problem = read_whole_file(source.path, max_config_package_size, content);
     if (!problem.empty()) return printable(source.path) + ": " + problem;
     const auto* type = daemon_part_type(source.package, source.name);
     if (!type) {

@@ -19,6 +19,7 @@
 #include "runtime/daemon_error.h"
 #include "security/key_paths.h"
 #include "toolkit/text_escape.h"
+#include "util/bytes.h"
 #include "util/paths.h"
 
 namespace kivd {
@@ -165,10 +166,7 @@ void try_config(std::string_view bytes, std::span<const part_content> parts,
     };
     trial_daemon daemon;
     bool is_stored = false;
-    judge(whole, findings, [&] {
-        is_stored =
-            store_configuration({reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()});
-    });
+    judge(whole, findings, [&] { is_stored = store_configuration(bytes_of(bytes)); });
     if (!is_stored) return;
     judge(place_of_own("Settings"), findings, apply_settings);
     judge(place_of_own("FilterConfig"), findings, apply_filter_config);

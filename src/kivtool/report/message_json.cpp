@@ -7,6 +7,8 @@
 #include <string>
 #include <vector>
 
+#include "util/bytes.h"
+
 namespace kivd {
 namespace {
 
@@ -19,8 +21,7 @@ constexpr int no_list = -1;
 std::string base64(const std::string& bytes) {
     std::string text((bytes.size() + 2) / 3 * 4 + 1, '\0');  // with a NUL
     const int size = EVP_EncodeBlock(reinterpret_cast<uint8_t*>(text.data()),
-                                     reinterpret_cast<const uint8_t*>(bytes.data()),
-                                     static_cast<int>(bytes.size()));
+                                     bytes_of(bytes).data(), static_cast<int>(bytes.size()));
     text.resize(static_cast<size_t>(size));
     return text;
 }
