@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstring>
 #include <new>
+#include <stdexcept>
 
 #include "format/config_file.h"
 #include "toolkit/text_escape.h"
@@ -24,23 +25,25 @@ unique_digest new_digest() {
 
 }  // namespace
 
-std::string read_key(const std::string& path, key_half half, unique_pkey& key) {
+unique_pkey read_key(const std::string& path, key_half half) {
     const unique_file file(fopen(path.c_str(), "re"));
-    if (!file) return printable(path) + ": cannot be opened: " + strerror(errno);
+    if (!file) throw std::runtime_error(printable(path) + ": cannot be opened: " + strerror(errno));
     const bool is_private = half == key_half::private_half;
     const auto read = is_private ? PEM_read_PrivateKey : PEM_read_PUBKEY;
-    key.reset(read(file.get(), nullptr, nullptr, nullptr));
+    unique_pkey key(read(file.get(), nullptr, nullptr, nullptr));
     ERR_clear_error();
-    if (key) return "";
-    return printable(path) + ": holds no " + (is_private ? "private" : "public") +
-           " key in PEM form that can be read";
+    if (key) return key;
+    throw std::runtime_error(printable(path) + ": holds no " + (is_private ? "private" : "public") +
+                             " key in PEM form that can be read");
 }
 
-std::string sign(EVP_PKEY& private_key, std::string_view data, std::string& signature) {
+std::string sign(const std::string& key_path, std::string_view data) {
+    const unique_pkey key = read_key(key_path, key_half::private_half);
     const unique_digest digest = new_digest();
     size_t size = 0;
+    std::string signature;
     bool is_signed =
-        EVP_DigestSignInit(digest.get(), nullptr, EVP_sha1(), nullptr, &private_key) == 1 &&
+        EVP_DigestSignInit(digest.get(), nullptr, EVP_sha1(), nullptr, key.get()) == 1 &&
         EVP_DigestSign(digest.get(), nullptr, &size, bytes_of(data).data(), data.size()) == 1;
     if (is_signed) {
         signature.resize(size);
@@ -49,10 +52,10 @@ std::string sign(EVP_PKEY& private_key, std::string_view data, std::string& sign
         signature.resize(size);
     }
     ERR_clear_error();
-    if (!is_signed) return "cannot sign SHA-1 digests";
-    if (size <= max_signature_size) return "";
-    return "makes signatures of " + std::to_string(size) + " bytes, the daemon reads " +
-           std::to_string(max_signature_size);
+    if (!is_signed) throw std::runtime_error(printable(key_path) + ": cannot sign SHA-1 digests");
+    if (size <= max_signature_size) return signature;
+    throw std::runtime_error(printable(key_path) + ": makes signatures of " + std::to_string(size) +
+                             " bytes, the daemon reads " + std::to_string(max_signature_size));
 }
 
 bool signature_holds(EVP_PKEY& public_key, std::string_view data, std::string_view signature) {

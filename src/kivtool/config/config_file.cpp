@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <cstdio>
+#include <stdexcept>
 
 #include "format/config_file.h"
 #include "toolkit/unpacked_bytes.h"
@@ -25,18 +26,12 @@ std::string no_package(bool is_signed, std::string_view rest) {
     return text;
 }
 
-}  // namespace
-
-std::string split_config_file(std::string_view bytes, config_file& file) {
+// Why bytes are no configuration file; empty when they are one.
+std::string fault_of(std::string_view bytes, config_fields& fields) {
     if (bytes.empty()) return "the file is empty";
-    if (bytes.size() > max_config_file_size) {
-        return "a configuration has at most " + std::to_string(max_config_file_size) +
-               " bytes, this one has " + std::to_string(bytes.size());
-    }
-    config_fields fields;
     switch (find_config_fields(bytes_of(bytes), fields)) {
         case config_fault::none:
-            break;
+            return "";
         case config_fault::no_package:
             return no_package(fields.signature.has_value(), text_of(fields.rest));
         case config_fault::bad_length:
@@ -46,45 +41,66 @@ std::string split_config_file(std::string_view bytes, config_file& file) {
         case config_fault::cut_package:
             return "the package is cut short";
     }
-    if (fields.signature) file.signature = text_of(*fields.signature);
-    file.compressed_data = text_of(fields.package);
-    file.ignored_size = fields.rest.size();
     return "";
 }
 
-std::string compress_package(const kiv::config::ConfigPackage& package,
-                             std::string& compressed_data) {
-    const size_t size = package.ByteSizeLong();
-    if (size > max_config_package_size) {
-        return "the parts take " + std::to_string(size) + " bytes, a package has at most " +
-               std::to_string(max_config_package_size);
-    }
-    protobuf::io::StringOutputStream bytes(&compressed_data);
-    protobuf::io::GzipOutputStream::Options options;
-    options.compression_level = Z_BEST_COMPRESSION;
-    protobuf::io::GzipOutputStream gzip(&bytes, options);
-    const bool is_done = package.SerializeToZeroCopyStream(&gzip) && gzip.Close();
-    return is_done ? "" : "the parts cannot be compressed";
+}  // namespace
+
+config_file split_config_file(std::string_view bytes) {
+    config_fields fields;
+    const std::string fault = fault_of(bytes, fields);
+    if (!fault.empty()) throw std::runtime_error("is no configuration: " + fault);
+    return {fields.signature ? std::optional(text_of(*fields.signature)) : std::nullopt,
+            text_of(fields.package), fields.rest.size()};
 }
 
-std::string decompress_package(std::string_view compressed_data,
-                               kiv::config::ConfigPackage& package,
-                               std::vector<std::string>& notes) {
+kiv::config::ConfigPackage decompress_package(std::string_view compressed_data,
+                                              std::vector<std::string>& notes) {
     unpacked_bytes bytes(compressed_data, "the compressed package");
     std::string packed;
     while (packed.size() <= max_config_package_size && bytes.read_some(packed)) {
     }
     if (packed.size() > max_config_package_size) {
-        return "the package has more than " + std::to_string(max_config_package_size) + " bytes";
+        throw std::runtime_error("the package has more than " +
+                                 std::to_string(max_config_package_size) + " bytes");
     }
     if (bytes.has_foreign_tail()) {
         notes.push_back(bytes.problem() + " and are ignored");
     } else if (!bytes.problem().empty()) {
-        return bytes.problem();
+        throw std::runtime_error(bytes.problem());
     }
-    if (!package.ParseFromString(packed)) return "the package cannot be decoded";
+    kiv::config::ConfigPackage package;
+    if (!package.ParseFromString(packed)) {
+        throw std::runtime_error("the package cannot be decoded");
+    }
     if (!bytes.is_gzip()) notes.emplace_back("the package is not compressed");
-    return "";
+    return package;
+}
+
+std::string compress_package(const kiv::config::ConfigPackage& package) {
+    const size_t size = package.ByteSizeLong();
+    if (size > max_config_package_size) {
+        throw std::runtime_error("the parts take " + std::to_string(size) +
+                                 " bytes, a package has at most " +
+                                 std::to_string(max_config_package_size));
+    }
+    std::string compressed_data;
+    protobuf::io::StringOutputStream bytes(&compressed_data);
+    protobuf::io::GzipOutputStream::Options options;
+    options.compression_level = Z_BEST_COMPRESSION;
+    protobuf::io::GzipOutputStream gzip(&bytes, options);
+    if (!package.SerializeToZeroCopyStream(&gzip) || !gzip.Close()) {
+        throw std::runtime_error("the parts cannot be compressed");
+    }
+    return compressed_data;
+}
+
+// Fields are written by their numbers, the signature first.
+std::string join_config_file(const kiv::config::ConfigResponse& file) {
+    const std::string bytes = file.SerializeAsString();
+    if (bytes.size() <= max_config_file_size) return bytes;
+    throw std::runtime_error("a configuration has at most " + std::to_string(max_config_file_size) +
+                             " bytes, this one has " + std::to_string(bytes.size()));
 }
 
 }  // namespace kivd

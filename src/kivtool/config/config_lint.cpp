@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <numeric>
 #include <set>
+#include <stdexcept>
 #include <string_view>
 #include <utility>
 
@@ -22,6 +23,8 @@ namespace {
 // Around package and name in a record of the daemon's list of parts: NULs, a line feed, whether it
 // is in use, and an id of up to 10 digits.
 constexpr size_t max_record_overhead = 17;
+
+constexpr char refuses[] = "; the daemon refuses the configuration";
 
 constexpr size_t near = 2;           // letters in which two names differ
 constexpr size_t longest_near = 64;  // letters of a name that may be near another
@@ -91,28 +94,47 @@ void lint_parts(std::span<const part_content> parts, lint_findings& findings) {
 }
 
 // The parts of a configuration file. What is wrong with the file itself is an error, too.
-void read_config_file(const std::string& path, std::string_view bytes,
-                      std::vector<part_content>& parts, lint_findings& findings) {
+std::vector<part_content> read_config_file(const std::string& path, std::string_view bytes,
+                                           lint_findings& findings) {
     const lint_place place = {path, 0, ""};
-    const auto refuse = [&](const std::string& problem) {
-        findings.error(place, problem + "; the daemon refuses the configuration");
-    };
-    config_file file;
-    std::string problem = split_config_file(bytes, file);
-    if (!problem.empty()) return refuse(problem);
-    if (file.ignored_size > 0) {
-        findings.warning(place, std::to_string(file.ignored_size) +
-                                    " bytes behind the package; the daemon ignores them");
-    }
+    std::vector<part_content> parts;
     std::vector<std::string> notes;
-    kiv::config::ConfigPackage package;
-    problem = decompress_package(file.compressed_data, package, notes);
-    for (const std::string& note : notes) findings.warning(place, note);
-    if (!problem.empty()) return refuse(problem);
-    for (auto& part : *package.mutable_parts()) {
-        parts.push_back({std::move(*part.mutable_package()), std::move(*part.mutable_name()),
-                         std::move(*part.mutable_payload()), path, nullptr});
+    try {
+        const config_file file = split_config_file(bytes);
+        if (file.ignored_size > 0) {
+            notes.push_back(std::to_string(file.ignored_size) +
+                            " bytes behind the package; the daemon ignores them");
+        }
+        kiv::config::ConfigPackage package = decompress_package(file.compressed_data, notes);
+        for (auto& part : *package.mutable_parts()) {
+            parts.push_back({std::move(*part.mutable_package()), std::move(*part.mutable_name()),
+                             std::move(*part.mutable_payload()), path, nullptr});
+        }
+    } catch (const std::runtime_error& error) {
+        findings.error(place, std::string(error.what()) + refuses);
     }
+    for (const std::string& note : notes) findings.warning(place, note);
+    return parts;
+}
+
+void lint_file(const std::string& path, lint_findings& findings) {
+    const std::string bytes = read_whole_file(path, max_config_file_size);
+    lint_findings about_file;
+    const auto parts = read_config_file(path, bytes, about_file);
+    if (!about_file.has_errors()) lint_config(bytes, parts, path, about_file);
+    findings.append(std::move(about_file));
+}
+
+// Parts that are to become one configuration.
+void lint_given(std::span<const part_content> parts, lint_findings& findings) {
+    constexpr char path[] = "configuration";
+    std::string bytes;
+    try {
+        bytes = join_config_file(pack_parts(parts));
+    } catch (const std::runtime_error& error) {
+        return findings.error({path, 0, ""}, std::string(error.what()) + refuses);
+    }
+    lint_config(bytes, parts, path, findings);
 }
 
 }  // namespace
@@ -130,34 +152,19 @@ int run_config_lint(const std::vector<std::string>& arguments, std::ostream& out
     bool all_given = true;
     std::vector<std::string> problems;
     for (const std::string& argument : arguments) {
-        if (const auto source = read_part_argument(argument)) {
-            const std::string problem = read_part(*source, given.emplace_back());
-            if (problem.empty()) continue;
-            problems.push_back(problem);
-            all_given = false;
-            continue;
-        }
-        std::string bytes;
-        const std::string problem = read_whole_file(argument, max_config_package_size, bytes);
-        if (!problem.empty()) {
-            problems.push_back(printable(argument) + ": " + problem);
-            continue;
-        }
-        lint_findings about_file;
-        std::vector<part_content> parts;
-        read_config_file(argument, bytes, parts, about_file);
-        if (!about_file.has_errors()) lint_config(bytes, parts, argument, about_file);
-        findings.append(std::move(about_file));
-    }
-    if (!given.empty() && all_given) {
-        kiv::config::ConfigResponse file;
-        const std::string problem = pack_parts(given, file);
-        if (problem.empty()) {
-            lint_config(file.SerializeAsString(), given, "configuration", findings);
-        } else {
-            findings.error({"configuration", 0, ""}, problem + "; the daemon refuses it");
+        const auto source = read_part_argument(argument);
+        try {
+            if (source) {
+                given.push_back(read_part(*source));
+            } else {
+                lint_file(argument, findings);
+            }
+        } catch (const std::exception& error) {
+            problems.emplace_back(error.what());
+            all_given = all_given && !source;
         }
     }
+    if (!given.empty() && all_given) lint_given(given, findings);
     findings.print(out);
     out.flush();
     for (const std::string& problem : problems) err << "kivtool: " << problem << '\n';
