@@ -2,6 +2,7 @@
 
 #include <cstdint>
 
+#include "format/request_words.h"
 #include "format/varint.h"
 #include "util/bytes.h"
 
@@ -9,9 +10,9 @@ namespace kivd {
 namespace {
 
 constexpr size_t head_size = 4;
-constexpr char packet_key = 0x0a;               // field 1, length-delimited
-constexpr size_t message_size_min = 2;          // of an empty packet
-constexpr size_t message_size_max = 4 + 31176;  // of the largest one
+constexpr char packet_key = 0x0a;                         // field 1, length-delimited
+constexpr size_t message_size_min = 2;                    // of an empty packet
+constexpr size_t message_size_max = 4 + max_packet_size;  // of the largest one
 
 size_t read_head(std::string_view head) {
     size_t size = 0;
