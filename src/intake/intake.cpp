@@ -76,15 +76,7 @@ void put_in_force(const config_checksum& checksum) {
 
 bool take_config_file(std::span<const uint8_t> file) {
     config_checksum checksum;
-    if (!checksum_of(file, checksum)) return false;
-    if (!extract_config_fields(file)) return refuse("Failed to unpack configuration");
-    if (config_key_available() &&
-        !verify_file(paths::new_config_data, paths::new_config_signature)) {
-        return refuse("Failed to verify configuration");
-    }
-    const std::optional<file_bytes> package = read_config_package();
-    if (!package) return refuse("Failed to read configuration");
-    if (!store_package(package->view())) return refuse("Failed to parse configuration");
+    if (!checksum_of(file, checksum) || !store_configuration(file)) return false;
     put_in_force(checksum);
     return true;
 }
@@ -132,6 +124,18 @@ void install_first_configuration() {
     while ((size = read(source.get(), chunk.data(), chunk.size())) > 0) {
         if (!write_all(copy.get(), chunk.data(), static_cast<size_t>(size))) return;
     }
+}
+
+bool store_configuration(std::span<const uint8_t> file) {
+    if (!extract_config_fields(file)) return refuse("Failed to unpack configuration");
+    if (config_key_available() &&
+        !verify_file(paths::new_config_data, paths::new_config_signature)) {
+        return refuse("Failed to verify configuration");
+    }
+    const std::optional<file_bytes> package = read_config_package();
+    if (!package) return refuse("Failed to read configuration");
+    if (!store_package(package->view())) return refuse("Failed to parse configuration");
+    return true;
 }
 
 bool take_new_configuration() {

@@ -2,6 +2,7 @@
 // docs/configuration.md.
 #pragma once
 
+#include <cstdint>
 #include <span>
 
 namespace kivd {
@@ -12,6 +13,10 @@ void replace_config_file(std::span<const char> bytes);
 // Copies the system's first configuration to input/config unless there is one. Failures have been
 // logged.
 void install_first_configuration();
+
+// Makes the parts of a configuration file those in force, without anything else following them yet.
+// False when it was refused, which has been logged and raised.
+[[nodiscard]] bool store_configuration(std::span<const uint8_t> file);
 
 // Takes input/config and has everything follow it: settings, report header, filters, actions. False
 // when there is none, or when it was refused, which has been logged and raised; what was in force

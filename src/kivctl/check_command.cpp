@@ -11,8 +11,8 @@
 #include "kivctl/daemon_state.h"
 #include "kivctl/directory_faults.h"
 #include "kivctl/io.h"
-#include "kivctl/json.h"
 #include "report/output_dir.h"
+#include "toolkit/json.h"
 #include "toolkit/text_escape.h"
 #include "util/paths.h"
 
@@ -282,17 +282,15 @@ void print_text(const findings& result) {
 }
 
 void print_json(const findings& result, const check_options& options, bool is_alive) {
-    std::vector<std::string> found, not_checked;
+    json found = json::array();
     for (const auto& [id, what, why, remedy] : result.found) {
-        found.push_back(json_object(
-            {{"id", json(id)}, {"what", json(what)}, {"why", json(why)}, {"to_do", json(remedy)}}));
+        found.push_back({{"id", id}, {"what", json_text(what)}, {"why", why}, {"to_do", remedy}});
     }
-    for (const std::string& id : result.not_checked) not_checked.push_back(json(id));
-    print_line(json_object({{"directory", json(options.base)},
-                            {"answers", json(is_alive)},
-                            {"findings", json_array(found)},
-                            {"not_checked", json_array(not_checked)}})
-                   .c_str());
+    const json all = {{"directory", json_text(options.base)},
+                      {"answers", is_alive},
+                      {"findings", found},
+                      {"not_checked", result.not_checked}};
+    print_line(all.dump().c_str());
 }
 
 }  // namespace

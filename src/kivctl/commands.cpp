@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <limits>
 
+#include "format/config_file.h"
 #include "kivctl/check_command.h"
 #include "kivctl/files.h"
 #include "kivctl/io.h"
@@ -14,9 +15,6 @@
 
 namespace kivd {
 namespace {
-
-// What the daemon takes from its directory; a request carries less.
-constexpr size_t config_file_size_max = 204'799;
 
 // `text` as a number, cut to the range of the type; false when it isn't one.
 bool parse_number(const std::string& text, int64_t& number) {
@@ -100,7 +98,7 @@ int tell_whether_taken(int result, const char* when_not) {
 }
 
 int install_config(kiv_handle* daemon, const given& g) {
-    const std::string config = read_source(g.file, config_file_size_max, "a configuration");
+    const std::string config = read_source(g.file, max_config_file_size, "a configuration");
     if (config.empty()) throw failure(name_source(g.file) + " is empty");
     if (config.size() > KIV_CONFIG_MAX) {
         throw failure(name_source(g.file) + " has " + std::to_string(config.size()) +

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <chrono>
 #include <climits>
 #include <filesystem>
@@ -16,11 +15,13 @@
 #include "config/limits.h"
 #include "daemon/option_names.h"
 #include "diag/diag_store.h"
+#include "format/config_file.h"
 #include "format/report_name.h"
 #include "kivctl/io.h"
 #include "report/output_dir.h"
 #include "runtime/daemon_error.h"
 #include "settings.pb-c.h"
+#include "util/bytes.h"
 #include "util/directory.h"
 #include "util/file_io.h"
 #include "util/numbers.h"
@@ -33,11 +34,6 @@ namespace {
 
 constexpr size_t line_size = 256;  // as the daemon reads the file
 constexpr size_t config_request_size_max = 1'000'000;
-constexpr size_t checksum_digits = 40;
-
-std::span<const uint8_t> bytes_of(const std::string& text) {
-    return {reinterpret_cast<const uint8_t*>(text.data()), text.size()};
-}
 
 std::optional<int64_t> scan_value(const char* line, const char* key, size_t width = 0) {
     const char* const text = scan_key(line, key);
@@ -57,7 +53,7 @@ void read_state_line(const char* line, saved_state& state) {
         state.error_time = saturate_int32(*time);
     } else if (const char* const text = scan_key(line, "config-checksum:")) {
         const std::string_view digits = scan_word(text, line_size);
-        if (digits.size() == checksum_digits) state.checksum = digits;
+        if (parse_checksum(digits)) state.checksum = digits;
     }
 }
 
@@ -80,14 +76,10 @@ std::optional<std::string> find_requested_checksum() {
     const auto request =
         unpack_message<kiv__config__config_request__unpack,
                        kiv__config__config_request__free_unpacked>(bytes_of(*text));
-    if (!request || request->current_config.len * 2 != checksum_digits) return std::nullopt;
-    std::string digits;
-    for (size_t i = 0; i < request->current_config.len; ++i) {
-        constexpr char hex[] = "0123456789abcdef";
-        digits += hex[request->current_config.data[i] >> 4U];
-        digits += hex[request->current_config.data[i] & 0xFU];
-    }
-    return digits;
+    config_checksum checksum;
+    if (!request || request->current_config.len != checksum.size()) return std::nullopt;
+    std::copy_n(request->current_config.data, checksum.size(), checksum.begin());
+    return text_of_checksum(checksum).data();
 }
 
 // Without the part that switches the store it stays as it was: then only two things tell that it is
@@ -117,16 +109,6 @@ std::optional<uint64_t> find_partial_size() {
     return 0;
 }
 
-// The number of a report whose name is just as the daemon writes it; else it could not delete it.
-std::optional<int64_t> find_report_number(std::string_view name) {
-    if (!name.starts_with(report_prefix)) return std::nullopt;
-    name.remove_prefix(sizeof report_prefix - 1);
-    int64_t number = 0;
-    const auto parsed = std::from_chars(name.data(), name.data() + name.size(), number);
-    if (parsed.ec != std::errc{} || std::to_string(number) != name) return std::nullopt;
-    return number >= 0 && number <= INT32_MAX ? std::optional(number) : std::nullopt;
-}
-
 void add_entry(output_facts& found, std::string_view name) {
     const std::string path = paths::output_dir + std::string(name);
     struct stat status = {};
@@ -136,7 +118,8 @@ void add_entry(output_facts& found, std::string_view name) {
         found.has_marker = true;
         return;
     }
-    const auto number = find_report_number(name);
+    // A report by another name could not be deleted by the daemon.
+    const auto number = parse_report_name(name.data());
     if (!number || !S_ISREG(status.st_mode)) {
         found.bad_names.emplace_back(name);
         return;

@@ -28,8 +28,8 @@ struct saved_state {
 struct output_facts {
     uint64_t size = 0;  // of all that counts towards the limit
     int64_t reports = 0;
-    int64_t lowest = 0;  // 0 without reports
-    int64_t highest = 0;
+    int32_t lowest = 0;  // 0 without reports
+    int32_t highest = 0;
     bool has_marker = false;
     std::vector<std::string> bad_names;  // which are neither reports nor the daemon's own
 };

@@ -2,7 +2,6 @@
 
 #include <grp.h>
 #include <openssl/err.h>
-#include <openssl/evp.h>
 #include <openssl/pem.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -12,16 +11,13 @@
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
-#include <memory>
 
 #include "security/seal.h"
 #include "util/file_io.h"
-#include "util/unique_fd.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {
-
-using unique_key = std::unique_ptr<EVP_PKEY, releaser<EVP_PKEY_free>>;
 
 bool is_usable(const EVP_PKEY* key, key_use use) {
     if (key == nullptr) return false;
@@ -42,7 +38,7 @@ key_verdict inspect(const char* path, key_use use) {
     const unique_file file = open_to_read(path);
     if (!file) return key_verdict::unusable;
     char no_pass_phrase[] = "";
-    const unique_key key(PEM_read_PUBKEY(file.get(), nullptr, nullptr, no_pass_phrase));
+    const unique_pkey key(PEM_read_PUBKEY(file.get(), nullptr, nullptr, no_pass_phrase));
     ERR_clear_error();
     return is_usable(key.get(), use) ? key_verdict::usable : key_verdict::unusable;
 }

@@ -6,8 +6,8 @@
 
 #include "kivctl/daemon_state.h"
 #include "kivctl/io.h"
-#include "kivctl/json.h"
 #include "runtime/daemon_error.h"
+#include "toolkit/json.h"
 #include "toolkit/text_escape.h"
 
 namespace kivd {
@@ -169,58 +169,58 @@ void print_text(const status_options& options, const daemon_state& state) {
     print_line(text.c_str());
 }
 
-std::string json_key(const std::string& path, key_verdict verdict) {
-    return json_object({
-        {"on", json(text_of(verdict).is_on)},
-        {"key", json(text_of(verdict).name)},
-        {"path", path.empty() ? "null" : json(path)},
-    });
+json json_of_key(const std::string& path, key_verdict verdict) {
+    return {{"on", json_or_null(text_of(verdict).is_on)},
+            {"key", text_of(verdict).name},
+            {"path", path.empty() ? json() : json_text(path)}};
 }
 
 // A number of `facts`, or null without them.
 template <class type, class field_type>
-std::string json_field(const std::optional<type>& facts, field_type type::*field) {
-    return facts ? json((*facts).*field) : "null";
+json json_field(const std::optional<type>& facts, field_type type::*field) {
+    return facts ? json((*facts).*field) : json();
 }
 
-std::string json_error_guard(const std::optional<error_guard_facts>& guard) {
+json json_of_error_guard(const std::optional<error_guard_facts>& guard) {
     const bool is_suppressed = guard && guard->suppressed_until != 0;
-    return json_object({
-        {"used", json_field(guard, &error_guard_facts::used)},
-        {"limit", json(error_period_limit)},
-        {"suppressed", guard ? json(is_suppressed) : "null"},
-        {"suppressed_until", is_suppressed ? json(guard->suppressed_until) : "null"},
-        {"saved_at", json_field(guard, &error_guard_facts::saved_at)},
-    });
+    return {{"used", json_field(guard, &error_guard_facts::used)},
+            {"limit", error_period_limit},
+            {"suppressed", guard ? json(is_suppressed) : json()},
+            {"suppressed_until", is_suppressed ? json(guard->suppressed_until) : json()},
+            {"saved_at", json_field(guard, &error_guard_facts::saved_at)}};
 }
 
-std::string to_json(const status_options& options, const daemon_state& state) {
-    return json_object({
-        {"directory", json(options.base)},
-        {"running", json(state.process.is_running)},
-        {"pid", json(state.process.pid)},
-        {"stopped", json(state.process.is_stopped)},
-        {"lock_held", json(state.process.is_lock_held)},
-        {"answers", json(state.answer == 0)},
-        {"answer_us", json(state.answer_us)},
-        {"collection", json(collection(state))},
-        {"diagnostics", json(state.has_diagnostics)},
+json to_json(const status_options& options, const daemon_state& state) {
+    return {
+        {"directory", json_text(options.base)},
+        {"running", json_or_null(state.process.is_running)},
+        {"pid", json_or_null(state.process.pid)},
+        {"stopped", json_or_null(state.process.is_stopped)},
+        {"lock_held", json_or_null(state.process.is_lock_held)},
+        {"answers", state.answer == 0},
+        {"answer_us", json_or_null(state.answer_us)},
+        {"collection", json_or_null(collection(state))},
+        {"diagnostics", json_or_null(state.has_diagnostics)},
         {"partial_file",
-         json_object({{"size", json(state.partial_size)}, {"limit", json(report_limit(state))}})},
-        {"reports", json_object({{"count", json_field(state.output, &output_facts::reports)},
-                                 {"lowest", json_field(state.output, &output_facts::lowest)},
-                                 {"highest", json_field(state.output, &output_facts::highest)}})},
+         {{"size", json_or_null(state.partial_size)},
+          {"limit", json_or_null(report_limit(state))}}},
+        {"reports",
+         {{"count", json_field(state.output, &output_facts::reports)},
+          {"lowest", json_field(state.output, &output_facts::lowest)},
+          {"highest", json_field(state.output, &output_facts::highest)}}},
         {"output",
-         json_object({{"size", json(output_size(state))}, {"limit", json(state.output_budget)}})},
-        {"free_space", json_object({{"size", json_field(state.space, &space_facts::bytes)},
-                                    {"needed", json(state.space_needed)},
-                                    {"inodes", state.space ? json(state.space->inodes) : "null"}})},
-        {"keys_from", json(text_of(state.keys.source).name)},
-        {"sealing", json_key(state.keys.report_key_path, state.keys.report_key)},
-        {"verification", json_key(state.keys.config_key_path, state.keys.config_key)},
-        {"config_checksum", json(state.checksum)},
-        {"error_guard", json_error_guard(state.error_guard)},
-    });
+         {{"size", json_or_null(output_size(state))},
+          {"limit", json_or_null(state.output_budget)}}},
+        {"free_space",
+         {{"size", json_field(state.space, &space_facts::bytes)},
+          {"needed", json_or_null(state.space_needed)},
+          {"inodes", state.space ? json_or_null(state.space->inodes) : json()}}},
+        {"keys_from", text_of(state.keys.source).name},
+        {"sealing", json_of_key(state.keys.report_key_path, state.keys.report_key)},
+        {"verification", json_of_key(state.keys.config_key_path, state.keys.config_key)},
+        {"config_checksum", json_or_null(state.checksum)},
+        {"error_guard", json_of_error_guard(state.error_guard)},
+    };
 }
 
 }  // namespace
@@ -234,7 +234,7 @@ int run_status(const status_options& options) {
         state.answer = -errno;
     }
     if (options.is_json) {
-        print_line(to_json(options, state).c_str());
+        print_line(to_json(options, state).dump().c_str());
     } else {
         print_text(options, state);
     }

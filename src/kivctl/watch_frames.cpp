@@ -2,15 +2,17 @@
 
 #include <cstdint>
 
-#include "toolkit/length_varint.h"
+#include "format/request_words.h"
+#include "format/varint.h"
+#include "util/bytes.h"
 
 namespace kivd {
 namespace {
 
 constexpr size_t head_size = 4;
-constexpr char packet_key = 0x0a;               // field 1, length-delimited
-constexpr size_t message_size_min = 2;          // of an empty packet
-constexpr size_t message_size_max = 4 + 31176;  // of the largest one
+constexpr char packet_key = 0x0a;                         // field 1, length-delimited
+constexpr size_t message_size_min = 2;                    // of an empty packet
+constexpr size_t message_size_max = 4 + max_packet_size;  // of the largest one
 
 size_t read_head(std::string_view head) {
     size_t size = 0;
@@ -21,10 +23,9 @@ size_t read_head(std::string_view head) {
 // The packet in a message; none when the message holds anything else.
 std::optional<std::string_view> find_packet(std::string_view message) {
     if (message[0] != packet_key) return std::nullopt;
-    const length_varint length = read_length(message.substr(1));
-    const std::string_view packet = message.substr(1 + length.size);
-    if (length.size == 0 || length.value != packet.size()) return std::nullopt;
-    return packet;
+    std::span<const uint8_t> packet = bytes_of(message.substr(1));
+    const std::optional<uint64_t> length = take_varint(packet, max_varint32_size);
+    return length == packet.size() ? std::optional(text_of(packet)) : std::nullopt;
 }
 
 }  // namespace

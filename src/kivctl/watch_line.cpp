@@ -6,6 +6,7 @@
 #include <cstdio>
 
 #include "format/request_table.h"
+#include "format/request_words.h"
 #include "toolkit/text_escape.h"
 
 namespace kivd {
@@ -13,22 +14,16 @@ namespace {
 
 using std::string_view;
 
-constexpr string_view delimiters = " \t\r\n";
 constexpr size_t text_characters = 120;  // what is shown at most, of any part of a packet
 constexpr size_t hex_bytes = 32;
 
 string_view until_nul(string_view bytes) { return bytes.substr(0, bytes.find('\0')); }
 
-string_view without_blanks_before(string_view text) {
-    return text.substr(std::min(text.find_first_not_of(delimiters), text.size()));
-}
-
-// Takes the next word off `left`, but not what ended it. A NUL ends all words.
+// Takes the next word off `left`, which a NUL ends, but not what ended the word.
 string_view take_word(string_view& left) {
-    const string_view text = without_blanks_before(until_nul(left));
-    const string_view word = text.substr(0, text.find_first_of(delimiters));
-    left.remove_prefix(static_cast<size_t>(word.data() + word.size() - left.data()));
-    return word;
+    const request_word word = find_word(left.data());
+    left.remove_prefix(static_cast<size_t>(word.end - left.data()));
+    return {word.start, word.end};
 }
 
 // A packet as the daemon understands it.
@@ -38,7 +33,8 @@ struct parts {
     string_view left;  // with what ended the last of these; the packet when there is no command
 };
 
-parts take_apart(string_view packet) {
+// They stay in `packet`.
+parts take_apart(const std::string& packet) {
     parts found;
     found.left = packet;
     const string_view command = take_word(found.left);
@@ -54,8 +50,7 @@ bool is_text(string_view bytes) {
     while (!bytes.empty()) {
         const size_t length = utf8_length(bytes);
         const auto first = static_cast<uint8_t>(bytes[0]);
-        const bool is_control =
-            (first < 0x20 && delimiters.find(bytes[0]) == string_view::npos) || first == 0x7f;
+        const bool is_control = (first < 0x20 && !is_blank(bytes[0])) || first == 0x7f;
         if (length == 0 || is_control) return false;
         bytes.remove_prefix(length);
     }
@@ -85,7 +80,8 @@ std::string describe_rest(const parts& p) {
     const bool is_binary = p.shape->rest == request_rest::bytes;
     string_view left = is_binary ? p.left : until_nul(p.left);
     if (p.shape->rest == request_rest::words) {
-        return printable(without_blanks_before(left), text_characters);
+        while (!left.empty() && is_blank(left[0])) left.remove_prefix(1);
+        return printable(left, text_characters);
     }
     left.remove_prefix(std::min<size_t>(1, left.size()));  // one delimiter; more are part of it
     return with_size(left);
@@ -97,7 +93,8 @@ std::string column(const std::string& text) { return text.empty() ? "" : "  " + 
 }  // namespace
 
 std::string describe_request(string_view packet) {
-    const parts p = take_apart(packet);
+    const std::string copy(packet);
+    const parts p = take_apart(copy);
     const std::string size = std::to_string(packet.size());
     std::string line(size.size() < 5 ? 5 - size.size() : 0, ' ');
     line += size + "  ";
@@ -107,6 +104,9 @@ std::string describe_request(string_view packet) {
     return line + column(describe_rest(p));
 }
 
-string_view package_of(string_view packet) { return take_apart(packet).package; }
+std::string package_of(string_view packet) {
+    const std::string copy(packet);
+    return std::string(take_apart(copy).package);
+}
 
 }  // namespace kivd

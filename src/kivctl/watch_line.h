@@ -12,6 +12,6 @@ namespace kivd {
 [[nodiscard]] std::string describe_request(std::string_view packet);
 
 // The package of the probe that the request names; empty when it names none.
-[[nodiscard]] std::string_view package_of(std::string_view packet);
+[[nodiscard]] std::string package_of(std::string_view packet);
 
 }  // namespace kivd

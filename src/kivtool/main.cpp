@@ -53,9 +53,6 @@ CLI::App* add_report(CLI::App& app, report_given& given) {
         CLI::App* sub = report->add_subcommand(format.name, format.description);
         add_report_arguments(*sub, given)->required();
         sub->callback([&given, &format] { given.options.format = format.format; });
-        if (format.format != kivd::report_format::summary) continue;
-        sub->add_option("--plot", given.options.plot_path,
-                        "Picture (SVG) of the events per minute by package to make");
     }
     report->final_callback([&given] {
         if (given.paths.empty()) throw CLI::RequiredError("PATH");

@@ -3,15 +3,9 @@
 // one takes effect without a restart.
 #pragma once
 
-#include <openssl/evp.h>
-
-#include <memory>
-
-#include "util/unique_fd.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
-
-using unique_pkey = std::unique_ptr<EVP_PKEY, releaser<EVP_PKEY_free>>;
 
 // Both keys in the system's own directory for them.
 void set_default_key_paths();

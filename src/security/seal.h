@@ -6,15 +6,12 @@
 
 #include <array>
 #include <cstdint>
-#include <memory>
 #include <optional>
 #include <span>
 
-#include "util/unique_fd.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
-
-using unique_cipher = std::unique_ptr<EVP_CIPHER_CTX, releaser<EVP_CIPHER_CTX_free>>;
 
 inline constexpr uint32_t max_report_key_bits = 4096;
 

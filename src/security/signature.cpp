@@ -5,12 +5,12 @@
 
 #include <array>
 #include <cstdio>
-#include <memory>
 
 #include "runtime/log_and_raise.h"
 #include "security/key_paths.h"
 #include "util/file_io.h"
 #include "util/unique_fd.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {
@@ -18,8 +18,6 @@ namespace {
 constexpr char tag[] = "kivd/crypto";
 constexpr size_t max_signature_size = 1024;
 constexpr size_t chunk_size = 4096;
-
-using unique_digest = std::unique_ptr<EVP_MD_CTX, releaser<EVP_MD_CTX_free>>;
 
 bool digest_file(EVP_MD_CTX* digest, FILE* data) {
     std::array<uint8_t, chunk_size> chunk;

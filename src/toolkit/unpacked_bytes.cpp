@@ -8,10 +8,11 @@
 #include <new>
 #include <utility>
 
+#include "util/bytes.h"
+
 namespace kivd {
 namespace {
 constexpr int gzip_only = 16 + MAX_WBITS;
-constexpr Bytef gzip_magic[] = {0x1f, 0x8b};
 constexpr size_t piece_size = 65536;
 
 // Null, with errno set, when it cannot be opened.
@@ -42,8 +43,7 @@ unpacked_bytes::unpacked_bytes(std::string_view bytes, const char* place) : plac
 
 // Looks at the first bytes.
 void unpacked_bytes::start() {
-    is_gzip_ = inflater_.avail_in >= sizeof gzip_magic &&
-               memcmp(inflater_.next_in, gzip_magic, sizeof gzip_magic) == 0;
+    is_gzip_ = text_of({inflater_.next_in, inflater_.avail_in}).starts_with(gzip_magic);
     if (is_gzip_ && inflateInit2(&inflater_, gzip_only) != Z_OK) throw std::bad_alloc();
     in_member_ = is_gzip_;
 }
@@ -77,7 +77,7 @@ bool unpacked_bytes::fill() {
 
 bool unpacked_bytes::start_member() {
     if (!fill()) return false;  // a good end
-    if (*inflater_.next_in != gzip_magic[0]) {
+    if (static_cast<char>(*inflater_.next_in) != gzip_magic[0]) {
         has_foreign_tail_ = true;
         return fail("bytes that are not gzip data follow at " + position());
     }

@@ -13,6 +13,8 @@
 
 namespace kivd {
 
+inline constexpr std::string_view gzip_magic = "\x1f\x8b";  // that gzip data starts with
+
 // Reads one source from start to end. What starts with the magic bytes of gzip is decompressed, all
 // of its members end to end; anything else comes as it is.
 class unpacked_bytes {

@@ -7,13 +7,21 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <stdexcept>
 
+#include "toolkit/text_escape.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
 
-std::string with_reason(const char* what) { return std::string(what) + ": " + strerror(errno); }
+[[noreturn]] void fail(const std::string& path, const std::string& what) {
+    throw std::runtime_error(printable(path) + ": " + what);
+}
+
+[[noreturn]] void fail_with_reason(const std::string& path, const std::string& what) {
+    fail(path, what + ": " + strerror(errno));
+}
 
 bool write_new_file(const std::string& path, std::string_view bytes) {
     unique_file file(fopen(path.c_str(), "wxe"));
@@ -24,32 +32,33 @@ bool write_new_file(const std::string& path, std::string_view bytes) {
 
 }  // namespace
 
-std::string read_whole_file(const std::string& path, size_t max_size, std::string& bytes) {
+std::string read_whole_file(const std::string& path, size_t max_size) {
     const unique_file file(fopen(path.c_str(), "re"));
-    if (!file) return with_reason("cannot be opened");
-    bytes.clear();
+    if (!file) fail_with_reason(path, "cannot be opened");
+    std::string bytes;
     std::array<char, 65536> piece;
     while (const size_t size = fread(piece.data(), 1, piece.size(), file.get())) {
         bytes.append(piece.data(), size);
-        if (bytes.size() > max_size) return "has more than " + std::to_string(max_size) + " bytes";
+        if (bytes.size() > max_size) {
+            fail(path, "has more than " + std::to_string(max_size) + " bytes");
+        }
     }
-    return ferror(file.get()) ? with_reason("cannot be read") : "";
+    if (ferror(file.get())) fail_with_reason(path, "cannot be read");
+    return bytes;
 }
 
-std::string replace_file(const std::string& path, std::string_view bytes) {
+void replace_file(const std::string& path, std::string_view bytes) {
     struct stat status {};
     if (stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
-        return "exists and is no regular file";
+        fail(path, "exists and is no regular file");
     }
     const std::string new_path = path + "." + std::to_string(getpid()) + ".tmp";
-    std::string problem;
-    if (!write_new_file(new_path, bytes)) {
-        problem = with_reason("cannot be written");
-    } else if (rename(new_path.c_str(), path.c_str()) != 0) {
-        problem = with_reason("cannot be put into place");
-    }
-    if (!problem.empty()) (void)remove(new_path.c_str());
-    return problem;
+    const bool is_written = write_new_file(new_path, bytes);
+    if (is_written && rename(new_path.c_str(), path.c_str()) == 0) return;
+    const int reason = errno;
+    (void)remove(new_path.c_str());
+    errno = reason;
+    fail_with_reason(path, is_written ? "cannot be put into place" : "cannot be written");
 }
 
 }  // namespace kivd

@@ -9,12 +9,13 @@
 #include <string>
 #include <string_view>
 
-#include "support/recording_platform.h"
+#include "platform/recording_platform.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
 
 namespace fs = std::filesystem;
+using namespace std::string_literals;
 
 // A base before the one that makes a directory: that one is then in memory, if it can be. Replacing
 // thousands of files on a disk takes minutes.

@@ -6,8 +6,6 @@
 
 #include "kivtool/report/report_command.h"
 #include "sample_reports.h"
-#include "support/outside_tools.h"
-#include "support/scratch_directory.h"
 
 namespace kivd {
 namespace {
@@ -92,11 +90,11 @@ TEST_F(report_views, keep_names_apart_that_are_not_utf8) {
     EXPECT_EQ(through_json(report.SerializeAsString()).header().group_id(1), "\\xFF");
 }
 
-// Records in an order that the daemon doesn't write, too.
+// Whatever comes first; but a list has one place.
 TEST_F(report_views, of_json_keep_every_value_and_do_without_a_header) {
     const std::string parts[] = {event_text("n", INT64_MAX, "\\000\\377 payload"),
-                                 counter_text("n", INT64_MIN, 1), static_text("n", "one\\ntwo"),
-                                 event_text("m", 5, "4444"), counter_text("m", 7, 8)};
+                                 event_text("m", 5, "4444"), counter_text("n", INT64_MIN, 1),
+                                 counter_text("m", 7, 8), static_text("n", "one\\ntwo")};
     std::string records;
     for (const std::string& part : parts) records += records_of(part);
     const std::string trailer =
@@ -113,6 +111,10 @@ TEST_F(report_views, of_json_keep_every_value_and_do_without_a_header) {
     const std::string two = write("two", header + header + trailer);
     const std::string err = show({two}, {report_format::json}).err;
     EXPECT_NE(err.find("JSON has room for one header"), std::string::npos) << err;
+    const std::string event = records_of(parts[0]), value = records_of(parts[4]);
+    const shown torn = show({write("torn", event + value + event)}, {report_format::json});
+    EXPECT_EQ(torn.out, show_records(event + value, report_format::json));
+    EXPECT_NE(torn.err.find("one list of events, those behind"), std::string::npos) << torn.err;
     const std::string lines = view({two}, {report_format::jsonl});
     EXPECT_NE(lines.find("\"test_id\""), lines.rfind("\"test_id\"")) << lines;
 }
@@ -203,55 +205,6 @@ TEST_F(report_views, of_people_take_bounded_room) {
     expect_parts(
         show_records(report.SerializeAsString(), report_format::summary),
         {"50004 events", "3 records are of probes beyond", " (10 of 50000)", "  2  app e7 "}, true);
-}
-
-class pictures : public report_views {
- protected:
-    // The picture of these events, which a reader of XML takes.
-    std::string draw(const kiv::Report& report) {
-        const std::string picture = directory / "events.svg";
-        (void)view({write("kiv_7", report.SerializePartialAsString())},
-                   {report_format::summary, {}, picture});
-        const outcome checked =
-            run("python3 -c 'import sys, xml.dom.minidom as x; x.parse(sys.argv[1])' " + picture);
-        EXPECT_EQ(checked.status, 0) << checked.output;
-        return read_file(picture);
-    }
-};
-
-TEST_F(pictures, show_the_packages_with_the_most_events_and_the_others_together) {
-    kiv::Report report;
-    const auto add = [&report](const std::string& package, int number, int64_t time) {
-        while (number-- > 0) {
-            kiv::Event& event = *report.add_events();
-            event = report_of(event_text("n", time)).events(0);
-            event.set_package(package);
-        }
-    };
-    constexpr int64_t start = 1262304000000;  // 2010-01-01
-    add("<&\"\x1b\xff\xef\xbf\xbf>", 50, start + 3 * 60'000 - 1);
-    for (int package = 0; package < 1200; ++package) add("p" + std::to_string(package), 1, start);
-    for (int package = 292; package < 299; ++package)
-        add("p" + std::to_string(package - 200), 9, start);
-    add("unset clock", 3, 1000);
-    add("unset clock", 1, INT64_MAX);
-    std::string svg = draw(report);
-    expect_parts(svg,
-                 {"&lt;&amp;&quot;\\x1B\\xFF\\xEF\\xBF\\xBF&gt; (50)", "p92 (10)", "p98 (10)",
-                  "other (1193)", ">2010-01-01<", ">00:02<", "1313 events, times in UTC;",
-                  "4 with times before"},
-                 true);
-    expect_parts(svg, {"unset clock", "p91"}, false);
-
-    // However far apart the events are, none is lost and the picture stays small.
-    report.Clear();
-    for (int64_t time = 946684800000; time < 4102444800000; time += 999'999'999) add("a", 1, time);
-    for (int64_t time = 4102444799999; time > 946684800000; time -= 999'999'999) add("b", 1, time);
-    svg = draw(report);
-    expect_parts(svg, {"a (3156)", "b (3156)", "6312 events"}, true);
-    EXPECT_LT(svg.size(), 30'000u);
-    report.Clear();
-    expect_parts(draw(report_of(header_text)), {"0 events"}, true);
 }
 
 }  // namespace

@@ -1,6 +1,7 @@
 #include "kivtool/config/config_build.h"
 
-#include <utility>
+#include <exception>
+#include <stdexcept>
 
 #include "config.pb.h"
 #include "kivtool/config/config_file.h"
@@ -13,71 +14,29 @@
 namespace kivd {
 namespace {
 
-// All of these give what is wrong as a sentence, empty when it is done.
-
-std::string read_parts(const std::vector<part_source>& sources, std::vector<part_content>& parts) {
-    std::string problem;
-    for (const part_source& source : sources) {
-        problem = read_part(source, parts.emplace_back());
-        if (!problem.empty()) break;
-    }
-    return problem;
-}
-
-std::string lint(const std::vector<part_content>& parts, const std::string& path,
-                 std::ostream& err) {
+void lint(const kiv::config::ConfigResponse& file, const std::vector<part_content>& parts,
+          const std::string& path, std::ostream& err) {
     lint_findings findings;
-    lint_config(parts, path, findings);
+    lint_config(join_config_file(file), parts, path, findings);
     findings.print(err);
-    if (!findings.has_errors()) return "";
-    return printable(path) +
-           ": not built because of these errors; --no-lint builds it all the same";
-}
-
-std::string add_signature(const std::string& key_path, kiv::config::ConfigResponse& file) {
-    unique_pkey key;
-    std::string problem = read_key(key_path, key_half::private_half, key);
-    if (!problem.empty()) return problem;
-    problem = sign(*key, file.compressed_data(), *file.mutable_signature());
-    return problem.empty() ? "" : printable(key_path) + ": " + problem;
-}
-
-std::string build(const std::vector<part_source>& sources, const config_build_options& options,
-                  std::ostream& err) {
-    std::vector<part_content> parts;
-    std::string problem = read_parts(sources, parts);
-    if (problem.empty() && !options.no_lint) problem = lint(parts, options.output_path, err);
-    if (!problem.empty()) return problem;
-    kiv::config::ConfigPackage package;
-    for (part_content& part : parts) {
-        kiv::config::ConfigPart& packed = *package.add_parts();
-        packed.set_package(std::move(part.package));
-        packed.set_name(std::move(part.name));
-        packed.set_payload(std::move(part.payload));
-    }
-
-    const std::string output = printable(options.output_path) + ": ";
-    kiv::config::ConfigResponse file;
-    problem = compress_package(package, *file.mutable_compressed_data());
-    if (!problem.empty()) return output + problem;
-    if (options.key_path) problem = add_signature(*options.key_path, file);
-    if (!problem.empty()) return problem;
-
-    // Fields are written by their numbers, the signature first.
-    const std::string bytes = file.SerializeAsString();
-    config_file ignored;
-    problem = split_config_file(bytes, ignored);
-    if (problem.empty()) problem = replace_file(options.output_path, bytes);
-    return problem.empty() ? "" : output + problem;
+    if (!findings.has_errors()) return;
+    throw std::runtime_error(
+        printable(path) + ": not built because of these errors; --no-lint builds it all the same");
 }
 
 }  // namespace
 
 int run_config_build(const std::vector<part_source>& sources, const config_build_options& options,
-                     std::ostream& err) {
-    const std::string problem = build(sources, options, err);
-    if (problem.empty()) return 0;
-    err << "kivtool: " << problem << '\n';
+                     std::ostream& err) try {
+    std::vector<part_content> parts;
+    for (const part_source& source : sources) parts.push_back(read_part(source));
+    kiv::config::ConfigResponse file = pack_parts(parts);
+    if (!options.no_lint) lint(file, parts, options.output_path, err);
+    if (options.key_path) file.set_signature(sign(*options.key_path, file.compressed_data()));
+    replace_file(options.output_path, join_config_file(file));
+    return 0;
+} catch (const std::exception& error) {
+    err << "kivtool: " << error.what() << '\n';
     return 1;
 }
 

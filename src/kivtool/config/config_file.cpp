@@ -1,42 +1,21 @@
 #include "kivtool/config/config_file.h"
 
+#include <google/protobuf/io/gzip_stream.h>
+#include <google/protobuf/io/zero_copy_stream_impl_lite.h>
 #include <zlib.h>
 
 #include <cstdint>
 #include <cstdio>
-#include <new>
+#include <stdexcept>
 
-#include "toolkit/length_varint.h"
+#include "format/config_file.h"
 #include "toolkit/unpacked_bytes.h"
+#include "util/bytes.h"
 
 namespace kivd {
 namespace {
 
-constexpr char signature_key = 0x0a;
-constexpr char compressed_data_key = 0x12;
-constexpr int gzip_framing = 16;  // added to the window's bits
-constexpr int memory_level = 8;
-
-// Takes the field whose key has been taken off the start of `bytes`.
-std::string take_field(const std::string& what, std::string_view& bytes,
-                       std::string_view& content) {
-    const length_varint length = read_length(bytes);
-    if (length.size == 0) return "the length of the " + what + " does not end";
-    bytes.remove_prefix(length.size);
-    if (length.value > bytes.size()) {
-        return "the " + what + " should have " + std::to_string(length.value) + " bytes, but " +
-               std::to_string(bytes.size()) + " follow";
-    }
-    content = bytes.substr(0, static_cast<size_t>(length.value));
-    bytes.remove_prefix(content.size());
-    return "";
-}
-
-bool take_key(char key, std::string_view& bytes) {
-    if (!bytes.starts_with(key)) return false;
-    bytes.remove_prefix(1);
-    return true;
-}
+namespace protobuf = google::protobuf;
 
 std::string no_package(bool is_signed, std::string_view rest) {
     const std::string place = is_signed ? "behind the signature" : "at its start";
@@ -47,68 +26,81 @@ std::string no_package(bool is_signed, std::string_view rest) {
     return text;
 }
 
+// Why bytes are no configuration file; empty when they are one.
+std::string fault_of(std::string_view bytes, config_fields& fields) {
+    if (bytes.empty()) return "the file is empty";
+    switch (find_config_fields(bytes_of(bytes), fields)) {
+        case config_fault::none:
+            return "";
+        case config_fault::no_package:
+            return no_package(fields.signature.has_value(), text_of(fields.rest));
+        case config_fault::bad_length:
+            return "a field's length does not end or is larger than the file";
+        case config_fault::cut_signature:
+            return "the signature is cut short";
+        case config_fault::cut_package:
+            return "the package is cut short";
+    }
+    return "";
+}
+
 }  // namespace
 
-std::string split_config_file(std::string_view bytes, config_file& file) {
-    if (bytes.empty()) return "the file is empty";
-    if (bytes.size() > max_config_file_size) {
-        return "a configuration has at most " + std::to_string(max_config_file_size) +
-               " bytes, this one has " + std::to_string(bytes.size());
-    }
-    if (take_key(signature_key, bytes)) {
-        std::string problem = take_field("signature", bytes, file.signature.emplace());
-        if (!problem.empty()) return problem;
-    }
-    if (!take_key(compressed_data_key, bytes)) {
-        return no_package(file.signature.has_value(), bytes);
-    }
-    std::string problem = take_field("package", bytes, file.compressed_data);
-    file.ignored_size = bytes.size();
-    return problem;
+config_file split_config_file(std::string_view bytes) {
+    config_fields fields;
+    const std::string fault = fault_of(bytes, fields);
+    if (!fault.empty()) throw std::runtime_error("is no configuration: " + fault);
+    return {fields.signature ? std::optional(text_of(*fields.signature)) : std::nullopt,
+            text_of(fields.package), fields.rest.size()};
 }
 
-std::string compress_package(const kiv::config::ConfigPackage& package,
-                             std::string& compressed_data) {
-    const size_t size = package.ByteSizeLong();
-    if (size > max_package_size) {
-        return "the parts take " + std::to_string(size) + " bytes, a package has at most " +
-               std::to_string(max_package_size);
-    }
-    std::string packed = package.SerializeAsString();
-    z_stream stream{};
-    if (deflateInit2(&stream, Z_BEST_COMPRESSION, Z_DEFLATED, gzip_framing + MAX_WBITS,
-                     memory_level, Z_DEFAULT_STRATEGY) != Z_OK) {
-        throw std::bad_alloc();
-    }
-    compressed_data.resize(deflateBound(&stream, packed.size()));
-    stream.next_in = reinterpret_cast<Bytef*>(packed.data());
-    stream.avail_in = static_cast<uInt>(packed.size());
-    stream.next_out = reinterpret_cast<Bytef*>(compressed_data.data());
-    stream.avail_out = static_cast<uInt>(compressed_data.size());
-    const bool is_done = deflate(&stream, Z_FINISH) == Z_STREAM_END;
-    compressed_data.resize(stream.total_out);
-    deflateEnd(&stream);
-    return is_done ? "" : "the parts cannot be compressed";
-}
-
-std::string decompress_package(std::string_view compressed_data,
-                               kiv::config::ConfigPackage& package,
-                               std::vector<std::string>& notes) {
+kiv::config::ConfigPackage decompress_package(std::string_view compressed_data,
+                                              std::vector<std::string>& notes) {
     unpacked_bytes bytes(compressed_data, "the compressed package");
     std::string packed;
-    while (packed.size() <= max_package_size && bytes.read_some(packed)) {
+    while (packed.size() <= max_config_package_size && bytes.read_some(packed)) {
     }
-    if (packed.size() > max_package_size) {
-        return "the package has more than " + std::to_string(max_package_size) + " bytes";
+    if (packed.size() > max_config_package_size) {
+        throw std::runtime_error("the package has more than " +
+                                 std::to_string(max_config_package_size) + " bytes");
     }
     if (bytes.has_foreign_tail()) {
         notes.push_back(bytes.problem() + " and are ignored");
     } else if (!bytes.problem().empty()) {
-        return bytes.problem();
+        throw std::runtime_error(bytes.problem());
     }
-    if (!package.ParseFromString(packed)) return "the package cannot be decoded";
+    kiv::config::ConfigPackage package;
+    if (!package.ParseFromString(packed)) {
+        throw std::runtime_error("the package cannot be decoded");
+    }
     if (!bytes.is_gzip()) notes.emplace_back("the package is not compressed");
-    return "";
+    return package;
+}
+
+std::string compress_package(const kiv::config::ConfigPackage& package) {
+    const size_t size = package.ByteSizeLong();
+    if (size > max_config_package_size) {
+        throw std::runtime_error("the parts take " + std::to_string(size) +
+                                 " bytes, a package has at most " +
+                                 std::to_string(max_config_package_size));
+    }
+    std::string compressed_data;
+    protobuf::io::StringOutputStream bytes(&compressed_data);
+    protobuf::io::GzipOutputStream::Options options;
+    options.compression_level = Z_BEST_COMPRESSION;
+    protobuf::io::GzipOutputStream gzip(&bytes, options);
+    if (!package.SerializeToZeroCopyStream(&gzip) || !gzip.Close()) {
+        throw std::runtime_error("the parts cannot be compressed");
+    }
+    return compressed_data;
+}
+
+// Fields are written by their numbers, the signature first.
+std::string join_config_file(const kiv::config::ConfigResponse& file) {
+    const std::string bytes = file.SerializeAsString();
+    if (bytes.size() <= max_config_file_size) return bytes;
+    throw std::runtime_error("a configuration has at most " + std::to_string(max_config_file_size) +
+                             " bytes, this one has " + std::to_string(bytes.size()));
 }
 
 }  // namespace kivd

@@ -12,28 +12,25 @@
 
 namespace kivd {
 
-// What the daemon takes, in bytes.
-inline constexpr size_t max_config_file_size = 204799;
-inline constexpr size_t max_package_size = size_t{8} << 20;  // decompressed
-
 struct config_file {
     std::optional<std::string_view> signature;
     std::string_view compressed_data;
     size_t ignored_size = 0;  // bytes behind them
 };
 
-// All of these give what is wrong as the end of a sentence, empty when it is done.
+// All of these throw what is wrong, as a sentence about the file or the end of one.
 
 // Finds the fields in the bytes of a file; they stay there.
-[[nodiscard]] std::string split_config_file(std::string_view bytes, config_file& file);
-
-// Packs and compresses; what is the same gives the same bytes.
-[[nodiscard]] std::string compress_package(const kiv::config::ConfigPackage& package,
-                                           std::string& compressed_data);
+[[nodiscard]] config_file split_config_file(std::string_view bytes);
 
 // `notes` gets a sentence for whatever is unusual but taken.
-[[nodiscard]] std::string decompress_package(std::string_view compressed_data,
-                                             kiv::config::ConfigPackage& package,
-                                             std::vector<std::string>& notes);
+[[nodiscard]] kiv::config::ConfigPackage decompress_package(std::string_view compressed_data,
+                                                            std::vector<std::string>& notes);
+
+// Packs and compresses; what is the same gives the same bytes.
+[[nodiscard]] std::string compress_package(const kiv::config::ConfigPackage& package);
+
+// The bytes of a file.
+[[nodiscard]] std::string join_config_file(const kiv::config::ConfigResponse& file);
 
 }  // namespace kivd

@@ -1,10 +1,11 @@
-// `kivtool config lint`: finds what the daemon would refuse in a configuration, or answer in a way
-// that its author will not have meant.
+// `kivtool config lint`: finds what the daemon refuses in a configuration, and what it takes in a
+// way that its author will not have meant.
 #pragma once
 
 #include <ostream>
 #include <span>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "kivtool/config/config_source.h"
@@ -12,9 +13,10 @@
 
 namespace kivd {
 
-// Looks over the parts of one configuration. `path` is what findings about the whole call it.
-void lint_config(std::span<const part_content> parts, const std::string& path,
-                 lint_findings& findings);
+// Looks over a configuration file, of which `parts` have been read or made it. `path` is what
+// findings about the whole call it.
+void lint_config(std::string_view bytes, std::span<const part_content> parts,
+                 const std::string& path, lint_findings& findings);
 
 // Looks over configuration files, and over the parts given as PACKAGE:NAME=FILE, which are to
 // become one. Findings go to `out`, a line each, and what cannot be read to `err`. Gives the exit

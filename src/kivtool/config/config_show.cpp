@@ -1,8 +1,11 @@
 #include "kivtool/config/config_show.h"
 
+#include <exception>
+#include <stdexcept>
 #include <string_view>
 #include <vector>
 
+#include "format/config_file.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/part_text.h"
 #include "toolkit/keys.h"
@@ -58,12 +61,7 @@ void print_verdict(const config_file& file, EVP_PKEY& key, std::ostream& out,
 
 void print_config(std::string_view bytes, EVP_PKEY* key, std::ostream& out,
                   problem_list& problems) {
-    config_file file;
-    std::string problem = split_config_file(bytes, file);
-    if (!problem.empty()) {
-        problems.push_back("is no configuration: " + problem);
-        return;
-    }
+    const config_file file = split_config_file(bytes);
     out << "checksum: " << sha1_text(bytes) << '\n';
     out << "signed: " << (file.signature ? "yes, " : "no");
     if (file.signature) out << file.signature->size() << " bytes";
@@ -75,13 +73,8 @@ void print_config(std::string_view bytes, EVP_PKEY* key, std::ostream& out,
         notes.push_back(std::to_string(file.ignored_size) +
                         " bytes behind the package are ignored");
     }
-    kiv::config::ConfigPackage package;
-    problem = decompress_package(file.compressed_data, package, notes);
+    const kiv::config::ConfigPackage package = decompress_package(file.compressed_data, notes);
     for (const std::string& note : notes) out << "note: " << note << '\n';
-    if (!problem.empty()) {
-        problems.push_back(problem);
-        return;
-    }
     out << "parts: " << package.parts_size() << '\n';
     for (const auto& part : package.parts()) print_part(part, out, problems);
 }
@@ -89,22 +82,15 @@ void print_config(std::string_view bytes, EVP_PKEY* key, std::ostream& out,
 }  // namespace
 
 int run_config_show(const std::string& path, const std::optional<std::string>& key_path,
-                    std::ostream& out, std::ostream& err) {
+                    std::ostream& out, std::ostream& err) try {
     unique_pkey key;
-    if (key_path) {
-        const std::string problem = read_key(*key_path, key_half::public_half, key);
-        if (!problem.empty()) {
-            err << "kivtool: " << problem << '\n';
-            return 1;
-        }
-    }
+    if (key_path) key = read_key(*key_path, key_half::public_half);
+    const std::string bytes = read_whole_file(path, max_config_file_size);
     problem_list problems;
-    std::string bytes;
-    const std::string problem = read_whole_file(path, max_config_file_size, bytes);
-    if (problem.empty()) {
+    try {
         print_config(bytes, key.get(), out, problems);
-    } else {
-        problems.push_back(problem);
+    } catch (const std::runtime_error& error) {
+        problems.emplace_back(error.what());
     }
     out.flush();  // what could be read stands before what went wrong
     for (const std::string& text : problems) {
@@ -112,6 +98,9 @@ int run_config_show(const std::string& path, const std::optional<std::string>& k
     }
     if (!out) err << "kivtool: the output could not be written\n";
     return problems.empty() && out ? 0 : 1;
+} catch (const std::exception& error) {
+    err << "kivtool: " << error.what() << '\n';
+    return 1;
 }
 
 }  // namespace kivd

@@ -1,7 +1,9 @@
 #include "kivtool/config/config_source.h"
 
+#include <stdexcept>
 #include <utility>
 
+#include "format/config_file.h"
 #include "kivtool/config/config_file.h"
 #include "kivtool/config/part_text.h"
 #include "toolkit/text_escape.h"
@@ -19,19 +21,31 @@ std::optional<part_source> read_part_argument(const std::string& argument) {
     return source;
 }
 
-std::string read_part(const part_source& source, part_content& part) {
-    part = {source.package, source.name, "", source.path, nullptr};
-    std::string content;
-    const std::string problem = read_whole_file(source.path, max_package_size, content);
-    if (!problem.empty()) return printable(source.path) + ": " + problem;
+part_content read_part(const part_source& source) {
+    part_content part = {source.package, source.name, "", source.path, nullptr};
+    std::string content = read_whole_file(source.path, max_config_package_size);
     const auto* type = daemon_part_type(source.package, source.name);
     if (!type) {
         part.payload = std::move(content);
-        return "";
+        return part;
     }
     part.places = std::make_unique<google::protobuf::TextFormat::ParseInfoTree>();
-    const std::string text_problem = encode_part(*type, content, part.payload, *part.places);
-    return text_problem.empty() ? "" : printable(source.path) + ":" + text_problem;
+    const std::string fault = encode_part(*type, content, part.payload, *part.places);
+    if (!fault.empty()) throw std::runtime_error(printable(source.path) + ":" + fault);
+    return part;
+}
+
+kiv::config::ConfigResponse pack_parts(std::span<const part_content> parts) {
+    kiv::config::ConfigPackage package;
+    for (const part_content& part : parts) {
+        kiv::config::ConfigPart& packed = *package.add_parts();
+        packed.set_package(part.package);
+        packed.set_name(part.name);
+        packed.set_payload(part.payload);
+    }
+    kiv::config::ConfigResponse file;
+    file.set_compressed_data(compress_package(package));
+    return file;
 }
 
 }  // namespace kivd

@@ -5,7 +5,10 @@
 
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
+
+#include "config.pb.h"
 
 namespace kivd {
 
@@ -29,8 +32,12 @@ struct part_content {
     std::unique_ptr<google::protobuf::TextFormat::ParseInfoTree> places;
 };
 
-// Reads the part's file, and encodes it when it is the daemon's. Gives what is wrong as a sentence
-// that starts with the path, empty when it is done.
-[[nodiscard]] std::string read_part(const part_source& source, part_content& part);
+// Reads the part's file, and encodes it when it is the daemon's. What is wrong is thrown as a
+// sentence that starts with the path.
+[[nodiscard]] part_content read_part(const part_source& source);
+
+// An unsigned configuration file; the same parts give the same bytes. Throws when they are too much
+// for one.
+[[nodiscard]] kiv::config::ConfigResponse pack_parts(std::span<const part_content> parts);
 
 }  // namespace kivd

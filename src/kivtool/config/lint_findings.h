@@ -4,7 +4,6 @@
 #include <google/protobuf/descriptor.h>
 #include <google/protobuf/text_format.h>
 
-#include <cstddef>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -17,10 +16,6 @@ struct lint_finding {
     bool is_error;
     std::string text;  // a line: where, error or warning, about what, and what the daemon does
 };
-
-// The record of a list file that the daemon reads back, and how many of them.
-inline constexpr size_t max_list_record = 1024;  // bytes
-inline constexpr size_t max_list_records = 20'000;
 
 // Where something is: a file, a line in it counted from 1, what it is about. No line: 0.
 struct lint_place {

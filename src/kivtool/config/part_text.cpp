@@ -3,6 +3,8 @@
 #include <google/protobuf/descriptor.h>
 #include <google/protobuf/io/tokenizer.h>
 
+#include <algorithm>
+#include <iterator>
 #include <memory>
 #include <vector>
 
@@ -18,20 +20,14 @@ using protobuf::FieldDescriptor;
 using protobuf::Message;
 using protobuf::TextFormat;
 
-constexpr char daemon_package[] = "kivd";
 constexpr int indent_level = 2;
-
-struct daemon_part {
-    std::string_view name;
-    const Message& (*type)();
-};
 
 template <class message>
 const Message& type_of() {
     return message::default_instance();
 }
 
-constexpr daemon_part daemon_parts[] = {
+constexpr daemon_part all_daemon_parts[] = {
     {"FilterConfig", type_of<kiv::config::FilterConfig>},
     {"Settings", type_of<Settings>},
     {"RunActions", type_of<RunActions>},
@@ -98,12 +94,12 @@ std::string find_incomplete(const Message& message, const TextFormat::ParseInfoT
 
 }  // namespace
 
+std::span<const daemon_part> daemon_parts() { return all_daemon_parts; }
+
 const Message* daemon_part_type(std::string_view package, std::string_view name) {
     if (package != daemon_package) return nullptr;
-    for (const daemon_part& part : daemon_parts) {
-        if (part.name == name) return &part.type();
-    }
-    return nullptr;
+    const auto* found = std::ranges::find(all_daemon_parts, name, &daemon_part::name);
+    return found == std::end(all_daemon_parts) ? nullptr : &found->type();
 }
 
 std::string encode_part(const Message& type, const std::string& text, std::string& payload,

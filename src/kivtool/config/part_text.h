@@ -4,10 +4,19 @@
 #include <google/protobuf/message.h>
 #include <google/protobuf/text_format.h>
 
+#include <span>
 #include <string>
 #include <string_view>
 
 namespace kivd {
+
+inline constexpr std::string_view daemon_package = "kivd";
+
+struct daemon_part {
+    std::string_view name;
+    const google::protobuf::Message& (*type)();
+};
+[[nodiscard]] std::span<const daemon_part> daemon_parts();
 
 // An empty message of the type that the part holds; null when the part is for others.
 [[nodiscard]] const google::protobuf::Message* daemon_part_type(std::string_view package,

@@ -27,7 +27,7 @@ std::unique_ptr<report_view> make_view(const report_options& options, std::ostre
         case report_format::csv:
             return make_csv_view(out);
         case report_format::summary:
-            return make_summary_view(out, options.plot_path);
+            return make_summary_view(out);
     }
     return nullptr;
 }
@@ -58,11 +58,8 @@ class report_shower {
 
     void finish() {
         progress_.clear();
-        std::string problem = view_.finish();
+        view_.finish();
         out_.flush();
-        if (problem.empty()) return;
-        err_ << "kivtool: " << problem << '\n';
-        status_ = 1;
     }
 
     void tell(const std::string& path, const std::string& problem) {
@@ -107,15 +104,9 @@ class report_shower {
 }  // namespace
 
 int run_report_command(const std::vector<std::string>& paths, const report_options& options,
-                       std::ostream& out, std::ostream& err) {
+                       std::ostream& out, std::ostream& err) try {
     unique_pkey key;
-    if (options.key_path) {
-        std::string problem = read_key(*options.key_path, key_half::private_half, key);
-        if (!problem.empty()) {
-            err << "kivtool: " << problem << '\n';
-            return 1;
-        }
-    }
+    if (options.key_path) key = read_key(*options.key_path, key_half::private_half);
     const std::unique_ptr<report_view> view = make_view(options, out);
     report_shower shower(*view, key.get(), options, out, err);
     const std::vector<report_paths> all(paths.begin(), paths.end());
@@ -130,6 +121,9 @@ int run_report_command(const std::vector<std::string>& paths, const report_optio
         return 1;
     }
     return shower.status();
+} catch (const std::exception& error) {
+    err << "kivtool: " << error.what() << '\n';
+    return 1;
 }
 
 }  // namespace kivd

@@ -14,8 +14,6 @@ struct report_options {
     report_format format = report_format::text;
     // Of the private key that opens sealed reports.
     std::optional<std::string> key_path = std::nullopt;
-    // Of a picture to draw; for summaries.
-    std::optional<std::string> plot_path = std::nullopt;
     // `err` is a terminal on which to show how far the reading is.
     bool show_progress = false;
 };

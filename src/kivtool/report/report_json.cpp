@@ -2,168 +2,107 @@
 
 #include <google/protobuf/descriptor.h>
 
-#include <cerrno>
-#include <cstring>
-#include <map>
-#include <stdexcept>
+#include <set>
 #include <string>
 #include <utility>
 
-#include "kivtool/report/json_text.h"
-#include "util/unique_fd.h"
+#include "kivtool/report/message_json.h"
 
 namespace kivd {
 namespace {
 
-// The record's value in JSON.
-void append_record(std::string& to, const report_record& record) {
+using google::protobuf::FieldDescriptor;
+
+json record_json(const report_record& record) {
     if (record.message) {
-        to += '{';
-        append_json_fields(to, *record.message);
-        to += '}';
-        return;
+        json object = json::object();
+        add_fields(object, *record.message);
+        return object;
     }
     kiv::Report alone;
     (void)alone.ParsePartialFromArray(record.bytes.data(), static_cast<int>(record.bytes.size()));
-    append_json_value(to, alone, *record.field);
+    return field_json(alone, *record.field);
 }
 
-// Text that is kept on disk until it is its turn.
-class kept_text {
- public:
-    void append(const std::string& text) {
-        if (!file_) file_.reset(tmpfile());
-        if (!file_ || fwrite(text.data(), 1, text.size(), file_.get()) < text.size()) fail();
-    }
-
-    void copy_to(std::ostream& out) {
-        if (!file_) return;
-        if (fflush(file_.get()) != 0) fail();
-        rewind(file_.get());
-        char piece[16384];
-        while (const size_t size = fread(piece, 1, sizeof piece, file_.get())) {
-            out.write(piece, static_cast<std::streamsize>(size));
-        }
-        if (ferror(file_.get())) fail();
-    }
-
- private:
-    [[noreturn]] static void fail() {
-        throw std::runtime_error(std::string("cannot be kept in a temporary file: ") +
-                                 strerror(errno));
-    }
-
-    unique_file file_;
-};
-
+// The daemon writes a header, then events, then counters, then static data, so each list can be
+// written while its records come. A record of a list that has already been closed is not shown, and
+// that is told: to show it, everything behind would have to be kept somewhere until the end.
 class json_view : public report_view {
  public:
     explicit json_view(std::ostream& out) : out_(out) {}
 
     void start_file(const std::string& /*path*/) override {
         out_ << "{\n";
-        is_empty_ = true;
-        open_list_ = -1;
-        seen_.clear();
+        open_list_ = nullptr;
+        shown_.clear();
         problem_.clear();
     }
 
     void add(const report_record& record) override {
-        const int number = record.field->number();
-        text_.clear();
-        if (record.field->is_repeated() && number == open_list_) {
-            text_ += ",\n";
-            append_record(text_, record);
-            out_ << text_;
+        const FieldDescriptor* const field = record.field;
+        if (field == open_list_) {
+            out_ << ",\n";
+        } else if (shown_.contains(field)) {
+            problem_ = field->is_repeated()
+                           ? "JSON has room for one list of " + field->name() +
+                                 ", those behind other records are not shown; jsonl shows all"
+                           : "JSON has room for one " + field->name() +
+                                 ", the others in the file are not shown";
             return;
-        }
-        const auto [found, is_new] = seen_.try_emplace(number);
-        section& seen = found->second;
-        if (!is_new && !record.field->is_repeated()) {
-            problem_ = "JSON has room for one " + record.field->name() +
-                       ", the others in the file are not shown";
-            return;
-        }
-        if (is_new) {
-            text_ = '"' + record.field->name() + "\": ";
-            seen.is_list = record.field->is_repeated();
-            if (seen.is_list) text_ += "[\n";
         } else {
-            text_ += ",\n";
+            start_field(*field);
         }
-        append_record(text_, record);
-        if (open_list_ >= 0) return seen.later.append(text_);
-        seen.is_out = true;
-        if (seen.is_list) open_list_ = number;
-        write_section_start();
-        out_ << text_;
+        out_ << record_json(record).dump();
     }
 
     std::string finish_file(const report_reader& /*file*/) override {
-        if (open_list_ >= 0) out_ << "\n]";
-        for (auto& [number, each] : seen_) {
-            if (each.is_out) continue;
-            write_section_start();
-            each.later.copy_to(out_);
-            if (each.is_list) out_ << "\n]";
-        }
-        seen_.clear();
+        close_list();
         out_ << "\n}\n";
         return std::move(problem_);
     }
 
  private:
-    // A field of the report.
-    struct section {
-        bool is_list = false;
-        bool is_out = false;  // has been written, or is the open list
-        kept_text later;      // else what to write
-    };
+    void start_field(const FieldDescriptor& field) {
+        close_list();
+        if (!shown_.empty()) out_ << ",\n";
+        shown_.insert(&field);
+        out_ << '"' << field.name() << "\": ";
+        if (!field.is_repeated()) return;
+        out_ << "[\n";
+        open_list_ = &field;
+    }
 
-    void write_section_start() {
-        if (!is_empty_) out_ << ",\n";
-        is_empty_ = false;
+    void close_list() {
+        if (std::exchange(open_list_, nullptr)) out_ << "\n]";
     }
 
     std::ostream& out_;
-    bool is_empty_ = true;  // the document so far
-    int open_list_ = -1;    // the field whose records are written as they come
-    std::map<int, section> seen_;
+    const FieldDescriptor* open_list_ = nullptr;
+    std::set<const FieldDescriptor*> shown_;
     std::string problem_;
-    std::string text_;
 };
 
 class json_lines_view : public report_view {
  public:
     explicit json_lines_view(std::ostream& out) : out_(out) {}
 
-    void start_file(const std::string& path) override {
-        file_ = "{\"file\":";
-        append_json_string(file_, path);
-        file_ += ",\"kind\":\"";
-    }
+    void start_file(const std::string& path) override { file_ = json_text(path); }
 
     void add(const report_record& record) override {
-        text_ = file_;
-        text_ += record_kind(record);
-        text_ += "\",";
+        json line = {{"file", file_}, {"kind", record_kind(record)}};
         if (record.message) {
-            append_json_fields(text_, *record.message);
-            if (text_.ends_with(',')) text_.pop_back();
+            add_fields(line, *record.message);
         } else {
-            text_ += '"' + record.field->name() + "\":";
-            append_record(text_, record);
+            line[record.field->name()] = record_json(record);
         }
-        text_ += "}\n";
-        out_ << text_;
+        out_ << line.dump() << '\n';
     }
 
     std::string finish_file(const report_reader& /*file*/) override { return ""; }
 
  private:
     std::ostream& out_;
-    std::string file_;  // how each line starts
-    std::string text_;
+    json file_;
 };
 
 }  // namespace

@@ -1,4 +1,4 @@
-// Reports as JSON; json_text.h says how values are put.
+// Reports as JSON; message_json.h says how values are written.
 #pragma once
 
 #include <memory>
@@ -8,8 +8,8 @@
 
 namespace kivd {
 
-// One document for each file, a record a line. Lists whose records don't come first are kept in a
-// temporary file until the end of the report. A field that is no list has room for one record.
+// One document for each file, a record a line, in the order of the file. Each field of a report has
+// one place in it: what comes again behind other fields is left out, which finish_file() tells.
 [[nodiscard]] std::unique_ptr<report_view> make_json_view(std::ostream& out);
 
 // One object for each record, in a line: "file", "kind" (as record_kind has it), and the record's

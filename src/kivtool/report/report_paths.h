@@ -1,6 +1,7 @@
 // The report files that a command line names.
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -21,7 +22,7 @@ class report_paths {
  private:
     std::string path_;  // with a final "/" when it is a directory
     bool is_directory_ = false;
-    std::vector<int64_t> numbers_;
+    std::vector<int32_t> numbers_;
     std::string problem_;
 };
 

@@ -3,11 +3,14 @@
 #include <google/protobuf/descriptor.h>
 
 #include <cstdio>
+#include <optional>
+#include <span>
 #include <utility>
 
+#include "format/varint.h"
 #include "kivtool/report/sealed_report.h"
-#include "toolkit/length_varint.h"
 #include "toolkit/unpacked_bytes.h"
+#include "util/bytes.h"
 
 namespace kivd {
 namespace {
@@ -58,24 +61,25 @@ class report_layer {
 
     // Finds the next record; gives the size of its key and length. 0 is the end, or a problem.
     size_t frame(const reading_limits& limits, report_record& record) {
-        const std::string_view start = ahead(1 + longest_length_varint);
+        const std::string_view start = ahead(1 + max_varint32_size);
         if (start.empty()) return stop(bytes_.problem());
         const auto key = static_cast<uint8_t>(start[0]);
         record.field = find_field(key);
         if (!record.field) return stop_at_key(key);
-        const length_varint length = read_length(start.substr(1));
-        if (length.size == 0) {
-            if (start.size() > longest_length_varint) {
+        std::span<const uint8_t> rest = bytes_of(start.substr(1));
+        const std::optional<uint64_t> length = take_varint(rest, max_varint32_size);
+        if (!length) {
+            if (rest.size() == max_varint32_size) {
                 return stop("the record there has no valid length");
             }
             return stop_cut("the record there is cut short in its length");
         }
-        const size_t head_size = 1 + length.size;
-        if (length.value > (is_message(*record.field) ? limits.message_size : limits.bytes_size)) {
-            return stop("the record there claims a length of " + std::to_string(length.value) +
+        const size_t head_size = start.size() - rest.size();
+        if (*length > (is_message(*record.field) ? limits.message_size : limits.bytes_size)) {
+            return stop("the record there claims a length of " + std::to_string(*length) +
                         " bytes, which is more than a record can have");
         }
-        const size_t size = head_size + static_cast<size_t>(length.value);
+        const size_t size = head_size + static_cast<size_t>(*length);
         record.bytes = ahead(size);
         if (record.bytes.size() < size) {
             return stop_cut("the record there is cut short: it has " +

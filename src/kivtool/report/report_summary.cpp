@@ -9,12 +9,10 @@
 #include <tuple>
 #include <vector>
 
-#include "kivtool/report/event_plot.h"
 #include "kivtool/report/known_payload.h"
 #include "kivtool/report/report_tally.h"
 #include "kivtool/report/time_text.h"
 #include "toolkit/text_escape.h"
-#include "toolkit/whole_file.h"
 
 namespace kivd {
 namespace {
@@ -200,20 +198,14 @@ void print_tables(std::ostream& out, const report_tally& tally) {
 
 class summary_view : public report_view {
  public:
-    summary_view(std::ostream& out, const std::optional<std::string>& plot_path)
-        : out_(out), plot_path_(plot_path) {}
+    explicit summary_view(std::ostream& out) : out_(out) {}
 
     void start_file(const std::string& path) override {
         path_ = path;
         file_ = {};
     }
 
-    void add(const report_record& record) override {
-        file_.add(record);
-        if (plot_path_ && record.field->number() == kiv::Report::kEventsFieldNumber) {
-            plot_.add(get<kiv::Event>(record));
-        }
-    }
+    void add(const report_record& record) override { file_.add(record); }
 
     std::string finish_file(const report_reader& file) override {
         file_.data_size = file.data_size();
@@ -227,31 +219,24 @@ class summary_view : public report_view {
         return "";
     }
 
-    std::string finish() override {
-        if (files_ > 1) {
-            out_ << "\ntotal of " << files_ << " files\n";
-            print_tables(out_, total_);
-        }
-        if (!plot_path_) return "";
-        const std::string problem = replace_file(*plot_path_, plot_.svg());
-        return problem.empty() ? "" : printable(*plot_path_) + ": " + problem;
+    void finish() override {
+        if (files_ < 2) return;
+        out_ << "\ntotal of " << files_ << " files\n";
+        print_tables(out_, total_);
     }
 
  private:
     std::ostream& out_;
-    std::optional<std::string> plot_path_;
     std::string path_;
     report_tally file_;
     report_tally total_;
     size_t files_ = 0;
-    event_plot plot_;
 };
 
 }  // namespace
 
-std::unique_ptr<report_view> make_summary_view(std::ostream& out,
-                                               const std::optional<std::string>& plot_path) {
-    return std::make_unique<summary_view>(out, plot_path);
+std::unique_ptr<report_view> make_summary_view(std::ostream& out) {
+    return std::make_unique<summary_view>(out);
 }
 
 }  // namespace kivd

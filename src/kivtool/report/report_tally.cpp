@@ -22,6 +22,33 @@ void time_span::add(const time_span& other) {
     last = std::max(last, other.last);
 }
 
+void event_tally::add(const event_tally& other) {
+    count += other.count;
+    payload_size += other.payload_size;
+    last = std::max(last, other.last);
+}
+
+void latest_counter::add(const latest_counter& other) {
+    if (other.time >= time) *this = other;
+}
+
+void latest_static::add(const latest_static& other) {
+    if (other.time < time) return;
+    const uint64_t first_rank = rank == 0 ? other.rank : rank;
+    *this = other;
+    rank = first_rank;
+}
+
+template <class value>
+void report_tally::add(probe_table<value>& table, std::string_view package, std::string_view name,
+                       const value& its, uint64_t records) {
+    if (value* const kept = table.find_or_add(package, name)) {
+        kept->add(its);
+    } else {
+        unlisted += records;
+    }
+}
+
 void report_tally::add(const report_record& record) {
     switch (record.field->number()) {
         case kiv::Report::kHeaderFieldNumber:
@@ -43,38 +70,20 @@ void report_tally::add(const kiv::Event& event) {
     ++events;
     span.add(event.timestamp());
     if (is_of_known_kind(event)) keep_message(event);
-    event_tally* const kept = by_event.find_or_add(event.package(), event.name());
-    if (!kept) {
-        ++unlisted;
-        return;
-    }
-    ++kept->count;
-    kept->payload_size += event.payload().size();
-    kept->last = std::max(kept->last, event.timestamp());
+    add(by_event, event.package(), event.name(), {1, event.payload().size(), event.timestamp()});
 }
 
 void report_tally::add(const kiv::Counter& counter) {
     ++counters;
     span.add(counter.to_timestamp());
-    latest_counter* const kept = by_counter.find_or_add(counter.package(), counter.name());
-    if (!kept) {
-        ++unlisted;
-    } else if (counter.to_timestamp() >= kept->time) {
-        *kept = {counter.value(), counter.to_timestamp()};
-    }
+    add(by_counter, counter.package(), counter.name(), {counter.value(), counter.to_timestamp()});
 }
 
 void report_tally::add(const kiv::StaticData& item) {
     ++statics;
     span.add(item.timestamp());
-    latest_static* const kept = by_static.find_or_add(item.package(), item.name());
-    if (!kept) {
-        ++unlisted;
-    } else if (item.timestamp() >= kept->time) {
-        if (kept->rank == 0) kept->rank = statics;
-        kept->value = printable(item.value(), shown_value);
-        kept->time = item.timestamp();
-    }
+    add(by_static, item.package(), item.name(),
+        {printable(item.value(), shown_value), item.timestamp(), statics});
 }
 
 void report_tally::keep_message(const kiv::Event& event) {
@@ -97,32 +106,14 @@ void report_tally::add(const report_tally& other) {
     counters += other.counters;
     unlisted += other.unlisted;
     other.by_event.for_each([this](auto package, auto name, const event_tally& its) {
-        event_tally* const kept = by_event.find_or_add(package, name);
-        if (!kept) {
-            unlisted += its.count;
-            return;
-        }
-        kept->count += its.count;
-        kept->payload_size += its.payload_size;
-        kept->last = std::max(kept->last, its.last);
+        add(by_event, package, name, its, its.count);
     });
     other.by_counter.for_each([this](auto package, auto name, const latest_counter& its) {
-        latest_counter* const kept = by_counter.find_or_add(package, name);
-        if (!kept) {
-            ++unlisted;
-        } else if (its.time >= kept->time) {
-            *kept = its;
-        }
+        add(by_counter, package, name, its);
     });
-    other.by_static.for_each([this](auto package, auto name, const latest_static& its) {
-        latest_static* const kept = by_static.find_or_add(package, name);
-        if (!kept) {
-            ++unlisted;
-        } else if (its.time >= kept->time) {
-            const uint64_t rank = kept->rank;
-            *kept = its;
-            kept->rank = rank == 0 ? statics + its.rank : rank;
-        }
+    other.by_static.for_each([this](auto package, auto name, latest_static its) {
+        its.rank += statics;
+        add(by_static, package, name, its);
     });
     statics += other.statics;
     for (const kiv::Event& event : other.messages) keep_message(event);

@@ -6,6 +6,7 @@
 #include <deque>
 #include <limits>
 #include <string>
+#include <string_view>
 
 #include "kivtool/report/probe_table.h"
 #include "kivtool/report/report_view.h"
@@ -25,17 +26,24 @@ struct event_tally {
     uint64_t count = 0;
     uint64_t payload_size = 0;  // bytes
     int64_t last = std::numeric_limits<int64_t>::min();
+
+    void add(const event_tally& other);
 };
 
+// Of these, the later one stays.
 struct latest_counter {
     int64_t value = 0;
     int64_t time = std::numeric_limits<int64_t>::min();
+
+    void add(const latest_counter& other);
 };
 
 struct latest_static {
     std::string value;  // as it is shown
     int64_t time = std::numeric_limits<int64_t>::min();
-    uint64_t rank = 0;  // in the order in which they came
+    uint64_t rank = 0;  // in the order in which they came first
+
+    void add(const latest_static& other);
 };
 
 struct report_tally {
@@ -61,6 +69,10 @@ struct report_tally {
     void add(const kiv::Event& event);
     void add(const kiv::Counter& counter);
     void add(const kiv::StaticData& item);
+    // `records` are lost to the table when it has no room for another probe.
+    template <class value>
+    void add(probe_table<value>& table, std::string_view package, std::string_view name,
+             const value& its, uint64_t records = 1);
     void keep_message(const kiv::Event& event);
 };
 

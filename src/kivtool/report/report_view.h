@@ -20,8 +20,8 @@ class report_view {
     virtual void add(const report_record& record) = 0;
     // The end of it. Gives what could not be shown, as the end of a sentence, or nothing.
     virtual std::string finish_file(const report_reader& file) = 0;
-    // The end of all files. Gives what could not be done, as a sentence, or nothing.
-    virtual std::string finish() { return ""; }
+    // The end of all files.
+    virtual void finish() {}
 };
 
 }  // namespace kivd

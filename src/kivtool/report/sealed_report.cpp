@@ -6,10 +6,11 @@
 #include <cstddef>
 #include <cstdint>
 #include <limits>
-#include <memory>
 #include <new>
 
-#include "util/unique_fd.h"
+#include "toolkit/unpacked_bytes.h"
+#include "util/bytes.h"
+#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {
@@ -17,19 +18,11 @@ namespace {
 constexpr size_t aes_key_size = 16;
 constexpr size_t iv_size = 16;
 constexpr size_t block_size = 16;
-constexpr char gzip_magic[] = "\x1f\x8b";
 
 // Which of the two it is cannot be told: a wrong key only makes other bytes.
 constexpr char not_opened[] = "the report is sealed for another key, or damaged";
 
-using unique_pkey_context = std::unique_ptr<EVP_PKEY_CTX, releaser<EVP_PKEY_CTX_free>>;
-using unique_cipher = std::unique_ptr<EVP_CIPHER_CTX, releaser<EVP_CIPHER_CTX_free>>;
-
-const uint8_t* bytes_of(const std::string& text) {
-    return reinterpret_cast<const uint8_t*>(text.data());
-}
-
-uint8_t* bytes_of(std::string& text) { return reinterpret_cast<uint8_t*>(text.data()); }
+uint8_t* start_of(std::string& text) { return reinterpret_cast<uint8_t*>(text.data()); }
 
 bool decrypt_key(EVP_PKEY& private_key, const std::string& encrypted, std::string& aes_key) {
     const unique_pkey_context context(EVP_PKEY_CTX_new(&private_key, nullptr));
@@ -37,13 +30,13 @@ bool decrypt_key(EVP_PKEY& private_key, const std::string& encrypted, std::strin
     size_t size = 0;
     if (EVP_PKEY_decrypt_init(context.get()) != 1 ||
         EVP_PKEY_CTX_set_rsa_padding(context.get(), RSA_PKCS1_PADDING) != 1 ||
-        EVP_PKEY_decrypt(context.get(), nullptr, &size, bytes_of(encrypted), encrypted.size()) !=
-            1) {
+        EVP_PKEY_decrypt(context.get(), nullptr, &size, bytes_of(encrypted).data(),
+                         encrypted.size()) != 1) {
         return false;
     }
     aes_key.resize(size);
-    const int result = EVP_PKEY_decrypt(context.get(), bytes_of(aes_key), &size,
-                                        bytes_of(encrypted), encrypted.size());
+    const int result = EVP_PKEY_decrypt(context.get(), start_of(aes_key), &size,
+                                        bytes_of(encrypted).data(), encrypted.size());
     aes_key.resize(result == 1 ? size : 0);
     return aes_key.size() == aes_key_size;
 }
@@ -55,11 +48,11 @@ bool decrypt_content(const std::string& aes_key, const std::string& iv,
     content.resize(encrypted.size() + block_size);
     int size = 0;
     int last_size = 0;
-    if (EVP_DecryptInit_ex(cipher.get(), EVP_aes_128_cbc(), nullptr, bytes_of(aes_key),
-                           bytes_of(iv)) != 1 ||
-        EVP_DecryptUpdate(cipher.get(), bytes_of(content), &size, bytes_of(encrypted),
+    if (EVP_DecryptInit_ex(cipher.get(), EVP_aes_128_cbc(), nullptr, bytes_of(aes_key).data(),
+                           bytes_of(iv).data()) != 1 ||
+        EVP_DecryptUpdate(cipher.get(), start_of(content), &size, bytes_of(encrypted).data(),
                           static_cast<int>(encrypted.size())) != 1 ||
-        EVP_DecryptFinal_ex(cipher.get(), bytes_of(content) + size, &last_size) != 1) {
+        EVP_DecryptFinal_ex(cipher.get(), start_of(content) + size, &last_size) != 1) {
         return false;
     }
     content.resize(static_cast<size_t>(size) + static_cast<size_t>(last_size));

@@ -1,4 +1,4 @@
-#include "support/recording_platform.h"
+#include "platform/recording_platform.h"
 
 #include <cstdarg>
 #include <cstdio>
@@ -37,7 +37,8 @@ extern "C" int __android_log_print(int priority, const char* tag, const char* fo
     const int size = vsnprintf(text, sizeof text, format, arguments);
     va_end(arguments);
     const std::lock_guard lock(log_mutex);
-    log_lines.push_back(("IWE"[priority - ANDROID_LOG_INFO] + " "s) + tag + ": " + text);
+    log_lines.push_back(std::string(1, "IWE"[priority - ANDROID_LOG_INFO]) + ' ' + tag + ": " +
+                        text);
     return size;
 }
 

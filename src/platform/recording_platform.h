@@ -1,4 +1,5 @@
-// The platform layer of the tests: it keeps what is logged and answers what the test has set.
+// A platform layer in the place of the real one, for programs that only try the daemon's modules:
+// it keeps what is logged, and answers what it has been told to.
 #pragma once
 
 #include <map>
@@ -7,10 +8,10 @@
 
 namespace kivd {
 
-using namespace std::string_literals;
 using lines = std::vector<std::string>;
 
-// What this process has logged since the last call, as "E kivd-util: text".
+// What this process has logged since the last call, as "E kivd-util: text"; W is a warning, I an
+// information.
 lines take_log();
 
 // System properties; all others are absent.

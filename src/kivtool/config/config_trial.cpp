@@ -1,0 +1,176 @@
+#include "kivtool/config/config_trial.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+#include "config/config_parts.h"
+#include "config/filters.h"
+#include "config/settings.h"
+#include "daemon/modules.h"
+#include "intake/intake.h"
+#include "intake/run_actions.h"
+#include "kivtool/config/filter_lint.h"
+#include "kivtool/config/part_text.h"
+#include "platform/recording_platform.h"
+#include "toolkit/text_escape.h"
+#include "util/bytes.h"
+#include "util/paths.h"
+
+namespace kivd {
+namespace {
+
+namespace fs = std::filesystem;
+
+// The daemon's modules as after its first start, in a directory that is the current one for as long
+// as they live.
+class trial_daemon {
+ public:
+    trial_daemon() : previous_(fs::current_path()) {
+        std::string name = fs::temp_directory_path() / "kivtool-XXXXXX";
+        if (mkdtemp(name.data()) == nullptr) {
+            throw std::system_error(errno, std::generic_category(), name);
+        }
+        own_ = name;
+        for (const char* each : {paths::private_dir, paths::output_dir}) {
+            fs::create_directory(own_ / each);
+        }
+        fs::current_path(own_);
+        (void)start_modules();
+    }
+    ~trial_daemon() {
+        release_modules();
+        std::error_code ignored;
+        fs::current_path(previous_, ignored);
+        fs::remove_all(own_, ignored);
+    }
+    trial_daemon(const trial_daemon&) = delete;
+    trial_daemon& operator=(const trial_daemon&) = delete;
+
+    // Whether there was a filter of events.
+    [[nodiscard]] bool restart() {
+        release_modules();
+        return start_modules();
+    }
+
+ private:
+    fs::path previous_;
+    fs::path own_;
+};
+
+// Takes a step of the daemon; whatever it complains of is an error.
+void judge(const lint_place& place, lint_findings& findings, auto step) {
+    (void)take_log();
+    step();
+    for (const std::string& line : take_log()) {
+        const bool is_complaint = !line.starts_with("I ");
+        if (!is_complaint || line.starts_with("E kivd-error: ")) continue;  // no daemon to be told
+        findings.error(place, "the daemon logs \"" + printable(line.substr(2)) + '"');
+    }
+}
+
+// The one that counts, of parts with the same name; null when there is none.
+const part_content* find_own(std::span<const part_content> parts, std::string_view name) {
+    const auto found = std::find_if(parts.rbegin(), parts.rend(), [name](const auto& part) {
+        return part.package == daemon_package && part.name == name;
+    });
+    return found == parts.rend() ? nullptr : &*found;
+}
+
+// Which of the parts a program could get.
+std::vector<bool> find_kept(std::span<const part_content> parts) {
+    std::vector<bool> kept;
+    for (const part_content& part : parts) {
+        kept.push_back(get_config_fd(part.package.c_str(), part.name.c_str()).ok());
+    }
+    return kept;
+}
+
+// Which items of the filter stand for probes that are kept.
+std::vector<bool> find_matches(const written_filter& filter) {
+    std::vector<bool> matches;
+    for (const auto& item : filter.filter.item()) {
+        matches.push_back(filter_match(filter.kind, item.package().c_str(), item.name().c_str()));
+    }
+    return matches;
+}
+
+void warn_of_nothing(const written_filter& filter, lint_findings& findings) {
+    const auto matches = find_matches(filter);
+    const bool is_other_kept = filter_match(filter.kind, "\x01", "\x01");
+    if (is_other_kept || std::ranges::find(matches, true) != matches.end()) return;
+    findings.warning(filter.place, std::string("the daemon keeps no ") + filter.things);
+}
+
+// The first difference, which stands for others; -1 for none.
+int first_difference(const std::vector<bool>& before, const std::vector<bool>& after) {
+    const auto [at, ignored] = std::ranges::mismatch(before, after);
+    return at == before.end() ? -1 : static_cast<int>(at - before.begin());
+}
+
+void try_restart(trial_daemon& daemon, std::span<const part_content> parts,
+                 const std::vector<written_filter>& filters, const lint_place& whole,
+                 lint_findings& findings) {
+    const auto kept = find_kept(parts);
+    std::vector<std::vector<bool>> matches;
+    for (const written_filter& each : filters) matches.push_back(find_matches(each));
+    bool has_event_filter = false;
+    judge(whole, findings, [&] { has_event_filter = daemon.restart(); });
+
+    const auto still_kept = find_kept(parts);
+    for (size_t i = 0; i < parts.size(); ++i) {
+        if (!kept[i] || still_kept[i]) continue;
+        const part_content& part = parts[i];
+        findings.error({part.path, 0, id_of(part)},
+                       "the daemon's list of parts does not bring it through the next start, and "
+                       "perhaps others");
+        break;
+    }
+    for (size_t i = 0; i < filters.size(); ++i) {
+        const int other = first_difference(matches[i], find_matches(filters[i]));
+        if (other < 0) continue;
+        findings.error(filters[i].place_of_item(other),
+                       "from its next start on the daemon does the opposite with it, and perhaps "
+                       "with others");
+    }
+    if (has_event_filter) return;
+    findings.warning(whole,
+                     "there is no filter of events that outlives a start of the daemon; it keeps "
+                     "all events, and at its next start it takes the system's first configuration, "
+                     "if there is one");
+}
+
+}  // namespace
+
+void try_config(std::string_view bytes, std::span<const part_content> parts,
+                const std::string& path, lint_findings& findings) {
+    const lint_place whole = {path, 0, ""};
+    const auto place_of_own = [&](const char* name) {
+        const part_content* const part = find_own(parts, name);
+        return part ? lint_place{part->path, 0, id_of(*part)} : whole;
+    };
+    trial_daemon daemon;
+    bool is_stored = false;
+    judge(whole, findings, [&] { is_stored = store_configuration(bytes_of(bytes)); });
+    if (!is_stored) return;
+    judge(place_of_own("Settings"), findings, apply_settings);
+    judge(place_of_own("FilterConfig"), findings, apply_filter_config);
+    const part_content* const filter_part = find_own(parts, "FilterConfig");
+    const auto filters = filter_part ? filters_of(*filter_part) : std::vector<written_filter>();
+    for (const written_filter& each : filters) warn_of_nothing(each, findings);
+    const bool was_disabled = fs::exists(paths::disable_marker);
+    judge(place_of_own("RunActionsOnce"), findings, run_actions_once);
+    if (was_disabled && !fs::exists(paths::disable_marker)) {
+        findings.error(place_of_own("Settings"),
+                       "permanently_disable together with remove_reports of kivd:RunActionsOnce, "
+                       "which also removes the mark of a disabled daemon; the daemon stops until "
+                       "its next start only");
+    }
+    fs::remove(paths::disable_marker);  // it would not start any more
+    try_restart(daemon, parts, filters, whole, findings);
+}
+
+}  // namespace kivd
