@@ -3,32 +3,30 @@
 
 #include <getopt.h>
 
+#include <array>
+#include <cstddef>
+#include <iterator>
+
 namespace kivd {
 
-// Options that have no short letter.
-inline constexpr int socket_delays_option = 256;
-inline constexpr int verify_config_option = 257;
-inline constexpr int encrypt_option = 258;
-
 inline constexpr option long_options[] = {
-    {"verbose", no_argument, nullptr, 'v'},
-    {"basedir", required_argument, nullptr, 'b'},
-    {"help", no_argument, nullptr, 'h'},
-    {"test-mode", no_argument, nullptr, 't'},
-    {"no-detach", no_argument, nullptr, 'D'},
-    {"no-compress", no_argument, nullptr, 'Z'},
-    {"save-interval", required_argument, nullptr, 's'},
-    {"expire-data", required_argument, nullptr, 'e'},
-    {"enable-di", no_argument, nullptr, 'd'},
-    {"enable-dc", no_argument, nullptr, 'C'},
-    {"cert-path", required_argument, nullptr, 'c'},
-    {"verify-config", required_argument, nullptr, verify_config_option},
-    {"encrypt", required_argument, nullptr, encrypt_option},
-    {"socket-delays", required_argument, nullptr, socket_delays_option},
+#define KIV_OPTION(letter, name, takes, ...) {name, takes, nullptr, letter},
+#include "daemon/option_table.def"
+#undef KIV_OPTION
     {nullptr, 0, nullptr, 0},
 };
 
-inline constexpr char short_options[] = "vb:htDZs:dCe:c:";
+// Each letter, and a colon behind those that take an argument; a text.
+inline constexpr auto short_options = [] {
+    std::array<char, 2 * std::size(long_options)> text = {};
+    size_t size = 0;
+    for (const option& each : long_options) {
+        if (each.val > 0x7F) continue;
+        text[size++] = static_cast<char>(each.val);
+        if (each.has_arg == required_argument) text[size++] = ':';
+    }
+    return text;
+}();
 
 inline constexpr char no_encryption[] = "NO_ENCRYPTION";  // in place of the directory of -c
 

@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
 
 #include "config/limits.h"
 #include "daemon/loop/save_clock.h"
@@ -36,18 +37,21 @@ constexpr int not_verified_status = 33;
 constexpr char usage[] =
     "Syntax: kivd [OPTIONS]\n"
     "\n"
-    "  -h, --help             give this help list\n"
-    "  -b  <base_dir>         use specified base directory\n"
-    "  -v, --verbose          emit debugging messages\n"
-    "  -t, --test-mode        enter reproducable test mode\n"
-    "  -D, --no-detach        don't detach from tty\n"
-    "  -Z, --no-compress      don't compress output\n"
-    "  -s, --save-interval    save interval in seconds for counters and static data\n"
-    "  -d, --enable-di        enables the debug interface\n"
-    "  -C, --enable-dc        enables data collection\n"
-    "  -e, --expire-data <t>  expire data after <t> seconds. Can be overridden by configuration.\n"
-    "  -c, --cert-path        use certificates from this path. NO_ENCRYPTION to turn off "
-    "encryption.\n";
+#define KIV_OPTION(letter, name, takes, action, usage_line) usage_line
+#include "daemon/option_table.def"
+#undef KIV_OPTION
+    ;
+
+struct command_line : options {
+    bool asks_help;
+    const char* verified_file;   // null: none
+    const char* encrypted_file;  // null: none
+};
+
+void set_interval(const char* text) {
+    const int32_t seconds = parse_saturated(text);
+    if (seconds >= 1) set_save_interval(seconds);
+}
 
 void set_expire_age(const char* seconds) {
     const auto age = static_cast<uint32_t>(parse_saturated(seconds));
@@ -75,7 +79,7 @@ void set_certificate_path(const char* path) {
     set_config_key_dir(directory);
 }
 
-// Where the files of the command-line operations are looked for; they go on where it fails.
+// Where the files of the command-line operations are looked for; on failure we stay where we are.
 void enter_base_directory(const char* directory) {
     if (chdir(directory) == 0) {
         daemon_error_init(paths::working_dir);
@@ -92,75 +96,47 @@ void set_socket_delays(const char* delays) {
     if (colon != nullptr) set_send_delay(std::max(parse_saturated(colon + 1), 0));
 }
 
+struct option_action {
+    int letter;
+    void (*run)(command_line& line, const char* argument);
+};
+constexpr option_action option_actions[] = {
+#define KIV_OPTION(letter, name, takes, action, usage_line) \
+    {letter,                                                \
+     []([[maybe_unused]] command_line& line, [[maybe_unused]] const char* argument) { action; }},
+#include "daemon/option_table.def"
+#undef KIV_OPTION
+};
+
+command_line read_command_line(int argc, char** argv) {
+    command_line line = {{KIV_DEFAULT_DIRECTORY, true, false}, false, nullptr, nullptr};
+    int letter = 0;
+    while ((letter = getopt_long(argc, argv, short_options.data(), long_options, nullptr)) != -1) {
+        const auto* const found = std::ranges::find(option_actions, letter, &option_action::letter);
+        // What is unknown has been complained of.
+        if (found != std::end(option_actions)) found->run(line, optarg);
+    }
+    return line;
+}
+
 }  // namespace
 
 options parse_options(int argc, char** argv) {
-    options given = {KIV_DEFAULT_DIRECTORY, true, false};
-    bool help = false;
-    const char* verified_file = nullptr;
-    const char* encrypted_file = nullptr;
-    int letter = 0;
-    while ((letter = getopt_long(argc, argv, short_options, long_options, nullptr)) != -1) {
-        switch (letter) {
-            case 'b':
-                given.base_directory = optarg;
-                break;
-            case 'h':
-                help = true;
-                break;
-            case 't':
-                enable_test_mode();
-                break;
-            case 'D':
-                given.detach = false;
-                break;
-            case 'Z':
-                set_output_compression(false);
-                break;
-            case 's':
-                if (const int32_t seconds = parse_saturated(optarg); seconds >= 1) {
-                    set_save_interval(seconds);
-                }
-                break;
-            case 'd':
-                given.debug_interface = true;
-                break;
-            case 'C':
-                set_data_collection(true);
-                break;
-            case 'e':
-                set_expire_age(optarg);
-                break;
-            case 'c':
-                set_certificate_path(optarg);
-                break;
-            case verify_config_option:
-                verified_file = optarg;
-                break;
-            case encrypt_option:
-                encrypted_file = optarg;
-                break;
-            case socket_delays_option:
-                set_socket_delays(optarg);
-                break;
-            default:  // -v has no effect; what is unknown has been complained of
-                break;
-        }
-    }
-    if (help) {
+    const command_line line = read_command_line(argc, argv);
+    if (line.asks_help) {
         puts(usage);
         exit(2);
     }
-    if (verified_file != nullptr) {
-        enter_base_directory(given.base_directory);
-        exit(verify_config_command(verified_file) ? verified_status : not_verified_status);
+    if (line.verified_file != nullptr) {
+        enter_base_directory(line.base_directory);
+        exit(verify_config_command(line.verified_file) ? verified_status : not_verified_status);
     }
-    if (encrypted_file != nullptr) {
-        enter_base_directory(given.base_directory);
-        debug_encrypt(encrypted_file);
+    if (line.encrypted_file != nullptr) {
+        enter_base_directory(line.base_directory);
+        debug_encrypt(line.encrypted_file);
         exit(0);
     }
-    return given;
+    return line;
 }
 
 }  // namespace kivd

@@ -77,8 +77,8 @@ daemon_arguments parse_arguments(std::string text) {
     opterr = 0;
     int letter = 0;
     // NOLINTNEXTLINE(concurrency-mt-unsafe): kivctl has one thread
-    while ((letter = getopt_long(count, arguments.data(), short_options, long_options, nullptr)) !=
-           -1) {
+    while ((letter = getopt_long(count, arguments.data(), short_options.data(), long_options,
+                                 nullptr)) != -1) {
         if (letter == 'c') found.key_directory = optarg;
         if (letter == 't') found.is_test_mode = true;
     }
