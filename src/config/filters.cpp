@@ -15,6 +15,7 @@
 #include "list/sorted_list.h"
 #include "runtime/log_and_raise.h"
 #include "util/paths.h"
+#include "util/releaser.h"
 
 namespace kivd {
 namespace {
@@ -84,7 +85,7 @@ bool out_of_memory() {
                          "Out Of Memory creating probe filter, new probe filter not activated!");
 }
 
-// Gives the items as they came, in a block of `count` and as many places more to sort them in.
+// Returns the items as they came, in a block of `count` and as many places more to sort them in.
 unique_malloc<probe_key> copy_keys(const filter_message& wanted) {
     unique_malloc<probe_key> keys(
         static_cast<probe_key*>(malloc((2 * wanted.n_item + 1) * sizeof(probe_key))));

@@ -4,8 +4,8 @@
 namespace kivd {
 
 // Starts them on the files of the current directory, in which private/ and output/ are: what is
-// remembered is loaded, mended where a crash has spoilt it, and in force. What the command line has
-// to say of them has been said before. True when there was a filter for events.
+// remembered is loaded, mended where a crash has spoilt it, and in force. The options have to be
+// read first. True when there was a filter for events.
 bool start_modules();
 
 // Waits for the children that make files and puts all that the process keeps back to what it was

@@ -16,7 +16,7 @@ inline constexpr option long_options[] = {
     {nullptr, 0, nullptr, 0},
 };
 
-// Each letter, and a colon behind those that take an argument; a text.
+// The letters as text, those that take an argument with a colon behind them.
 inline constexpr auto short_options = [] {
     std::array<char, 2 * std::size(long_options)> text = {};
     size_t size = 0;

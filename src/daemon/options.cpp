@@ -113,7 +113,7 @@ command_line read_command_line(int argc, char** argv) {
     int letter = 0;
     while ((letter = getopt_long(argc, argv, short_options.data(), long_options, nullptr)) != -1) {
         const auto* const found = std::ranges::find(option_actions, letter, &option_action::letter);
-        // What is unknown has been complained of.
+        // getopt_long has complained of what is unknown.
         if (found != std::end(option_actions)) found->run(line, optarg);
     }
     return line;

@@ -9,7 +9,7 @@ struct options {
     bool debug_interface;
 };
 
-// Reads the command line into the modules that it concerns and gives the rest. Ends the process
+// Passes what the command line says to the modules concerned and returns the rest. Ends the process
 // when help is asked for, a certificate path does not exist, or a file is to be verified or sealed
 // (errors then go to the daemon of the base directory, if one runs). Unknown options are reported
 // on standard error and ignored.

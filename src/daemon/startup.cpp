@@ -72,7 +72,7 @@ unique_fd lock_file() {
     return fd;
 }
 
-// Whether the file is still the one of that name: a daemon that was just ending removes its own.
+// Whether the file still has that name: a daemon that is just ending removes its own.
 bool is_current_lock(int fd) {
     struct stat locked = {};
     struct stat named = {};
@@ -95,8 +95,8 @@ struct signal_action {
     void (*handler)(int);
     const char* name;
 };
-// Of all the others that would end the daemon, those that something may send without meaning it to.
-// SIGALRM only interrupts a call that blocks.
+// Beside the two that stop the daemon: those that would end it and that something may send without
+// meaning that. SIGALRM only interrupts a call that blocks.
 const signal_action signal_actions[] = {
     {SIGINT, [](int) { request_stop(); }, "SIGINT"},
     {SIGTERM, [](int) { request_stop(); }, "SIGTERM"},
@@ -141,7 +141,7 @@ void create_directories() {
     umask(022);
 }
 
-// Where the marker says that the daemon is disabled: says so and waits until a stop is requested.
+// When the marker says that the daemon is disabled, logs that and waits until a stop is requested.
 void wait_while_disabled() {
     if (access(paths::disable_marker, F_OK) != 0) return;
     __android_log_print(ANDROID_LOG_ERROR, "kivd-util", "KIV will disable itself.");
@@ -149,7 +149,7 @@ void wait_while_disabled() {
     while (!is_stop_requested()) wait_for_stop(day_ms);
 }
 
-// Puts the process into its place: detached, in its directory, the only one there.
+// Detaches, enters the working directory and makes sure to be the only daemon there.
 void enter_working_directory(const options& given) {
     if (given.detach && getppid() != 1) {
         detach();

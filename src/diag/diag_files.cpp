@@ -23,7 +23,7 @@ namespace {
 
 constexpr char tag[] = "kivd-qz";
 
-// The last one that a client asked for: it still answers when the directory is gone.
+// The numbers that the last client request found: they still answer when the directory is gone.
 constinit diag_numbers exported = {};
 
 // Reads a name as scanf does with "q%*c_%d": what follows the number does not matter.
@@ -63,7 +63,7 @@ bool scan_diag_files(diag_numbers& numbers) {
 void delete_diag_file(const diag_path& path) { delete_entry(path.text); }
 
 void delete_diag_files(int32_t from, int32_t to) {
-    // By what is there: with numbers far apart there may be very many to go through.
+    // Goes by the files that exist: numbers may be too far apart to try each of them.
     (void)for_each_entry(paths::diag_dir, [from, to](std::string_view name) {
         const std::optional<int32_t> number = diag_number(name);
         if (!number || *number < from || *number > to) return;

@@ -8,7 +8,8 @@
 
 namespace kivd {
 
-// The numbers that are there, whatever the files hold. Without any the lowest is above the highest.
+// The numbers that are there, whatever the files hold. Without files the lowest is above the
+// highest.
 struct diag_numbers {
     int32_t highest;
     int32_t lowest;
@@ -25,17 +26,17 @@ struct diag_path {
 [[nodiscard]] bool scan_diag_files(diag_numbers& numbers);
 
 // Deletes one file, those numbered `from` to `to`, or every entry of the directory. What could not
-// be deleted has been logged and raised; that it is gone already is fine.
+// be deleted has been logged and raised; a file that is gone already is fine.
 void delete_diag_file(const diag_path& path);
 void delete_diag_files(int32_t from, int32_t to);
 void delete_all_diag_entries();
 
-// The file of that number to read, compressed if it is so; not ok when there is none.
+// Opens the file of that number, compressed or not, to read; not ok when there is none.
 [[nodiscard]] unique_fd open_diag_file(int32_t number);
 
-// The number of the file behind `number`: the lowest there is when that comes before it. -1 when
-// there is none. Numbers between the lowest and the highest count as files, whether or not they are
-// there.
+// The number of the file that follows `number`, which is at least the lowest there is; -1 when
+// there is none. Every number between the lowest and the highest counts, whether or not its file
+// exists.
 [[nodiscard]] int32_t next_diag_file(int32_t number);
 
 // Forgets what next_diag_file last found.

@@ -93,7 +93,7 @@ void start_compressor(int32_t number) {
     _exit(0);
 }
 
-// Lets the files go that are too old by now; gives the number of the next one.
+// Deletes the files that are too old by now; returns the number of the next one.
 int32_t make_room(const diag_numbers& numbers) {
     if (numbers.highest == INT32_MAX) {
         diag_wait_for_compressor();  // or its file would come back
@@ -132,7 +132,7 @@ void switch_off() {
     log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s", strerror(errno));
 }
 
-// A record that a crash has torn must not have others behind it.
+// Nothing may be appended behind a record that a crash has torn.
 void qz_rescue_event_file() {
     diag_numbers numbers;
     if (!scan_diag_files(numbers)) {

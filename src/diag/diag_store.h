@@ -1,6 +1,6 @@
 // The diagnostics store: while it is active, a short rolling history of a few kinds of events
-// (shutdowns and boots, crashes, calls that failed) in files of its own. It is fed with the event
-// requests and knows no filter. Only the newest few files stay, compressed but for the last.
+// (shutdowns and boots, crashes, calls that failed) in files of its own. It is offered every event
+// request, whatever the filters say. Only the newest few files stay, compressed but for the last.
 #pragma once
 
 #include <cstdint>
@@ -18,8 +18,8 @@ void diag_set_active(int32_t value);
 // event is then lost here.
 void diag_add_event(const char* package, const char* name, std::span<const char> payload);
 
-// Whether events of that name can be wanted. Says no while the store is switched on by a value
-// other than 1.
+// Whether events of that name can be wanted. False while the store is switched on by a value other
+// than 1.
 [[nodiscard]] bool diag_wants_probe(const char* package, const char* name);
 
 // Bytes that have to stay free on the file system for it.
@@ -28,7 +28,7 @@ void diag_add_event(const char* package, const char* name, std::span<const char>
 // Waits until no compressor runs.
 void diag_wait_for_compressor();
 
-// Waits like that; the store is then inactive, and its files stay.
+// Waits likewise and makes the store inactive; its files stay.
 void diag_release();
 
 }  // namespace kivd

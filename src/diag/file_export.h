@@ -1,5 +1,5 @@
-// Files that privileged clients may walk and fetch, addressed by the number of a file set and of a
-// file, both as the texts of a request. There is one set: 750, the diagnostics files.
+// Files that permitted clients may list and fetch. A set and a file in it are named by numbers, in
+// the text form that requests have. There is one set: 750, the diagnostics files.
 #pragma once
 
 #include <cstdint>
@@ -8,8 +8,8 @@
 
 namespace kivd {
 
-// The number of the file behind that one, -1 when there is none. Missing (null) texts have been
-// logged and raised.
+// The number of the file that follows that one, -1 when there is none. Missing (null) texts have
+// been logged and raised.
 [[nodiscard]] int32_t next_exported_file(const char* set, const char* number);
 
 // A file to read; not ok when there is none. Missing texts as above.

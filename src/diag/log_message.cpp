@@ -65,8 +65,8 @@ std::optional<bytes> take_content(bytes& rest, uint32_t type) {
     }
 }
 
-// Whether the message is made of fields all through and not nested too deep. The decoder calls
-// itself for each level, however many there are: a small payload could overflow the stack.
+// Whether the message consists of whole fields and is not nested too deep. The decoder calls itself
+// for each level, however many there are: a small payload could overflow the stack.
 bool is_decodable(bytes message, int depth) {
     if (depth > max_depth) return false;
     while (!message.empty()) {

@@ -10,6 +10,7 @@
 #include "format/config_file.h"
 #include "runtime/log_and_raise.h"
 #include "util/paths.h"
+#include "util/releaser.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
@@ -30,7 +31,7 @@ bool extract_field(std::span<const uint8_t> content, const char* path) {
     return written || content.empty() || failed_to_extract(path);
 }
 
-// Appends the next chunk to the package. Gives its size, or nothing on failure.
+// Appends the next chunk to the package. Returns its size, or nothing on failure.
 std::optional<size_t> read_chunk(gzFile file, file_bytes& package) {
     void* const grown = realloc(package.data.get(), package.size + chunk_size);
     if (grown == nullptr) return std::nullopt;
@@ -52,7 +53,7 @@ bool is_complete(gzFile file) {
 }  // namespace
 
 bool extract_config_fields(std::span<const uint8_t> file) {
-    // Those of an intake that was cut short would be taken for this file's.
+    // What an interrupted intake has left would be taken for this file's.
     (void)remove(paths::new_config_signature);
     (void)remove(paths::new_config_data);
     config_fields fields;

@@ -82,7 +82,7 @@ bool take_config_file(std::span<const uint8_t> file) {
 }
 
 bool take_input() {
-    // Not waiting: a pipe in its place is an empty file.
+    // Doesn't wait for a writer: a pipe in its place counts as an empty file.
     unique_fd fd(open(paths::config_file, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     struct stat status = {};
     if (!fd.ok() || fstat(fd.get(), &status) != 0 || S_ISDIR(status.st_mode)) return false;

@@ -18,9 +18,9 @@ void install_first_configuration();
 // False when it was refused, which has been logged and raised.
 [[nodiscard]] bool store_configuration(std::span<const uint8_t> file);
 
-// Takes input/config and has everything follow it: settings, report header, filters, actions. False
-// when there is none, or when it was refused, which has been logged and raised; what was in force
-// then stays so. input/ is empty afterwards, but for directories: nothing is deleted recursively.
+// Takes input/config and puts it in force: settings, report header, filters, actions. False when
+// there is none, or when it was refused, which has been logged and raised; what was in force then
+// stays in force. input/ is empty afterwards, but for directories: nothing is deleted recursively.
 // Others write there, so input/config may be anything: a pipe counts as empty, a directory as none.
 bool take_new_configuration();
 

@@ -21,8 +21,7 @@ namespace {
 
 constexpr char tag[] = "kivd-conf";
 
-// Stands for the process itself: its id may belong to someone else once it has ended. Not a
-// unique_fd, which would close it at exit.
+// A pidfd, since the id may belong to another process once the reader has ended. -1: none.
 constinit int log_reader_fd = -1;
 
 [[noreturn]] void become_log_reader() {

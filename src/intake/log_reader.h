@@ -1,5 +1,5 @@
-// The log reader: a program of its own that the daemon starts as a child and of which it knows
-// nothing more than whether it runs. It outlives the daemon.
+// The log reader: a separate program that the daemon starts as a child. The daemon knows no more of
+// it than whether it runs. It outlives the daemon.
 #pragma once
 
 namespace kivd {

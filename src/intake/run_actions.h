@@ -8,7 +8,7 @@ namespace kivd {
 // force wants it. Without the part everything stays as it is. Failures have been logged and raised.
 void run_actions();
 
-// Only when a configuration has been taken.
+// Does what is done once; to be called when a configuration has been taken.
 void run_actions_once();
 
 }  // namespace kivd

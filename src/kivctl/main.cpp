@@ -12,7 +12,7 @@
 #include "kiv.h"
 #include "kivctl/commands.h"
 #include "kivctl/io.h"
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 namespace {

@@ -8,7 +8,7 @@
 
 #include "kiv.h"
 #include "kivctl/io.h"
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 

@@ -25,6 +25,7 @@
 #include "kivctl/watch_frames.h"
 #include "kivctl/watch_line.h"
 #include "util/file_io.h"
+#include "util/releaser.h"
 #include "util/unique_fd.h"
 
 namespace kivd {

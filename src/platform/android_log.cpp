@@ -36,7 +36,7 @@ int connect_system_log() {
     return -1;
 }
 
-// A logger that was restarted needs a new connection, so a failed send is tried on one, once.
+// A restarted logger needs a new connection, so a failed send is repeated once on one.
 bool send_to_system(const char* line, size_t size) {
     for (int attempt = 0; attempt < 2; ++attempt) {
         if (system_log_fd < 0) system_log_fd = connect_system_log();
@@ -49,7 +49,7 @@ bool send_to_system(const char* line, size_t size) {
     return false;
 }
 
-// Asks before writing, since a pipe that nobody empties would hold the daemon for ever.
+// Asks first, since a write to a pipe that nobody empties would block for ever.
 bool write_to_stderr(const char* line, size_t size) {
     pollfd room = {STDERR_FILENO, POLLOUT, 0};
     if (poll(&room, 1, lines_lost == 0 ? stalled_wait_ms : 0) != 1) return false;
@@ -99,7 +99,7 @@ bool log_line(int priority, const char* tag, const char* text) {
     const size_t start = std::min(static_cast<size_t>(head), sizeof line / 2);
     size_t length = std::min(strlen(text), sizeof line - start - 1);
     while (length > 0 && text[length - 1] == '\n') --length;
-    // What clients name themselves is logged too: no line of theirs may look like one of ours.
+    // The log shows names that clients chose: none of them may look like a line of ours.
     std::transform(text, text + length, line + start, [](char c) {
         const auto byte = static_cast<unsigned char>(c);
         return byte < ' ' || byte == 0x7F ? ' ' : c;
@@ -120,11 +120,7 @@ void log_lock() { mutex.lock(); }
 
 void log_unlock() { mutex.unlock(); }
 
-}  // namespace kivd
-
-using namespace kivd;
-
-int __android_log_print(int priority, const char* tag, const char* format, ...) {
+extern "C" int __android_log_print(int priority, const char* tag, const char* format, ...) {
     const int saved_errno = errno;
     char text[line_size];
     va_list arguments;
@@ -143,3 +139,5 @@ int __android_log_print(int priority, const char* tag, const char* format, ...) 
     errno = saved_errno;
     return written ? 1 : -1;
 }
+
+}  // namespace kivd

@@ -7,8 +7,9 @@
 #include <array>
 #include <cstdio>
 #include <cstring>
-#include <memory>
 #include <optional>
+
+#include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
@@ -16,14 +17,9 @@ namespace {
 constexpr char private_permission[] = "com.vantrelis.permission.KIV_PRIVATE";
 constexpr char private_group[] = "kiv_private";
 
-struct close_file {
-    void operator()(FILE* file) const { fclose(file); }
-};
-using file = std::unique_ptr<FILE, close_file>;
-
 // The files are read directly: a name service may ask the network and hold the event loop.
 bool is_member(const passwd& user) {
-    const file groups(fopen("/etc/group", "re"));
+    const unique_file groups(fopen("/etc/group", "re"));
     if (!groups) return false;
     while (const group* entry = fgetgrent(groups.get())) {
         if (strcmp(entry->gr_name, private_group) != 0) continue;
@@ -36,7 +32,7 @@ bool is_member(const passwd& user) {
 }
 
 bool is_private_user(uid_t uid) {
-    const file users(fopen("/etc/passwd", "re"));
+    const unique_file users(fopen("/etc/passwd", "re"));
     if (!users) return false;
     while (const passwd* entry = fgetpwent(users.get())) {
         if (entry->pw_uid == uid && is_member(*entry)) return true;  // a uid may have two names

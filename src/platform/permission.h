@@ -11,7 +11,7 @@ namespace kivd {
 // ask the network, and the caller must not wait for that.
 [[nodiscard]] bool check_permission(const char* permission, pid_t pid, uid_t uid);
 
-// Looks every answer up anew.
+// Forgets the answers: each is looked up anew.
 void forget_permissions();
 
 }  // namespace kivd

@@ -3,18 +3,15 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <memory>
+
+#include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
 
-struct close_file {
-    void operator()(FILE* file) const { fclose(file); }
-};
-
 // "key=value" lines; those that start with # are comments. An empty value is none.
 bool find_in_file(const char* path, const char* key, char* value) {
-    const std::unique_ptr<FILE, close_file> file(fopen(path, "re"));
+    const unique_file file(fopen(path, "re"));
     if (!file) return false;
     const size_t key_length = strlen(key);
     char* line = nullptr;
@@ -32,12 +29,13 @@ bool find_in_file(const char* path, const char* key, char* value) {
 }
 
 }  // namespace
-}  // namespace kivd
 
-int property_get(const char* key, char* value, const char* default_value) {
+extern "C" int property_get(const char* key, char* value, const char* default_value) {
     for (const char* path :
          {"/system/build.prop", "/vendor/build.prop", "/data/property/persist.prop"}) {
-        if (kivd::find_in_file(path, key, value)) return static_cast<int>(strlen(value));
+        if (find_in_file(path, key, value)) return static_cast<int>(strlen(value));
     }
     return snprintf(value, PROPERTY_VALUE_MAX, "%s", default_value);
 }
+
+}  // namespace kivd

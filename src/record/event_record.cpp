@@ -13,7 +13,7 @@ namespace kivd {
 
 std::optional<size_t> write_event_record(int fd, const char* package, const char* name,
                                          std::span<const char> payload, const char* store_tag) {
-    static constinit std::array<uint8_t, 356> head = {};
+    std::array<uint8_t, 356> head;
     const size_t head_size = pack_event_record(head, package, name, now_ms(), payload.size());
     if (head_size == 0) {
         log_and_raise(store_tag, "Failed to serialize header.");

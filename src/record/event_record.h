@@ -7,8 +7,8 @@
 
 namespace kivd {
 
-// Appends an event record with the time of now. Gives its size in bytes, or nothing: a failure has
-// been logged and raised under `store_tag`, and a part of the record may be there.
+// Appends an event record with the current time. Returns its size in bytes, or nothing: the failure
+// has then been logged and raised under `store_tag`, and a part of the record may be in the file.
 [[nodiscard]] std::optional<size_t> write_event_record(int fd, const char* package,
                                                        const char* name,
                                                        std::span<const char> payload,

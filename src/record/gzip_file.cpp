@@ -11,6 +11,7 @@
 
 #include "runtime/log_and_raise.h"
 #include "util/file_io.h"
+#include "util/releaser.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
@@ -20,8 +21,8 @@ constexpr char tag[] = "kivd-fu";
 constexpr size_t chunk_size = 16384;
 constexpr int gzip_framing = 16;  // added to the window's bits
 
-// What deflate works with. The memory of a fresh child costs more than storing data does, so the
-// level that needs none gets the least there is.
+// The settings of deflate. Storing needs no memory to search in, and fresh memory costs a child
+// more than the storing does, so it gets the least there is.
 struct deflate_settings {
     int level;
     int window_bits;
@@ -35,8 +36,8 @@ deflate_settings settings_of(gzip_level level) {
 
 using unique_deflate = std::unique_ptr<z_stream, releaser<deflateEnd>>;
 
-// Feeds `stream` with what is in its input, and at the end of it (`flush` is Z_FINISH) with no
-// more; writes all that comes out.
+// Runs what `stream` has as its input through deflate, finishes when `flush` is Z_FINISH, and
+// writes all that comes out.
 bool deflate_chunk(z_stream& stream, int flush, int output) {
     std::array<Bytef, chunk_size> chunk;
     do {

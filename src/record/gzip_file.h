@@ -11,7 +11,7 @@ enum class gzip_level : uint8_t {
 };
 
 // Copies the file `source` into the gzip file `destination`, by writes of its own rather than
-// zlib's, so that a full device shows. False when not all of it arrived there: a failure to open
+// zlib's, so that a full device shows. False when not all of it has been written: a failure to open
 // either has been logged and raised, and a part of the destination may remain.
 [[nodiscard]] bool gzip_file(const char* source, const char* destination, gzip_level level);
 

@@ -7,8 +7,8 @@
 
 #include "runtime/log_and_raise.h"
 #include "util/file_io.h"
+#include "util/releaser.h"
 #include "util/text_scan.h"
-#include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
@@ -28,7 +28,7 @@ void release(packed_header& header) {
     header = {};
 }
 
-// Packing reads the texts, although the message could change them.
+// The message asks for texts that can be written to; packing only reads them.
 char* packed(const char* text) { return const_cast<char*>(text); }
 
 Kiv__Header message_of(const header_record& header, std::span<char*, max_group_ids> group_ids) {

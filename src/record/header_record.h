@@ -1,5 +1,5 @@
-// The report header: who the device is, as every report begins with it. The header record holds the
-// values in force; packed, it is a kiv.Report with only its field `header`.
+// The report header, with which every report begins: it says who the device is. The header record
+// holds the values in force; packed, it is a kiv.Report with only its field `header`.
 #pragma once
 
 #include <array>
@@ -85,9 +85,9 @@ struct header_field {
     [[nodiscard]] bool is_known(const header_record& header) const;
 };
 
-// A row has all of a field; with it, the field is gathered, remembered, compared and packed. The
-// state file has their lines in this order, the first before those of sizes. Beside the table stand
-// the configuration checksum, the time zone, the group ids, and the two properties of the cdf_id.
+// A row is all that a field needs to be gathered, remembered, compared and packed. The state file
+// has their lines in this order, the first one before the sizes. Outside the table are the
+// configuration checksum, the time zone, the group ids, and the two properties of the cdf_id.
 // clang-format off
 inline constexpr header_field header_fields[] = {
     {&header_record::device_id, &Kiv__Header::device_id, 40, "device_id:", "device id:",

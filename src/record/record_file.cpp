@@ -19,11 +19,11 @@ namespace {
 
 constexpr char tag[] = "kivd-util";
 
-// A key byte and the longest varint of a length. The shortest record has more, so that fewer bytes
-// at the end of a file are a torn record.
+// A key byte and the longest varint of a length. Every record is longer, so fewer bytes at the end
+// of a file are a torn record.
 using record_head = std::array<uint8_t, 1 + max_varint32_size>;
 
-// The size of the whole record; nothing when its length is none that a record can have.
+// The size of the whole record; nothing when it cannot have such a length.
 std::optional<size_t> size_of_record(const record_head& head) {
     std::span<const uint8_t> rest = std::span(head).subspan(1);
     const std::optional<uint64_t> length = take_varint(rest, max_varint32_size);
@@ -44,7 +44,8 @@ bool read_record(FILE* file, size_t file_size, size_t& offset, uint8_t key) {
     record_head head;
     const size_t bytes_read = fread(head.data(), 1, head.size(), file);
     if (bytes_read == 0) {
-        return log_and_raise(tag, "Failed to read file: %s", strerror(ferror(file) ? errno : 0));
+        const int error = ferror(file) != 0 ? errno : ENODATA;  // the file ends here
+        return log_and_raise(tag, "Failed to read file: %s", strerror(error));
     }
     if (bytes_read < head.size()) return false;
     if (head[0] != key) {

@@ -1,5 +1,5 @@
-// Reading and mending record files. A record file is whole records end to end and nothing else;
-// records are only ever appended, so a crash can spoil the last one and no other.
+// Reading and mending record files. A record file consists of whole records end to end. They are
+// only ever appended, so a crash can spoil no record but the last.
 #pragma once
 
 #include <array>
@@ -35,7 +35,7 @@ class record_appender {
     // logged and raised under `store_tag`, as in `flush`.
     void append(std::span<const uint8_t> record, const char* store_tag);
 
-    // Writes what has been taken.
+    // Writes what `append` has taken.
     void flush(const char* store_tag);
 
  private:

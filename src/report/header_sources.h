@@ -11,7 +11,7 @@ namespace kivd {
 // Whether the identity is given by hand: in test mode, or when private/header_info.conf exists.
 [[nodiscard]] bool has_header_info();
 
-// Seconds east of UTC of local time now; -1 in test mode.
+// How many seconds local time is east of UTC now; -1 in test mode.
 [[nodiscard]] int32_t local_utc_offset();
 
 // Fills a header with initial values from the sources, group ids of header_info.conf included.

@@ -32,7 +32,7 @@ bool same_group_ids(const group_id_list& a, const group_id_list& b) {
     return true;
 }
 
-// A value that is not known any more is no change.
+// A value that is no longer known is no change.
 bool is_changed(const header_record& candidate, const header_record& previous) {
     const bool is_text_changed = std::ranges::any_of(header_fields, [&](const auto& field) {
         return field.is_known(candidate) && !(candidate.*field.text == previous.*field.text);
@@ -41,7 +41,7 @@ bool is_changed(const header_record& candidate, const header_record& previous) {
            !same_group_ids(candidate.groups, previous.groups);
 }
 
-// What no source gives stays as it is remembered.
+// Values that no source has stay as they are remembered.
 void rebuild_header(header_record& record) {
     header_record candidate;
     gather_header(candidate);

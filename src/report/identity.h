@@ -11,11 +11,11 @@ namespace kivd {
 // the process when no report header can be had.
 void update_header_info();
 
-// Draws a device id when none is known yet, and saves the state file.
+// Makes up a random device id when none is known yet, and saves the state file.
 void ensure_device_id();
 
 using device_id_buffer = std::array<char, 40>;
-// The device id, filled up with NULs; one of 40 characters has none.
+// The device id, padded with NULs; one of 40 characters has none.
 void get_device_id(device_id_buffer& buffer);
 
 // Group ids: the state file and the report header follow each change.

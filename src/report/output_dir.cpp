@@ -34,7 +34,7 @@ struct entry_path {
     char text[sizeof paths::output_dir + NAME_MAX];
 };
 
-// Each entry but "config_request"; as for_each_entry.
+// Like for_each_entry, but leaves out "config_request".
 bool for_each_output(auto function) {
     return for_each_entry(paths::output_dir, [&function](std::string_view name) {
         if (name != paths::config_request_name) function(name.data());
@@ -116,8 +116,8 @@ void log_deleted(const char* log_tag, const char* path) {
     __android_log_print(ANDROID_LOG_INFO, log_tag, "Deleting %s from output directory", path);
 }
 
-// Deletes the oldest reports until there is room, or until one is not there any more: a collector
-// takes them too. False when that is the first one.
+// Deletes the oldest reports until there is room, or until one is already gone: collectors take
+// them, too. False when the very first is gone.
 bool delete_oldest(directory_state& state) {
     for (size_t i = 0; i < state.oldest_count; ++i) {
         if (i > 0 && is_room_enough(state)) return true;
@@ -157,7 +157,7 @@ std::optional<int32_t> prune_dir() {
 
 int64_t next_report_number(int32_t highest) {
     if (highest < INT32_MAX) return int64_t{highest} + 1;
-    // Numbers have run out: the lowest one that nothing is kept under.
+    // The numbers have run out: take the lowest that is free.
     int64_t number = 1;
     while (access(report_path(number).text, F_OK) == 0) ++number;
     return number;

@@ -23,9 +23,8 @@ inline constexpr uint64_t free_inodes_min = 8;
     return max_output_dir_size - max_report_size;
 }
 
-// Deletes the oldest reports until another one fits. Gives the highest report number left, 0 when
-// there is none; nothing when room cannot be made, and mostly a log line about what stood in the
-// way.
+// Deletes the oldest reports until another one fits. Returns the highest report number left, 0 when
+// there is none; nothing when room cannot be made, for which most reasons have been logged.
 [[nodiscard]] std::optional<int32_t> prune_dir();
 
 // The path of the report with that number, NUL-terminated.

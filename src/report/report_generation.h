@@ -7,8 +7,8 @@
 namespace kivd {
 
 // Waits for an earlier compactor, flushes and starts one. False when there was nothing to report or
-// the flush failed, which has been logged and raised; a fork that failed has been, too, and leaves
-// the flushed data to be replaced by the next.
+// the flush failed, which has been logged and raised. So has a failed fork, after which the next
+// flush replaces the flushed data.
 bool generate_report();
 
 // Whether anything has been collected since the last flush.
@@ -24,7 +24,7 @@ void wait_for_compactor();
 // Switches compression off (gzip framing around stored data) or on again.
 void set_output_compression(bool enabled);
 
-// Waits until no compactor runs; compression is on.
+// Waits until no compactor runs, and switches compression on.
 void report_generation_release();
 
 }  // namespace kivd

@@ -78,7 +78,7 @@ void read_group_id(const char* text) {
     if (!id.empty()) add_group_id(get_header_record().groups, id);
 }
 
-// A line that is no header field's and no limit's.
+// A line for something other than a header field or a limit.
 struct state_value {
     std::string_view state_key;
     void (*read)(const char* text);  // leaves the value as it is when `text` holds none
@@ -117,7 +117,7 @@ void read_value(const header_field& row, const char* text) {
     row.set_from_line(get_header_record(), text);
 }
 
-// The file has these unsigned values in signed form.
+// The file holds these unsigned values as signed numbers.
 void read_value(const setting& row, const char* text) {
     if (const auto number = scan_number(text)) {
         get_limits().*row.limit = static_cast<uint32_t>(saturate_int32(*number));

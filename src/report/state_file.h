@@ -26,7 +26,7 @@ void set_last_flush(int64_t time_ms);
 [[nodiscard]] bool is_data_collection_enabled();
 void set_data_collection(bool enabled);
 
-// Of the configuration in force; all zero before any arrived.
+// Of the configuration in force; all zero before the first one.
 [[nodiscard]] config_checksum get_config_checksum();
 void set_config_checksum(const config_checksum& checksum);
 

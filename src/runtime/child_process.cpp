@@ -57,7 +57,7 @@ pid_t fork_child(child_kind kind) {
 
     log_unlock();
     daemon_error_unlock();
-    // One that is to become another program would lose what its handler took now.
+    // A child that becomes another program would lose a signal that its handler took now.
     if (pid != 0 || kind == child_kind::worker) pthread_sigmask(SIG_SETMASK, &before, nullptr);
     errno = fork_errno;
     return pid;

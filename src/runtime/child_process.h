@@ -8,11 +8,11 @@
 namespace kivd {
 
 // The descriptor that children hold open beside 0 to 2: the daemon's lock, so that no new daemon
-// meets the work of an old one's child half done.
+// starts while a child of an old one is still at work.
 void set_inherited_descriptor(int fd);
 
-// Raises the limit of open descriptors as far as it goes: each client takes one. Programs that are
-// started have the one from before.
+// Raises the limit of open descriptors as far as it goes: each client takes one. Programs that we
+// start get the original limit back.
 void raise_descriptor_limit();
 
 enum class child_kind : uint8_t {

@@ -15,7 +15,7 @@
 #include "daemon_error.pb-c.h"
 #include "platform/android_log.h"
 #include "util/clock.h"
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 namespace {
@@ -38,7 +38,7 @@ bool read_clock(time_t& now) {
     return false;
 }
 
-// Counts the error. Gives nothing when it is suppressed, else the event's `flooding` value.
+// Counts the error. Returns nothing when it is suppressed, else the event's `flooding` value.
 std::optional<bool> admit() {
     time_t now = 0;
     if (error_time == 0) {

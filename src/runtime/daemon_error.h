@@ -17,13 +17,13 @@ inline constexpr int32_t error_period_limit = 100;
 inline constexpr time_t error_flood_interval = 36000;  // seconds
 inline constexpr time_t error_flood_interval_in_test_mode = 6;
 
-// `directory` is where the daemon's own sockets are; the text is kept by the caller.
+// `directory` is where the daemon's own sockets are; the caller keeps the text.
 void daemon_error_init(const char* directory);
 
-// Hangs up and begins a new period, without a directory.
+// Disconnects, forgets the directory, and begins a new period.
 void daemon_error_release();
 
-// Formats a text and sends it; never waits and never fails towards the caller. Keeps errno.
+// Formats a text and sends it, without waiting; a failure is not the caller's concern. Keeps errno.
 [[gnu::format(printf, 1, 2)]] void raise_daemon_error(const char* format, ...);
 
 // Logs and raises `message`, then ends the process with exit status 1.

@@ -3,7 +3,7 @@
 
 namespace kivd {
 
-// Logs at ERROR under `tag`, then raises "tag: text". Gives false, so that a failing function can
+// Logs at ERROR under `tag`, then raises "tag: text". Returns false, so that a failing function can
 // end in `return log_and_raise(...)`. Keeps errno.
 [[gnu::format(printf, 2, 3)]] bool log_and_raise(const char* tag, const char* format, ...);
 

@@ -6,7 +6,7 @@ namespace kivd {
 // Makes the event that request_stop signals. False, with errno set, when it cannot be made.
 [[nodiscard]] bool stop_init();
 
-// Closes it, and no stop is requested any more.
+// Closes the event and withdraws the request.
 void stop_release();
 
 // Readable once a stop has been requested; -1 when there is none.
@@ -19,7 +19,7 @@ void request_stop();
 // Waits until a stop is requested, for at most that time.
 void wait_for_stop(int timeout_ms);
 
-// In a forked child: a signal there sets the child's flag and wakes nobody else.
+// For a forked child: a signal there is to set the child's own flag and wake nobody else.
 void stop_forget_event();
 
 }  // namespace kivd

@@ -25,7 +25,7 @@ void set_path(key_path& path, const char* directory, const char* name) {
 unique_pkey load_public_key(const key_path& path) {
     const unique_file file = open_to_read(path.data());
     if (!file) return nullptr;
-    // The empty pass phrase stands for the library's own callback, which would ask at the terminal.
+    // An empty pass phrase replaces the library's own callback, which would ask at the terminal.
     char no_pass_phrase[] = "";
     unique_pkey key(PEM_read_PUBKEY(file.get(), nullptr, nullptr, no_pass_phrase));
     ERR_clear_error();

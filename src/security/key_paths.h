@@ -7,10 +7,10 @@
 
 namespace kivd {
 
-// Both keys in the system's own directory for them.
+// Has both keys looked for in the system's own directory for them.
 void set_default_key_paths();
 
-// The key is the file of its name in `directory`, which ends in "/": none is put in between. Paths
+// The key is the file of its name in `directory`, which has to end in "/": none is added. Paths
 // longer than 4095 characters are cut.
 void set_report_key_dir(const char* directory);
 void set_config_key_dir(const char* directory);

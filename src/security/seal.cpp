@@ -16,8 +16,7 @@ namespace {
 constexpr char tag[] = "kivd/crypto";
 constexpr size_t chunk_size = 16384;
 
-// A modulus of a broken number of bytes would not fit into its length in a report, which is counted
-// in whole ones.
+// A report gives the length of the encrypted key in bytes, so the modulus has to have whole bytes.
 bool is_report_key(const EVP_PKEY* key) {
     if (key == nullptr || EVP_PKEY_is_a(key, "RSA") == 0) return false;
     const int bits = EVP_PKEY_get_bits(key);

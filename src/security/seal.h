@@ -1,5 +1,5 @@
-// Envelope encryption: data is encrypted with AES-128-CBC (PKCS#7 padding) under a key and an IV
-// drawn for this once, and that key with the RSA report key (RSAES-PKCS1-v1_5).
+// Envelope encryption: data is encrypted with AES-128-CBC (PKCS#7 padding) under a random key and
+// IV of its own, and that key with the RSA report key (RSAES-PKCS1-v1_5).
 #pragma once
 
 #include <openssl/evp.h>
@@ -15,7 +15,7 @@ namespace kivd {
 
 inline constexpr uint32_t max_report_key_bits = 4096;
 
-// One encryption that has been started.
+// One encryption that is under way.
 struct sealing {
     unique_cipher cipher;
     std::array<uint8_t, max_report_key_bits / 8> encrypted_key;  // as long as the key's modulus

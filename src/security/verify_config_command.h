@@ -3,8 +3,8 @@
 
 namespace kivd {
 
-// Checks a file against the signature in the file of the same name with ".sig" behind it, prints
-// "Verified: OK" or "Verified: Failure", and gives whether it holds.
+// Checks a file against the signature in the file of the same name with ".sig" appended, prints
+// "Verified: OK" or "Verified: Failure", and returns whether the signature holds.
 [[nodiscard]] bool verify_config_command(const char* path);
 
 }  // namespace kivd

@@ -13,7 +13,7 @@
 #include "util/clock.h"
 #include "util/numbers.h"
 #include "util/paths.h"
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 namespace {

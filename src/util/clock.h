@@ -11,7 +11,7 @@ namespace kivd {
 
 // Test mode (`--test-mode`): stepping clock, fixed identity, short flood interval.
 void enable_test_mode();
-void leave_test_mode();  // the next one starts at the beginning again
+void leave_test_mode();  // the clock then starts over
 [[nodiscard]] bool is_test_mode();
 
 // Sets the test clock, in seconds since the epoch; without effect on now_ms outside test mode.

@@ -8,8 +8,8 @@
 
 namespace kivd {
 
-// Calls `function` with the name of each entry but "." and "..", a text with a NUL behind it, until
-// there is none left. False, with errno set, when the directory cannot be read, or not to its end.
+// Calls `function` with the name of each entry but "." and "..", which has a NUL behind it. False,
+// with errno set, when the directory cannot be read, or not to its end.
 bool for_each_entry(const char* path, auto function) {
     const unique_dir directory(opendir(path));
     if (!directory) return false;

@@ -64,7 +64,7 @@ unique_fd create_file(const char* path) {
 }
 
 unique_fd open_regular(const char* path) {
-    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));  // no waiting for a pipe's writer
+    unique_fd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));  // a pipe may have no writer
     struct stat status = {};
     if (fd.ok() && (fstat(fd.get(), &status) != 0 || !S_ISREG(status.st_mode))) {
         fd.reset();

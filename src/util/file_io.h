@@ -9,6 +9,7 @@
 #include <optional>
 #include <span>
 
+#include "util/releaser.h"
 #include "util/unique_fd.h"
 
 namespace kivd {

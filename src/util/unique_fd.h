@@ -4,22 +4,15 @@
 #include <dirent.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <memory>
 #include <utility>
 
-namespace kivd {
+#include "util/releaser.h"
 
-// The deleter that calls `release`, for std::unique_ptr.
-template <auto release>
-struct releaser {
-    void operator()(auto* object) const noexcept { release(object); }
-};
+namespace kivd {
 
 using unique_file = std::unique_ptr<FILE, releaser<fclose>>;
 using unique_dir = std::unique_ptr<DIR, releaser<closedir>>;
-template <class type>
-using unique_malloc = std::unique_ptr<type, releaser<free>>;
 
 // Owns a descriptor; -1 is none.
 class unique_fd {

@@ -5,7 +5,7 @@
 
 #include <memory>
 
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 

@@ -24,6 +24,7 @@
 #include "runtime/log_and_raise.h"
 #include "runtime/stop.h"
 #include "util/paths.h"
+#include "util/releaser.h"
 
 namespace kivd {
 namespace {
@@ -55,7 +56,7 @@ ssize_t peek_size(int netlink) {
     return recv(netlink, nullptr, 0, MSG_PEEK | MSG_TRUNC | MSG_DONTWAIT);
 }
 
-// Waits for room in the daemon's queue until the daemon is to stop. Gives what sendto gives.
+// Waits for room in the daemon's queue, until the daemon is to stop. Returns what sendto returns.
 ssize_t send_request(const daemon_socket& daemon, std::string_view text) {
     const auto* const address = reinterpret_cast<const sockaddr*>(&daemon.address);
     for (;;) {
@@ -65,7 +66,7 @@ ssize_t send_request(const daemon_socket& daemon, std::string_view text) {
     }
 }
 
-// The next token from `position` on, and behind it; tokens stand between blanks.
+// The next token from `position` on, which then moves behind it. Blanks separate tokens.
 std::string_view next_token(std::string_view text, size_t& position) {
     const size_t start = std::min(text.find_first_not_of(' ', position), text.size());
     const size_t end = std::min(text.find(' ', start), text.size());
@@ -108,8 +109,8 @@ void pass_counter(const daemon_socket& daemon, std::string_view text) {
                   static_cast<int>(text.size()), static_cast<int>(sent));
 }
 
-// Nothing but events that are translated and counters goes on: every local user can send to this
-// netlink port, and to the daemon the bridge is itself.
+// Passes on nothing but translated events and counters: every local user can send to this netlink
+// port, and the daemon takes what the bridge sends for its own.
 void pass_on(const daemon_socket& daemon, std::span<char> message) {
     const std::string_view text(message.data(), message.size());
     size_t position = 0;
@@ -187,7 +188,7 @@ void receive_kernel_message(int netlink, daemon_socket& daemon) {
 }
 
 void run_kernel_bridge() {
-    // They stay open until the process ends, so that nobody else takes the port.
+    // These stay open until the process ends, so that nobody else takes the port.
     static daemon_socket daemon;
     static unique_fd netlink;
     const bool serving = open_daemon_socket(daemon) && open_netlink_socket(netlink) &&

@@ -26,18 +26,18 @@ struct daemon_socket {
 [[nodiscard]] bool open_netlink_socket(unique_fd& netlink);
 [[nodiscard]] bool send_pid_to_kernel(int netlink);
 
-// Receives one message, waiting for it until the daemon is to stop, and sends on what it says, for
-// which it waits while the daemon's queue is full. What is wrong with it has been logged and
-// raised, and so has a lack of memory for it, when it is still there.
+// Receives one message and sends on what it says, waiting for either until the daemon is to stop.
+// What is wrong with the message has been logged and raised, and so has a lack of memory, after
+// which the message is still there.
 void receive_kernel_message(int netlink, daemon_socket& daemon);
 
 // The body of the thread: ends when the set-up fails or the daemon is to stop.
 void run_kernel_bridge();
 
-// Starts the thread, which takes no signals, and waits until it is set up or has given up. False
-// when there is none.
+// Starts the thread, which takes no signals, and waits until it is set up or has failed. False when
+// there is none.
 [[nodiscard]] bool start_kernel_bridge();
-// Waits until it has ended; the daemon is to stop.
+// Waits until it has ended; a stop has to be requested first.
 void join_kernel_bridge();
 
 }  // namespace kivd

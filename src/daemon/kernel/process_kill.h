@@ -8,7 +8,7 @@
 #include <span>
 #include <string_view>
 
-#include "util/unique_fd.h"
+#include "util/releaser.h"
 
 namespace kivd {
 
@@ -17,8 +17,8 @@ struct packed_event {
     size_t size;
 };
 
-// The packed kernel.ProcessKill of a raw record. Nothing, which has been logged and raised, when
-// such events are not known, the record is too short, or there is no memory.
+// The packed kernel.ProcessKill of a raw record. Nothing, which has been logged and raised, when it
+// is another kind of event, the record is too short, or there is no memory.
 [[nodiscard]] std::optional<packed_event> translate_event(std::string_view package,
                                                           std::string_view name,
                                                           std::span<const char> record);

@@ -21,7 +21,7 @@ constexpr size_t max_events = 10;
 
 constinit int epoll_fd = -1;
 
-// Being readable is all that its event is for: the loop then looks at the flag.
+// It has nothing to do: the event only wakes the loop, which then looks at the flag.
 constinit event_handler stop_handler = {[](event_handler&) {}, -1};
 
 void call_handlers(std::span<const epoll_event> events) {

@@ -1,12 +1,12 @@
-// The one event loop.
+// The event loop, of which there is one.
 #pragma once
 
 namespace kivd {
 
 // The object behind every descriptor in the loop. It must outlive its registration.
 struct event_handler {
-    // Called when `fd` is readable. It may free or close its own handler, as its last act, and no
-    // other: up to ten events are taken in one wait and come with raw pointers.
+    // Called when `fd` is readable. As its last act it may close or free its own handler, but no
+    // other: one wait takes up to ten events, which hold raw pointers.
     void (*callback)(event_handler& handler);
     int fd;  // -1 while closed
 };
@@ -14,7 +14,7 @@ struct event_handler {
 // Makes the loop. A failure has been logged.
 [[nodiscard]] bool event_loop_init();
 
-// Ends it, whatever is still in it.
+// Closes the loop, whatever is still in it.
 void event_loop_release();
 
 // Adds a handler with its descriptor, or takes it out. False, with errno set, when it cannot be

@@ -11,13 +11,13 @@ void set_save_interval(int32_t seconds);
 // Seconds until the next timed save: 0 when it is due, never more than the interval.
 [[nodiscard]] int32_t seconds_until_save();
 
-// The interval starts counting now.
+// Starts a new interval now.
 void mark_saved();
 
-// Saves counters and static data, and marks it.
+// Saves counters and static data and starts a new interval.
 void save_data();
 
-// Back to the usual interval, and to no save as yet.
+// Back to the usual interval, with no save yet.
 void save_clock_release();
 
 }  // namespace kivd

@@ -3,12 +3,12 @@
 
 namespace kivd {
 
-// Sets a descriptor aside to do it with, and gives it back.
+// Sets a descriptor aside for it, and closes that one.
 void turn_away_init();
 void turn_away_release();
 
 // Takes a client that could not be accepted off the queue and hangs up on it: left there, it would
-// wake the loop again at once, for ever. Where even that fails, the loop at least doesn't spin.
+// wake the loop again and again. Where even that fails, a pause keeps the loop from spinning.
 void turn_away_client(int listening_fd);
 
 }  // namespace kivd

@@ -42,14 +42,14 @@ constinit client_socket client_sockets[] = {
 }
 
 int create_socket(int type, const char* name) {
-    // No callback may wait for a client that has gone again.
+    // Non-blocking: no callback may wait for a client that is already gone.
     unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!fd.ok()) give_up_to("create AF_UNIX socket");
     refuse_descriptors(fd.get());
     if (type == SOCK_DGRAM) {  // before the first packet can arrive
         set_socket_timeouts(fd.get());
         const int on = 1;
-        // Without them the room for credentials would take descriptors instead.
+        // Else descriptors would take the room that is meant for credentials.
         if (setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) {
             give_up_to("receive credentials");
         }

@@ -29,7 +29,7 @@ namespace {
 constexpr char tag[] = "kivd";
 constexpr int64_t stream_packet_ms = 3000;  // for a whole packet, however it trickles in
 constexpr int64_t receive_timeout_ms = 1000;
-constexpr rlim_t spare_descriptors = 16;  // for reports, saves and all else that opens files
+constexpr rlim_t reserved_descriptors = 16;  // for reports, saves and all else that opens files
 
 struct connection : event_handler {
     connection* previous;
@@ -52,8 +52,8 @@ bool add_connection(unique_fd fd, void (*callback)(event_handler&)) {
     return true;
 }
 
-// Out of the loop before it is closed: a forked child may still hold a copy of the descriptor, and
-// then the loop would go on reporting it.
+// Leaves the loop before the close: a forked child may hold a copy of the descriptor, and the loop
+// would go on reporting it.
 void close_connection(event_handler& handler) {
     auto& closed = static_cast<connection&>(handler);
     const stall_guard guard;
@@ -64,11 +64,11 @@ void close_connection(event_handler& handler) {
     free(&closed);
 }
 
-// Whether a client may have this descriptor, or the daemon needs it for its own work.
-bool is_spare(int fd) {
+// Whether the daemon keeps this descriptor for its own work.
+bool is_reserved(int fd) {
     rlimit limit = {};
     if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return false;
-    const rlim_t kept = std::min(spare_descriptors, limit.rlim_cur / 4);
+    const rlim_t kept = std::min(reserved_descriptors, limit.rlim_cur / 4);
     return static_cast<rlim_t>(fd) >= limit.rlim_cur - kept;
 }
 
@@ -79,7 +79,7 @@ void accept_client(int listening_fd, void (*callback)(event_handler&)) {
         log_and_raise(tag, "Accept failed: %s.", strerror(errno));
         return turn_away_client(listening_fd);
     }
-    if (is_spare(fd.get())) {
+    if (is_reserved(fd.get())) {
         log_and_raise(tag, "Accept failed: %s.", strerror(EMFILE));
         return;
     }
@@ -100,8 +100,8 @@ ssize_t receive(int fd, char* bytes, size_t size) {
     return n;
 }
 
-// The first receive of a packet, with what both kinds of connection make of its failures. Gives the
-// size, or 0 when there is no packet; the connection may then be closed.
+// Receives the start of a packet, for both kinds of connection. Returns its size, or 0 when there
+// is no packet; the connection may then be closed.
 size_t receive_packet(event_handler& handler, char* buffer, const char* kind) {
     const ssize_t n = receive(handler.fd, buffer, receive_size);
     if (n < 0 && errno == EAGAIN) return 0;
@@ -140,8 +140,8 @@ void receive_seq_client(event_handler& handler) {
     if (size > 0) handle_packet(handler.fd, {buffer, size}, "receive_seq_client");
 }
 
-// Reads on until `buffer` holds `wanted` bytes, or more when more came at once. Gives the bytes now
-// there; fewer than wanted when the client stopped sending.
+// Reads on until `buffer` holds at least `wanted` bytes. Returns how many it holds: fewer when the
+// client stopped sending, more when more came at once.
 size_t receive_rest(int fd, char* buffer, size_t size, size_t wanted) {
     int64_t deadline_ms = monotonic_ms() + stream_packet_ms;
     while (size < wanted && size < receive_size) {

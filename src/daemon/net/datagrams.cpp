@@ -17,8 +17,8 @@ namespace {
 
 constexpr char tag[] = "kivd";
 
-// Room for the sender's credentials, which come first, and for no descriptor: what is attached for
-// all that is dropped by the kernel and never becomes ours.
+// Room for the sender's credentials, which come first, and for no descriptor: the kernel drops
+// those that are attached, so they never become ours.
 struct alignas(cmsghdr) control_buffer {
     std::array<char, CMSG_SPACE(sizeof(ucred))> bytes;
 };
@@ -33,7 +33,7 @@ void handle_datagram(int fd, std::span<char> packet, const msghdr& message) {
     (void)handle_request(-1, packet, &message);
 }
 
-// One packet a call when there is a delay, which is meant for each.
+// One packet at a time when there is a delay, which is meant for each.
 int receive_batch(int fd, std::span<mmsghdr> messages) {
     const auto wanted = static_cast<unsigned>(get_receive_delay() > 0 ? 1 : messages.size());
     const stall_guard guard;

@@ -12,13 +12,13 @@ inline constexpr size_t receive_size = max_packet_size + 1;  // shows that a pac
 inline constexpr size_t max_reply_size = 63;                 // with its NUL, at most 64 bytes
 inline constexpr size_t max_batch = 16;
 
-// What arrived, a NUL, and room for a reply that starts anywhere in it.
+// The packet, a NUL, and room for a reply that may start anywhere in the packet.
 struct alignas(64) packet_buffer {
     std::array<char, receive_size + 1 + max_reply_size> bytes;
 };
 
 // They lie in a mapping of their own that forked children don't get: the parent writes to it all
-// the time, and each such page would have to be copied.
+// the time, and each page written would have to be copied.
 struct packet_buffers {
     std::array<packet_buffer, max_batch> packets;
 };
@@ -26,7 +26,7 @@ struct packet_buffers {
 // Maps the buffers. False, with errno set, when that is not possible.
 [[nodiscard]] bool packet_buffers_init();
 
-// Valid after packet_buffers_init. The callbacks of all sockets share them, one after the other.
+// Valid after packet_buffers_init. The callbacks of all sockets share them in turn.
 [[nodiscard]] packet_buffers& get_packet_buffers();
 
 void packet_buffers_release();

@@ -16,7 +16,7 @@ constexpr char private_permission[] = "com.vantrelis.permission.KIV_PRIVATE";
 
 std::optional<ucred> sender_of(const msghdr& message) {
     if (message.msg_controllen < sizeof(cmsghdr)) return std::nullopt;
-    auto& headers = const_cast<msghdr&>(message);  // CMSG_NXTHDR wants it so and changes nothing
+    auto& headers = const_cast<msghdr&>(message);  // CMSG_NXTHDR asks for it and changes nothing
     for (cmsghdr* control = CMSG_FIRSTHDR(&headers); control != nullptr;
          control = CMSG_NXTHDR(&headers, control)) {
         if (control->cmsg_level != SOL_SOCKET || control->cmsg_type != SCM_CREDENTIALS) continue;

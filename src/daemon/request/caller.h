@@ -6,8 +6,8 @@
 namespace kivd {
 
 // Whether the sender runs under the daemon's own user id or holds the permission for private
-// requests. A sender without credentials does not. On a connection they are those of the moment at
-// which it was made. Users from outside a user namespace appear as 65534, so a daemon in one must
+// requests. A sender without credentials does not. A connection has the credentials of the moment
+// when it was made. Users from outside a user namespace appear as 65534, so a daemon in one must
 // not run as 65534 itself.
 [[nodiscard]] bool check_caller_permission(const request& r);
 

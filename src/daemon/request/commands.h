@@ -1,5 +1,5 @@
-// What carries out the requests: a function for each row of format/requests.def, named there. By
-// then the caller's permission has been checked, and whether data is collected at all.
+// The handlers: a function for each row of format/requests.def, by the name it has there. Before
+// one is called, the caller's permission has been checked, and whether data is being collected.
 #pragma once
 
 #include "daemon/request/request.h"

@@ -78,7 +78,7 @@ answer remove_report(request& r) {
                          [](const char* number) { delete_reports(parse_saturated(number)); });
 }
 
-// The reply is cut to what goes into the request with a NUL behind it, less one byte.
+// With its NUL the reply is cut to one byte less than the request has.
 answer next_file(request& r) {
     const char* const set = next_token(r);
     const char* const number = next_token(r);

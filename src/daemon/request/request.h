@@ -1,5 +1,5 @@
 // One request packet while it is being handled: text split into tokens at blanks (space, tab,
-// carriage return, line feed), in place. A NUL ends the token and the splitting.
+// carriage return, line feed), in place. A NUL ends the text.
 #pragma once
 
 #include <sys/socket.h>
@@ -44,8 +44,8 @@ struct answer {
 // Writes the text over the packet.
 [[nodiscard]] answer answer_with(request& r, std::string_view text);
 
-// Gives a descriptor, or the text "FAIL" when it is none. Nothing for a datagram, to whose sender
-// none can be sent.
+// Answers with a descriptor, or with the text "FAIL" when it is none. There is no answer to a
+// datagram, whose sender cannot be sent one.
 [[nodiscard]] answer answer_with(request& r, unique_fd descriptor);
 
 // A probe's id: package and name.
@@ -54,11 +54,11 @@ struct probe_id {
     const char* name;     // null when missing
 };
 
-// Takes the next two tokens as a probe's id. False, logged and raised, when one is missing or
-// together they are too long.
+// Takes the next two tokens as a probe's id. False, which has been logged and raised, when one is
+// missing or they are too long together.
 [[nodiscard]] bool take_probe_id(request& r, probe_id& probe);
 
-// Whether a value is there and not empty; otherwise that has been logged and raised.
+// Whether there is a value that is not empty; if not, that has been logged and raised.
 [[nodiscard]] bool check_probe_value(const request& r, const probe_id& probe, const char* value);
 
 }  // namespace kivd

@@ -18,7 +18,8 @@ namespace {
 // What a start may say of a file that was begun and is not yet one.
 const std::regex described_at_start(
     "kivd-conf: (Failed to (open /system/etc/kivd.conf|(unpack|verify) configuration)|Corrupt file)"
-    "|kivd-util: Failed to read file: Success|kivd-error: Tried to generate error probe data");
+    "|kivd-util: Failed to read file: No data available|kivd-error: Tried to generate error probe "
+    "data");
 const std::regex lasting_file(
     "events|counters\\.txt|sdata\\.txt|kivd\\.state|header_info\\.conf"
     "|config_list\\.txt|conf_[0-9]+\\.bin|filters\\.txt|qz|qz_compressed");
