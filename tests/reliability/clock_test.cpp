@@ -60,16 +60,18 @@ TEST_F(clock_steps, timed_saves_go_on_after_every_step) {
 }
 
 TEST_F(clock_steps, a_jump_forward_makes_the_save_due_at_once) {
-    daemon_process daemon = start({{"-C", "-s", "86400"}});
-    request({"CI p before 1"});
+    constexpr int64_t day = 24 * 3600;  // what has not changed for an hour is not saved
+    daemon_process daemon = start({{"-C", "-s", "86400", "-e", "3600"}});
+    request({"CI p before 1", "SD p before x"});
     EXPECT_TRUE(daemon.wait_idle());
-    set_clock(year);
+    set_clock(day);
     // In one packet: a connection would have it look at the clock before the request comes.
     EXPECT_TRUE(send_text(connect_client(socket_kind::datagram).get(), "CI p after 1"));
     EXPECT_TRUE(wait_until([] { return is_saved("after"); }));
-    EXPECT_FALSE(is_saved("before"));  // older than the file keeps them
+    EXPECT_FALSE(is_saved("before"));
     request({"FL"});
     const kiv::Report report = wait_report(1);
+    EXPECT_TRUE(exists("private/sdata.txt") && read_file("private/sdata.txt").empty());
     ASSERT_EQ(report.counters_size(), 2);
     EXPECT_EQ(report.counters(1).name(), "before");
     EXPECT_EQ(daemon.stop(), 0);

@@ -85,8 +85,15 @@ TEST_F(output_dir, only_reports_in_the_directory_are_removed) {
     prepare({"kiv_2"}, 100);
     EXPECT_EQ(mkfifo("output/kiv_1", 0600), 0);
     EXPECT_EQ(prune_dir(), 0);
+    prepare({"kiv_4"}, 100);
     fs::create_directory("output/kiv_3");
     EXPECT_EQ(prune_dir(), std::nullopt);
+    EXPECT_TRUE(exists("output/kiv_4"));
+    prepare({"bad", "config_request", "kiv_1", "kiv_2", "kiv_disabled"}, 1);
+    for (const int number : {1, 1, -1}) delete_reports(number);
+    EXPECT_EQ(names(), (lines{"bad", "config_request", "kiv_2", "kiv_disabled"}));
+    delete_reports(0);
+    EXPECT_EQ(names(), lines{"config_request"});
 }
 
 TEST_F(output_dir, numbers_and_sizes_wrap) {
@@ -94,16 +101,6 @@ TEST_F(output_dir, numbers_and_sizes_wrap) {
     get_limits().max_output_dir_size = get_limits().max_report_size - 1;  // no limit, then
     EXPECT_EQ(next_report_number(prune_dir().value()), 2);
     EXPECT_EQ(next_report_number(2147483646), 2147483647);
-}
-
-TEST_F(output_dir, removal_takes_one_report_or_all_but_the_configuration_request) {
-    prepare({"bad", "config_request", "kiv_1", "kiv_2", "kiv_disabled"}, 1);
-    delete_reports(1);
-    delete_reports(1);
-    delete_reports(-1);
-    EXPECT_EQ(names(), (lines{"bad", "config_request", "kiv_2", "kiv_disabled"}));
-    delete_reports(0);
-    EXPECT_EQ(names(), lines{"config_request"});
 }
 
 }  // namespace

@@ -85,14 +85,15 @@ TEST_F(probe_stores, the_expired_are_left_out_of_the_files_only) {
 
 TEST_F(probe_stores, malformed_records_cost_no_others) {
     const std::string good = "p\0n\0001\0002\0003\0\0\n"s;
-    const std::string bad = "p\0\0\n"s + "p\0n\0001\0002\0\0\n"s + "p\0n\0001\0002\0003\0x\0\0\n"s;
+    const std::string bad = "p\0\0\n"s + "p\0n\0001\0002\0\0\n"s + "p\0n\0001\0002\0003\0x\0\0\n"s +
+                            "p\0n\0001\0002\0\0\0\n"s;
     for (const char* path : {paths::counters, paths::static_data})
         write_file(path, good + bad + good);
     restart();
-    EXPECT_EQ(take_log().size(), 6U);
+    EXPECT_EQ(take_log().size(), 8U);
     int packets = 0;
     while (!next_packet().empty()) ++packets;
-    EXPECT_EQ(packets, 6);  // an event and an increment each; those of static data are not raised
+    EXPECT_EQ(packets, 8);  // an event and an increment each; those of static data are not raised
     EXPECT_EQ(reported(0), "P1; n=3; n=3; n: 3; n: 3; ");
 }
 

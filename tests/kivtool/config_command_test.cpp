@@ -4,7 +4,7 @@
 #include "config.pb.h"
 #include "kivtool/config/config_build.h"
 #include "kivtool/config/config_show.h"
-#include "sample_reports.h"
+#include "kivtool/sample_reports.h"
 #include "support/daemon_process.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"

@@ -1,6 +1,6 @@
 #include "kivtool/report/report_command.h"
 
-#include "sample_reports.h"
+#include "kivtool/sample_reports.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"
 

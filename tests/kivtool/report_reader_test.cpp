@@ -3,7 +3,7 @@
 #include <filesystem>
 #include <vector>
 
-#include "sample_reports.h"
+#include "kivtool/sample_reports.h"
 
 namespace kivd {
 namespace {

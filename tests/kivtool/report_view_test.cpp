@@ -5,7 +5,7 @@
 #include <sstream>
 
 #include "kivtool/report/report_command.h"
-#include "sample_reports.h"
+#include "kivtool/sample_reports.h"
 
 namespace kivd {
 namespace {

@@ -1,6 +1,7 @@
 #include "intake/intake.h"
 
-#include <algorithm>
+#include <sys/stat.h>
+
 #include <map>
 
 #include "config/config_parts.h"
@@ -54,25 +55,6 @@ class intake : public scratch_directory {
 std::string part(const char* package, const char* name) {
     const auto bytes = read_whole_fd(get_config_fd(package, name));
     return bytes ? std::string(bytes->data.get(), bytes->data.get() + bytes->size) : "none";
-}
-
-TEST_F(intake, collectors_that_cannot_be_told_keep_no_configuration_out) {
-    const auto told_of = [](const std::string& what) {
-        const lines log = take_log();
-        return std::ranges::count_if(
-            log, [&](const std::string& line) { return line.find(what) != std::string::npos; });
-    };
-    const char* const request = "output/config_request";
-    fs::remove(request);
-    fs::create_symlink("/dev/full", request);
-    ASSERT_TRUE(take(config_file({{"a", "x", "1"}})));
-    EXPECT_EQ(told_of("E kivd-conf: Config request write "), 2);
-    fs::remove(request);
-    fs::create_directory(request);
-    ASSERT_TRUE(take(config_file({{"a", "x", "2"}})));
-    EXPECT_EQ(told_of("E kivd-conf: Failed to open configuration request output/config_request <"),
-              1);
-    EXPECT_EQ(part("a", "x"), "2");
 }
 
 TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {
@@ -198,12 +180,18 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
         EXPECT_EQ(in_force(), before);
     }
     EXPECT_FALSE(take_new_configuration());  // none is there
+    EXPECT_EQ(mkfifo("input/config", 0600), 0);
+    EXPECT_FALSE(take_new_configuration());  // nor does it wait for one
+    EXPECT_EQ(take_log(), lines({unpack_failure}));
     fs::create_directory("input/config");
     EXPECT_FALSE(take_new_configuration());
     EXPECT_EQ(take_log(), lines({"W kivd-conf: Failed to delete input/config."}));
     fs::remove("input/config");
 
-    // The largest file there may be.
+    // The largest file there may be, in spite of what an intake that was killed has left.
+    for (const char* field : {"gz", "sig"}) {
+        fs::create_symlink("/dev/full", "private/new_config."s + field);
+    }
     const std::string whole = config_file(good);
     EXPECT_TRUE(take(whole + std::string(204799 - whole.size(), 'x')));
     EXPECT_EQ(part("a", "x"), "new");
@@ -304,14 +292,6 @@ TEST_F(intake, settings_come_and_go_with_their_part) {
     }
     ASSERT_TRUE(take(config_file({{"kivd", "Settings", "\xff"}})));
     expect_limits({409600, 5242880, 77, 2592000});
-}
-
-TEST_F(intake, a_one_off_action_is_done_once) {
-    for (const char* name : {"output/kiv_1", "output/kiv_disabled"}) write_file(name, "x");
-    const auto once = own_part<RunActionsOnce>("RunActionsOnce", "remove_reports: true");
-    ASSERT_TRUE(take(config_file({once})));
-    EXPECT_EQ(fs::directory_iterator("output")->path(), "output/config_request");
-    EXPECT_EQ(part("kivd", "RunActionsOnce"), "none");
 }
 
 }  // namespace
