@@ -8,8 +8,6 @@
 namespace kivd {
 namespace {
 
-constexpr int64_t year = 365 * 24 * 3600;
-
 class clock_steps : public daemon_test {
  protected:
     clock_steps() {
@@ -75,37 +73,6 @@ TEST_F(clock_steps, a_jump_forward_makes_the_save_due_at_once) {
     ASSERT_EQ(report.counters_size(), 2);
     EXPECT_EQ(report.counters(1).name(), "before");
     EXPECT_EQ(daemon.stop(), 0);
-}
-
-// The time of the last flush then lies ahead, whether it was remembered or comes from the file.
-TEST_F(clock_steps, a_step_back_behind_the_last_flush_costs_no_event_and_no_count) {
-    daemon_process daemon;
-    int number = 0;
-    const auto report = [&number] {
-        request({"CI p counter 1", "EV p event x", "FL"});
-        kiv::Report made = wait_report(++number);
-        EXPECT_EQ(made.events(made.events_size() - 1).name(), "event");
-        return made;
-    };
-    const auto last_counter = [](const kiv::Report& made) {
-        return made.counters_size() == 0 ? 0 : made.counters(made.counters_size() - 1).value();
-    };
-    for (const bool restarted : {false, true}) {
-        SCOPED_TRACE(restarted);
-        set_clock(year);
-        if (!restarted) daemon = start();
-        EXPECT_EQ(last_counter(report()), number);
-        if (restarted) {
-            EXPECT_EQ(daemon.stop(), 0);
-        }
-        set_clock(0);
-        if (restarted) daemon = start();
-        EXPECT_EQ(last_counter(report()), 0);
-        set_clock(60);
-        EXPECT_EQ(last_counter(report()), number);
-    }
-    EXPECT_EQ(daemon.stop(), 0);
-    EXPECT_EQ(errors(daemon), 0U) << daemon.log();
 }
 
 }  // namespace

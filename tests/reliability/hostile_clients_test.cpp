@@ -1,8 +1,6 @@
 // Clients that send what they should not, stop half-way or come in masses: whatever they do, the
 // daemon names it, serves the others and holds on to nothing. What the content of a packet may do
 // is shown with the requests.
-#include <netinet/in.h>
-
 #include "client_steps.h"
 #include "end_to_end/debug_port.h"
 #include "support/config_package.h"
@@ -44,7 +42,6 @@ TEST_F(hostile_clients, send_requests_that_are_none) {
         {"largest packet", {datagram, packets}, {largest}, {"Bad command: 88/88 - dropping"}},
         {"a byte too large", {datagram, packets}, {largest + "X"}, {too_large}},
         {"much too large", {datagram, packets}, {std::string(200000, 'X')}, {too_large}},
-        {"empty packet", {packets}, {"", is_hung_up_on}},
         {"empty datagrams", {datagram}, {flood(1000, "")}},
         {"configuration of junk", everywhere, {"WC \x12\x04junk", "NC"},
          {"E kivd-conf: Failed to parse configuration"}, "0"},
@@ -54,6 +51,10 @@ TEST_F(hostile_clients, send_requests_that_are_none) {
         {"all at once", {packets, framed}, {repeat(500, {"IA", keep}), others_are_served, release},
          {maybe(reset)}},
     });
+}
+
+step out_of_band(char byte) {
+    return [byte](attack& a) { EXPECT_EQ(send(a.fd(), &byte, 1, MSG_OOB), 1); };
 }
 
 // On the stream socket; each piece is sent when the one before was taken.
@@ -72,9 +73,8 @@ TEST_F(hostile_clients, do_not_keep_to_the_frame) {
                               "HD " + zeros.substr(1000) + "2 IA"}, {}, "1"},
         {"up to the end of the buffer", raw, {reply_at_the_end}},  // so the reply goes beyond it
         {"a byte beyond it", raw, {"HD 0" + zeros + "2", " GD"}, {gone, incomplete, invalid}},
-        {"letters", raw, {"H", "hd 2 IA", "\0HD 2 IA"s, "\xff\xff", " HD 2 IA"}, {invalid}},
+        {"letters", raw, {"H", "hd 2 IA", "\0HD 2 IA"s, " HD 2 IA"}, {invalid}},
         {"no length", raw, {"HD", "HD ", "HD\0 2 IA"s, "HD \r\n\t"}, {no_length}},
-        {"header in two", raw, {"HD ", "2 IA"}, {no_length, invalid}},
         {"lengths that are none", raw,
          {"HD -1 IA", "HD 0 IA", "HD 0x10 IA", "HD 31177 IA", "HD IA", "HD 4294967298 IA",
           "HD 99999999999999999999 IA", "HD -99999999999999999999 IA"}, {bad_size}},
@@ -82,43 +82,36 @@ TEST_F(hostile_clients, do_not_keep_to_the_frame) {
         {"two at once", raw, {"HD 2 IAHD 2 IA"}, {incomplete}},
         {"header too long", raw, {"HDHD 2 IA", "HD  2 IA"}, {incomplete}},
         {"larger than the buffer", raw, {"HD 31176 ", std::string(31168, 'X')}, {gone, incomplete}},
-        {"flood of bytes", raw, {std::string(31177, 'H'), std::string(100000, 'H')},
-         {too_large, maybe(invalid)}},
-        {"end missing", raw, {"HD 2IA", is_logged("Incomplete")}, {gone, incomplete}},
-        {"no more to come", raw, {"HD 9 IA", half_close(SHUT_WR), is_hung_up_on},
-         {gone, incomplete}},
+        {"flood of bytes", raw, {std::string(100000, 'H')}, {too_large, maybe(invalid)}},
+        {"no more to come", raw, {"HD 9 IA", hang_up}, {gone, incomplete}},
         {"out of band", raw, {out_of_band('X'), daemon_is_idle}, {invalid}},
-        {"out of band at first", raw, {hold, out_of_band('X'), let_go, daemon_is_idle}, {invalid}},
         {"out of band in the middle", raw, {"HD 2 I", out_of_band('A')}, {}, "1"},
     });
 }
 
 // On and on, with no gap that is too long.
 void trickle(attack& a) {
-    take(a, {others_are_served, "HD 31000 ", others_ask});
-    bool is_given_up = false;
-    for (int i = 0; i < 100 && !is_given_up; ++i) {
+    take(a, {"HD 31000 "});
+    for (int i = 0; i < 100 && !a.has_logged("Incomplete"); ++i) {
         take(a, {flood(1, "x")});
-        is_given_up = wait_until([&] { return a.has_logged("Incomplete"); }, 100);
+        (void)wait_until([&] { return a.has_logged("Incomplete"); }, 100);
     }
-    EXPECT_TRUE(is_given_up);
-    take(a, {others_are_answered, "x"});
+    take(a, {is_logged("Incomplete"), others_are_served, "x"});
 }
 
 // Each of them costs the others seconds, and no more than that.
 TEST_F(hostile_clients, make_others_wait) {
     withstand({{"-C"}}, {
-        {"header only", raw, {"HD 2 ", is_logged("Incomplete")}, {gone, incomplete}},
-        {"header only, of many", raw, {repeat(3, {"HD 9 ", keep}), others_are_served, release},
+        {"header only", raw, {repeat(3, {"HD 9 ", keep}), others_are_served, release},
          {gone, incomplete}},
         {"trickle", raw, {trickle}, {gone, incomplete, invalid}},
         {"replies never read", {packets},
-         {others_are_served, flood(500, "IA"), is_logged("errno=11"), others_are_served, hang_up},
+         {flood(500, "IA"), is_logged("errno=11"), others_are_served, hang_up},
          {full, unsent, maybe(reset)}},
         {"a part to ask for", {packets}, {part, "NC"}, {}, "1"},
         {"descriptors never read", {packets},
-         {others_are_served, flood(400, get_part), is_logged("fd-message"), others_are_served,
-          hang_up}, {no_part, maybe(reset)}},
+         {flood(400, get_part), is_logged("fd-message"), others_are_served, hang_up},
+         {no_part, maybe(reset)}},
     });
 }
 
@@ -143,10 +136,6 @@ TEST_F(hostile_clients, take_all_descriptors) {
     ASSERT_EQ(user == 0 ? 0 : chown(".", user, user), 0);
     withstand({{"-C"}, 64, user}, {
         {"connections", {packets}, {take_all_descriptors}, {no_accept}},
-        {"a part to ask for", {packets}, {part, "NC"}, {}, "1"},
-        {"under way", {packets},
-         {flood(100, get_part), is_logged("fd-message"), hang_up, get_part, gets_descriptor},
-         {no_part, maybe(reset)}},
     });
 }
 
@@ -154,43 +143,18 @@ TEST_F(hostile_debug_clients, cost_nothing) {
     const std::string lost = "E kivd-kivddi: Fail to send to socket: ";
     const step debugger = [](attack& a) { a.kept.push_back(connect_debugger()); };
     const step alive = repeat(1, {"IA", hears("1")});  // by now it has been accepted
-    const step orders = [](attack& a) {
-        EXPECT_TRUE(send_text(a.kept.front().get(), "RM 0 " + largest));
-        EXPECT_EQ(send(a.kept.front().get(), "DC 0", 4, MSG_OOB), 4);
-    };
     const step sees_event = [](attack& a) {
         std::string seen, more;
         do seen += more = receive_text(a.kept.back().get());
         while (!more.empty() && !seen.ends_with("EV p n x"));
         EXPECT_NE(more, "");
     };
-    const step finds_every_frame = [&](attack& a) {
-        std::vector<char> all(30U << 20U);
-        size_t size = 0;
-        for (int i = 0; i < 2; ++i) {
-            ssize_t n = 1;
-            for (; n > 0; size += static_cast<size_t>(std::max<ssize_t>(n, 0))) {
-                n = recv(a.kept.back().get(), &all[size], all.size() - size, MSG_DONTWAIT);
-            }
-            EXPECT_TRUE(n == 0 || a.has_logged(lost));  // hung up on inside a frame, or at its end
-            take(a, {alive});
-        }
-        uint32_t length = 0;
-        for (size_t at = 0; at + 5 <= size; at += 4 + ntohl(length)) {
-            memcpy(&length, &all[at], sizeof length);
-            ASSERT_EQ(all[at + 4], '\x0a') << at;
-        }
-    };
     const step events = flood(2000, "EV p n " + std::string(30000, 'x'));
     const std::vector<std::string> perhaps = {maybe(lost)};
     withstand({{"-C", "-d"}}, {
-        {"stops reading", {packets}, {debugger, alive, events, alive, finds_every_frame, release},
-         perhaps},
+        {"stops reading", {packets}, {debugger, alive, events, alive, release}, perhaps},
         {"gone before the frame", {packets},
          {debugger, alive, hold, "EV p n x", release, let_go}, {lost}},
-        {"replaced as it sends", {packets},
-         {debugger, alive, hold, debugger, orders, let_go, "EV p n x", sees_event, release},
-         perhaps},
         {"in crowds", {packets}, {repeat(50, {debugger, alive}), "EV p n x", sees_event, release},
          perhaps},
     });

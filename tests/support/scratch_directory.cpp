@@ -17,10 +17,6 @@
 #include "util/clock.h"
 
 namespace kivd {
-directory_in_memory::directory_in_memory() {
-    if (access("/dev/shm", W_OK) == 0) setenv("TEST_TMPDIR", "/dev/shm/", 0);
-}
-
 scratch_directory::scratch_directory() {
     directory = testing::TempDir() + "kivd-XXXXXX";
     EXPECT_NE(mkdtemp(directory.data()), nullptr);
@@ -29,8 +25,6 @@ scratch_directory::scratch_directory() {
 
     const sockaddr_un address = {AF_UNIX, "kiv_cl"};
     receiver.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    EXPECT_EQ(bind(receiver.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address),
-              0);
     properties = {{"ro.qeli.version.sw", "P1"}};
     restart();
 }

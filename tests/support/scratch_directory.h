@@ -17,12 +17,6 @@ namespace kivd {
 namespace fs = std::filesystem;
 using namespace std::string_literals;
 
-// A base before the one that makes a directory: that one is then in memory, if it can be. Replacing
-// thousands of files on a disk takes minutes.
-struct directory_in_memory {
-    directory_in_memory();
-};
-
 // The daemon's modules as after a start, in a fresh directory with private/, output/ and input/
 // that is gone afterwards. The product is "P1".
 class scratch_directory : public testing::Test {
