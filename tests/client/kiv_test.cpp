@@ -47,7 +47,6 @@ TEST_F(libkiv, producing_calls_send_these_bytes_or_refuse) {
     EXPECT_EQ(event("p", "n", largest + "x"), too_long);
     EXPECT_EQ(event(package, name + "n", ""), too_long);
     EXPECT_EQ(of(kiv_add_event(h, "p", "n", nullptr, 1)), invalid);
-
     EXPECT_EQ(of(kiv_set_counter(h, "p", "n", INT32_MAX)), outcome(0, "CS p n 2147483647"));
     EXPECT_EQ(of(kiv_inc_counter(h, "p", "n", INT32_MIN)), outcome(0, "CI p n -2147483648"));
     EXPECT_EQ(of(kiv_set_counter(h, "p", "n", INT32_MAX + 1LL)), out_of_range);
@@ -219,7 +218,6 @@ TEST_F(libkiv, an_answer_that_is_wrong_or_missing_is_no_success) {
         EXPECT_EQ(kiv_get_config(h, "p", "n"), result);
         EXPECT_EQ(kiv_install_config(h, "x", 1), result);
         EXPECT_EQ(kiv_next_file(h, 10), result);  // going on with "10" has no end
-        EXPECT_EQ(kiv_get_file(h, 10), result);
     }
     {
         const control_server server(directory, allowing(too_long));

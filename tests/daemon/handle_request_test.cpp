@@ -52,6 +52,11 @@ TEST_F(handle_request, what_is_refused_becomes_an_event_and_a_count) {
     set_error_nr(99);
     (void)ask("");
     EXPECT_TRUE(next_packet().ends_with(doc_example("log.md", "hex", "daemon-error-flooding")));
+    EXPECT_EQ(next_packet(), "CI kiv Cnt_DaemonError 1");
+    const std::string none = "E kivd: Invalid command: none - dropping.";
+    EXPECT_TRUE(ask("").starts_with(none + "E kivd-error: KIV daemon error event will not be"));
+    EXPECT_EQ(ask(""), none);  // told once
+    EXPECT_EQ(next_packet(), "");
 }
 
 TEST_F(handle_request, each_is_answered_or_told_in_the_log) {

@@ -37,26 +37,6 @@ class clock_steps : public daemon_test {
     }
 };
 
-TEST_F(clock_steps, timed_saves_go_on_after_every_step) {
-    daemon_process daemon = start({{"-C", "-s", "1"}});
-    const std::string since_1970 = std::to_string(10 - time(nullptr));
-    int step = 0;
-    for (const std::string& clock :
-         {"+0"s, "-31536000"s, "-31536001"s, "+0"s, "+1"s, "+0"s, "+31536000"s, since_1970, "+0"s,
-          // clocks that stand still, about the turn of a second
-          "2026-01-01 00:00:00"s, "2026-01-01 00:00:01"s, "2026-01-01 00:00:00"s,
-          "2025-12-31 23:59:59"s}) {
-        SCOPED_TRACE(clock);
-        set_clock(clock);
-        const std::string counter = std::to_string(++step);
-        request({"CI p " + counter + " 1"});
-        EXPECT_TRUE(wait_until([&] { return is_saved(counter); }));
-        EXPECT_TRUE(daemon.wait_idle());
-    }
-    EXPECT_EQ(daemon.stop(), 0);
-    EXPECT_EQ(errors(daemon), 0U) << daemon.log();
-}
-
 TEST_F(clock_steps, a_jump_forward_makes_the_save_due_at_once) {
     constexpr int64_t day = 24 * 3600;  // what has not changed for an hour is not saved
     daemon_process daemon = start({{"-C", "-s", "86400", "-e", "3600"}});
