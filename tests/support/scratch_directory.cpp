@@ -1,5 +1,4 @@
 #include "support/scratch_directory.h"
-#include "record/header_record.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -25,6 +24,7 @@ scratch_directory::scratch_directory() {
 
     const sockaddr_un address = {AF_UNIX, "kiv_cl"};
     receiver.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    EXPECT_EQ(bind(receiver.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
     properties = {{"ro.qeli.version.sw", "P1"}};
     restart();
 }
