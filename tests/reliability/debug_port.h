@@ -7,7 +7,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "daemon_test.h"
+#include "end_to_end/daemon_test.h"
 
 namespace kivd {
 
