@@ -159,6 +159,7 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
     std::filesystem::create_directory("elsewhere");
     EXPECT_EQ(run({"-b", "elsewhere", "-c", "keys/", "--verify-config", "../file"}),
               "42 Verified: OK\n");
+    write_file("none.sig", "");
     EXPECT_TRUE(run({"--verify-config=none"}).starts_with("33 Verified: Failure\n"));
     write_file("file", "other data");
     EXPECT_EQ(run({"--verify-config=file"}), "33 Verified: Failure\n");

@@ -123,7 +123,7 @@ TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
         {directory, "DIR"},
         {"\"pid\":" + std::to_string(daemon.pid()) + ",", "PID,"},
         {read_file("private/kivd.state").substr(17, 40), "SUM"},
-        {"(answer_us|size|inodes|saved_at)\":\\d{3,}", "$1\":#"},
+        {"(answer_us\"|inodes\"|saved_at\"|space\":\\{\"size\"):\\d+", "$1:#"},
     };
     const auto status = [&](uid_t uid) {
         daemon_process tool = kivctl({"status", "--json"}, uid);
