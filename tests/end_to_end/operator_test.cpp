@@ -3,7 +3,7 @@
 
 #include <regex>
 
-#include "daemon_test.h"
+#include "debug_port.h"
 #include "support/config_package.h"
 
 namespace kivd {
@@ -158,10 +158,8 @@ TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
     EXPECT_TRUE(status(0).starts_with(R"(3{"directory":"DIR","running":false,)")) << status(0);
 }
 
-// Named like the others that use the one port of the debug interface.
-class debug_operator : public operator_commands {};
-
-TEST_F(debug_operator, every_command_ends_in_time_when_the_daemon_is_stopped) {
+TEST_F(operator_commands, every_command_ends_in_time_when_the_daemon_is_stopped) {
+    const unique_fd port_lock = lock_debug_port();
     daemon_process daemon = launch({{"-C", "-d"}});
     if (!daemon.wait_ready()) GTEST_SKIP() << "port 2305 is in use";
     write_file("config", "c");
