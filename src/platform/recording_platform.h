@@ -17,7 +17,4 @@ lines take_log();
 // System properties; all others are absent.
 inline std::map<std::string, std::string> properties;
 
-// What the permission service answers.
-inline bool permission_answer = false;
-
 }  // namespace kivd

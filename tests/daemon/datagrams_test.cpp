@@ -9,11 +9,6 @@
 namespace kivd {
 namespace {
 
-size_t open_descriptors() {
-    const fs::directory_iterator all("/proc/self/fd");
-    return static_cast<size_t>(std::distance(begin(all), end(all)));
-}
-
 class datagrams : public scratch_directory {
  protected:
     datagrams() {
@@ -42,15 +37,6 @@ TEST_F(datagrams, each_is_handled_in_order_and_up_to_its_limit) {
     EXPECT_EQ(take_log(), lines{"E kivd: Too large packet (dgram) from client " +
                                 std::to_string(handler.fd) + ", dropping."});
     EXPECT_EQ(contents(next_report()), "P1; e1 ; e2 ; e3 ; n=5; ");
-}
-
-// Which the socket asks the kernel for before it has a name.
-TEST_F(datagrams, without_credentials_have_no_permission) {
-    for (const char* packet : {"DC 0", "EV p n"}) send(packet);
-    receive_dgram_client(handler);
-    EXPECT_EQ(take_log(), lines{"W kivd: setDataCollectionEnable (DC) request denied due to "
-                                "permission!"});
-    EXPECT_EQ(contents(next_report()), "P1; n ; ");
 }
 
 TEST_F(datagrams, attached_descriptors_never_become_ours) {

@@ -4,11 +4,6 @@
 #include <sched.h>
 #include <sys/mount.h>
 
-#include <chrono>
-#include <random>
-#include <thread>
-
-#include "client/kiv.h"
 #include "daemon_test.h"
 #include "settings.pb.h"
 #include "support/config_package.h"
@@ -19,13 +14,7 @@ namespace {
 using namespace std::string_literals;
 using enum socket_kind;
 
-class configuration : public daemon_test {
- protected:
-    // With the keys of the test's directory, as far as there are any.
-    [[nodiscard]] daemon_process start_with_keys() const {
-        return start({{"-C", "-c", directory + "/"}});
-    }
-};
+class configuration : public daemon_test {};
 
 // What NC answers.
 std::string install(const std::string& file) {
@@ -61,108 +50,6 @@ kiv::Report open_report(const std::string& path) {
     write_file("opened", open_seal(sealed.encryption_key(), sealed.encryption_iv(),
                                    sealed.encrypted_compressed_data()));
     return parse(gunzip_file("opened"));
-}
-
-TEST_F(configuration, a_signed_one_rules_what_is_kept_and_what_leaves_is_sealed) {
-    make_keys("config");
-    make_keys("report", 2048);
-    const std::string data = gzip(pack(
-        {own_part<kiv::config::FilterConfig>(
-             "FilterConfig", "event_filter { type: EXCLUDE item { package: 'p' name: 'secret' } }"),
-         own_part<kivd::Settings>("Settings", "max_report_size: 1000"),
-         {"app", "part", "for the app"}}));
-    const std::string file = config_file(data, sign(data, "config"));
-
-    daemon_process daemon = start_with_keys();
-    EXPECT_EQ(install(config_file(data)), "0");
-    EXPECT_EQ(daemon.count_in_log("E kivd-conf: Failed to verify configuration"), 1U);
-    EXPECT_EQ(install(file), "1");
-    for (const bool restarted : {false, true}) {
-        SCOPED_TRACE(restarted);
-        const unique_fd client = connect_client(packets);
-        EXPECT_EQ(ask(client.get(), "PA p secret") + ask(client.get(), "PA p open"), "01");
-        EXPECT_EQ(ask(client.get(), "GC app other"), "FAIL");
-        kiv_handle* const kiv = kiv_create_from_path(directory.c_str());
-        const unique_fd part(kiv_get_config(kiv, "app", "part"));
-        kiv_destroy(kiv);
-        EXPECT_EQ(fcntl(part.get(), F_GETFL) & O_ACCMODE, O_RDONLY);
-        char text[32] = {};
-        EXPECT_EQ(read(part.get(), text, sizeof text), 11);
-        EXPECT_STREQ(text, "for the app");
-        if (restarted) break;
-        request({"EV p secret x", "EV p open y", "FL"});
-        EXPECT_EQ(daemon.stop(), 0);
-        daemon = start_with_keys();
-    }
-    kiv::Report report = open_report("output/kiv_1");
-    ASSERT_EQ(report.events_size(), 3);  // two of them say why the first one was refused
-    EXPECT_EQ(report.events(2).payload(), "y");
-    request({"EV p open " + std::string(1000, 'z')});  // of the report size
-    EXPECT_EQ(open_report("output/kiv_2").events_size(), 1);
-    const kiv::Report sealed[] = {parse(read_file("output/kiv_1")),
-                                  parse(read_file("output/kiv_2"))};
-    EXPECT_NE(sealed[0].encryption_key(), sealed[1].encryption_key());
-    EXPECT_NE(sealed[0].encryption_iv(), sealed[1].encryption_iv());
-    EXPECT_FALSE(exists("private/flushed_data.encrypted"));
-}
-
-TEST_F(configuration, a_key_that_cannot_seal_lets_no_report_out) {
-    const daemon_process daemon = start_with_keys();
-    const std::pair<const char*, const char*> keys[] = {
-        {"8192 bits", "genpkey -algorithm RSA -pkeyopt rsa_keygen_bits:4104 -out report.key"},
-        {"EC", "ecparam -genkey -name prime256v1 -noout -out report.key"},
-        {"none", nullptr},
-    };
-    size_t refused = 0;
-    for (const auto& [kind, make] : keys) {
-        SCOPED_TRACE(kind);
-        if (make != nullptr) {
-            openssl(make);
-            openssl("pkey -in report.key -pubout -out kiv_report.pem");
-        } else {
-            write_file("kiv_report.pem", "no key");
-        }
-        request({"EV p event x", "FL"});
-        ++refused;
-        EXPECT_TRUE(wait_until([&] {
-            return daemon.count_in_log("E kivd/crypto: Failed to open report key") == refused &&
-                   daemon.count_in_log("E kivd-compactor: Failed to initialize encryption.") ==
-                       refused;
-        })) << daemon.log();
-        EXPECT_TRUE(report_paths().empty());
-    }
-}
-
-TEST_F(configuration, a_kill_leaves_the_old_one_or_the_new_one) {
-    std::minstd_rand random(1);
-    std::string files[2];
-    for (const int which : {0, 1}) {
-        std::vector<config_part> parts;
-        for (int i = 0; i < 100; ++i) {
-            parts.push_back({"p", std::to_string(i), std::string(200, which == 0 ? 'a' : 'b')});
-        }
-        files[which] = config_file(parts);
-    }
-    daemon_process daemon = start();
-    ASSERT_EQ(install(files[0]), "1");
-    for (int round = 0; round < 20; ++round) {
-        {
-            const unique_fd client = connect_client(packets);
-            EXPECT_TRUE(send_text(client.get(), "WC " + files[round % 2]));
-            EXPECT_TRUE(send_text(client.get(), "NC"));
-            std::this_thread::sleep_for(std::chrono::microseconds(random() % 6000));
-        }
-        daemon.send_signal(SIGKILL);
-        (void)daemon.wait_exit();
-        daemon = start();
-        EXPECT_TRUE(std::filesystem::is_empty("input"));
-        std::string all;
-        for (int id = 1; id <= 100; ++id) {
-            all += read_file("private/conf_" + std::to_string(id) + ".bin");
-        }
-        ASSERT_EQ(all, std::string(20000, all.front())) << round;
-    }
-    EXPECT_EQ(install(files[1]), "1");
 }
 
 TEST_F(configuration, the_kill_switch_stops_the_daemon_for_good) {
@@ -220,6 +107,7 @@ TEST_F(configuration, what_the_system_brings_is_installed_and_run) {
         readers.push_back(std::stoi(read_file("pid")));
         std::filesystem::remove("pid");
     };
+    write_file("/system/build.prop", "#x=1\nro.build.type=\nro.build.type=eng\r\n");
     // The filter file is there, so nothing is installed anew; the actions are those in force.
     write_file("/system/etc/kivd.conf", "");
     for (const bool test_mode : {false, true}) {
@@ -239,6 +127,7 @@ TEST_F(configuration, what_the_system_brings_is_installed_and_run) {
         readers.pop_back();
     }
     daemon = start();
+    EXPECT_NE(read_file("private/kivd.state").find("build_type: eng\n"), std::string::npos);
     wait_reader();
     EXPECT_EQ(install(config_file({run})), "1");
     wait_reader();
@@ -270,6 +159,8 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
     std::filesystem::create_directory("elsewhere");
     EXPECT_EQ(run({"-b", "elsewhere", "-c", "keys/", "--verify-config", "../file"}),
               "42 Verified: OK\n");
+    write_file("none.sig", "");
+    EXPECT_TRUE(run({"--verify-config=none"}).starts_with("33 Verified: Failure\n"));
     write_file("file", "other data");
     EXPECT_EQ(run({"--verify-config=file"}), "33 Verified: Failure\n");
     const std::string unkeyed = run({"-c", "NO_ENCRYPTION", "--verify-config=file"});
@@ -285,6 +176,9 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
         EXPECT_EQ(sealed.size(), size / 16 * 16 + 16);
         EXPECT_EQ(open_seal(read_file("file.key"), read_file("file.iv"), sealed), plain);
     }
+    const daemon_process daemon = start({{"-C", "-c", directory + "/keys/"}});
+    request({"EV p event x", "FL"});
+    EXPECT_EQ(open_report("output/kiv_1").events_size(), 1);
     EXPECT_TRUE(run({"--encrypt", "none"}).starts_with("0 File not found.: No such file"));
     EXPECT_TRUE(run({"-c", directory, "--encrypt", "file"})  // no "/" at its end
                     .find("E kivd/crypto: Failed to open report key") != std::string::npos);

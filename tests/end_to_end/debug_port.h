@@ -14,12 +14,17 @@ namespace kivd {
 inline const sockaddr_in debug_port = {AF_INET, htons(2305), {htonl(INADDR_LOOPBACK)}, {}};
 inline const auto* const debug_address = reinterpret_cast<const sockaddr*>(&debug_port);
 
-// One test at a time has the port, whichever build it is of; and an end of a connection that hung
-// up before the other one keeps it for a minute.
+// One test at a time has the port, whichever build it is of.
+inline unique_fd lock_debug_port() {
+    unique_fd lock(open("/tmp/kivd-port-2305.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0666));
+    EXPECT_EQ(flock(lock.get(), LOCK_EX), 0);
+    return lock;
+}
+
+// An end of a connection that hung up before the other one keeps the port for a minute.
 class debug_port_test : public daemon_test {
  protected:
     void SetUp() override {
-        EXPECT_EQ(flock(port_lock_.get(), LOCK_EX), 0);
         if (!wait_until([] { return listen_there().ok(); }, 70000)) {
             GTEST_SKIP() << "port 2305 is in use";
         }
@@ -42,8 +47,7 @@ class debug_port_test : public daemon_test {
     }
 
  private:
-    const unique_fd port_lock_{
-        open("/tmp/kivd-port-2305.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0666)};
+    const unique_fd port_lock_ = lock_debug_port();
 };
 
 }  // namespace kivd

@@ -1,18 +1,13 @@
 // kivctl for those who look after a daemon: status, check, and how long each command may take.
-#include <google/protobuf/struct.pb.h>
-#include <google/protobuf/util/json_util.h>
 #include <sys/stat.h>
 
-#include <chrono>
-#include <set>
+#include <regex>
 
-#include "daemon_test.h"
+#include "debug_port.h"
 #include "support/config_package.h"
 
 namespace kivd {
 namespace {
-
-using google::protobuf::Struct;
 
 class operator_commands : public daemon_test {
  protected:
@@ -44,26 +39,18 @@ class operator_commands : public daemon_test {
         return {KIVCTL_PATH, {arguments, 0, uid}};
     }
 
-    // What it printed as JSON, and its exit status as "status".
-    [[nodiscard]] Struct ask(const std::vector<std::string>& arguments, uid_t uid = 0) const {
-        daemon_process tool = kivctl(arguments, uid);
+    // The ids of what is found, and how `check` ends.
+    [[nodiscard]] std::pair<std::string, int> check() const {
+        daemon_process tool = kivctl({"check", "--json"});
         const int status = tool.wait_exit();
-        Struct answer;
-        EXPECT_TRUE(google::protobuf::util::JsonStringToMessage(tool.output(), &answer).ok())
-            << tool.output() << tool.log();
-        (*answer.mutable_fields())["status"].set_number_value(status);
-        return answer;
-    }
-
-    // The ids of what is found.
-    [[nodiscard]] std::set<std::string> check(double& status) const {
-        const Struct answer = ask({"check", "--json"});
-        status = answer.fields().at("status").number_value();
-        std::set<std::string> ids;
-        for (const auto& each : answer.fields().at("findings").list_value().values()) {
-            ids.insert(each.struct_value().fields().at("id").string_value());
+        std::string ids;
+        const std::string output = tool.output();
+        const std::regex id(R"re("id":"(\w+)")re");
+        for (std::sregex_iterator each(output.begin(), output.end(), id), end; each != end;
+             ++each) {
+            ids += (ids.empty() ? "" : " ") + (*each)[1].str();
         }
-        return ids;
+        return {ids, status};
     }
 };
 
@@ -85,10 +72,8 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
     } cases[] = {
         {"true", ""},
         {"rm " + key, "report_key_off"},
-        {"chmod 0 " + key, "report_key_off"},
         {"chmod 0 keys", "report_key_off config_key_off"},
         {"echo >" + key, "report_key_unusable"},
-        {"cp report.key " + key, "report_key_unusable"},
         {"openssl ecparam -genkey -name prime256v1 -noout | openssl ec -pubout >" + key,
          "report_key_unusable"},
         {"openssl ecparam -genkey -name prime256v1 -noout | openssl ec -pubout >" + config_key, ""},
@@ -97,13 +82,10 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
         {"rm " + config_key, "config_key_off"},
         {"touch output/kiv_disabled", "disabled"},
         {"touch output/kiv_7", ""},
-        {"touch output/kiv_7x", "bad_file"},
+        {"touch 'output/\"\n\\'", "bad_file"},
         {"mkdir output/kiv_7", "bad_file"},
         {"touch private/counters.txt_", "stale_temporary"},
-        {"touch private/kivd.state_tmp", "stale_temporary"},
         {"touch private/new_config.gz", "stale_temporary"},
-        {"touch private/flushed_data.encrypted", "stale_temporary"},
-        {"touch private/qz_compressed", "stale_temporary"},
         {"touch private/flushed_data", "unsent_report"},
         {"rm private/filters.txt", "filter"},
         {"printf '__type\\0exclude\\0\\0\\n' >private/filters.txt", "filter"},
@@ -128,89 +110,56 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
     for (const auto& c : cases) {
         SCOPED_TRACE(c.damage);
         EXPECT_EQ(system(("( " + c.damage + " ) 2>/dev/null").c_str()), 0);
-        double status = -1;
-        std::string found;
-        for (const std::string& id : check(status))
-            found.insert(0, (found.empty() ? id : id + " "));
-        EXPECT_EQ(found, c.found);
-        EXPECT_EQ(status, c.found.empty() ? 0 : 1);
+        EXPECT_EQ(check(), std::pair(c.found, c.found.empty() ? 0 : 1));
         EXPECT_EQ(system("rm -r keys private output; tar xpf all.tar; chmod 622 kiv_co_stream"), 0);
     }
-}
-
-TEST_F(operator_commands, names_of_any_bytes_and_a_path_without_its_slash_are_told) {
-    daemon_process daemon = start_with_keys("/keys");
-    write_file("output/a\"\n\xff\\", "");
-    const Struct answer = ask({"check", "--json", "--keys", directory + "/keys"});
-    std::set<std::string> what;
-    for (const auto& each : answer.fields().at("findings").list_value().values()) {
-        what.insert(each.struct_value().fields().at("what").string_value());
-    }
-    const std::string wrong = directory + "/keyskiv_";
-    EXPECT_EQ(what, (std::set<std::string>{
-                        "output/a\"\n\\xFF\\\\ is no report",
-                        "the directory of -c has no final \"/\": the daemon looks for " + wrong +
-                            "report.pem and " + wrong + "config.pem",
-                        "the daemon looks for its keys by -c " + directory + "/keys, not in " +
-                            directory + "/keys/"}));
-    daemon_process text = kivctl({"check"});
-    EXPECT_EQ(text.wait_exit(), 1);
-    EXPECT_EQ(text.output().find('\n' + wrong), std::string::npos);
-    EXPECT_NE(text.output().find("report_key_off: " + wrong + "report.pem is missing; "),
-              std::string::npos);
-    EXPECT_NE(text.output().find("bad_file: output/a\"\\x0A\\xFF\\\\ is no"), std::string::npos);
 }
 
 TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
     daemon_process daemon = start_with_keys();
     write_file("output/kiv_7", "12345");
     write_file("private/events", "123");
-    const std::string checksum = read_file("private/kivd.state").substr(17, 40);
-    const std::string common =
-        R"("directory":")" + directory + R"(","running":true,"pid":)" +
-        std::to_string(daemon.pid()) + R"(,"stopped":false,"lock_held":true,"answers":true,)" +
-        R"("reports":{"count":1,"lowest":7,"highest":7},"keys_from":"command_line",)" +
-        R"("sealing":{"on":true,"key":"usable","path":")" + directory +
-        R"(/keys/kiv_report.pem"},"verification":{"on":true,"key":"usable","path":")" + directory +
-        R"(/keys/kiv_config.pem"},"config_checksum":")" + checksum + R"(","status":0,)";
-    const struct {
-        uid_t uid;
-        std::string rest;
-    } cases[] = {
-        {daemon_user,
-         R"("collection":true,"diagnostics":false,"partial_file":{"size":3,"limit":409600},)"
-         R"("output":{"size":5,"limit":4833280},"needed":1331200,"used":0,"suppressed":false)"},
-        {1, R"("collection":null,"diagnostics":null,"partial_file":{"size":null,"limit":null},)"
-            R"("output":{"size":5,"limit":null},"needed":null,"used":null,"suppressed":null)"},
+    const std::pair<std::string, std::string> changing[] = {
+        {directory, "DIR"},
+        {"\"pid\":" + std::to_string(daemon.pid()) + ",", "PID,"},
+        {read_file("private/kivd.state").substr(17, 40), "SUM"},
+        {"(answer_us\"|inodes\"|saved_at\"|space\":\\{\"size\"):\\d+", "$1:#"},
     };
-    for (const auto& [uid, rest] : cases) {
-        if (uid == 1 && geteuid() != 0) continue;
-        SCOPED_TRACE(uid);
-        Struct got = ask({"status", "--json"}, uid);
-        auto& fields = *got.mutable_fields();
-        EXPECT_GT(fields["answer_us"].number_value(), 0);
-        // of these two, what doesn't change by itself
-        for (const char* name : {"needed", "used", "suppressed"}) {
-            auto& from =
-                *fields[*name == 'n' ? "free_space" : "error_guard"].mutable_struct_value();
-            fields[name] = from.fields().at(name);
+    const auto status = [&](uid_t uid) {
+        daemon_process tool = kivctl({"status", "--json"}, uid);
+        std::string text = std::to_string(tool.wait_exit());
+        text += tool.output();
+        for (const auto& [what, by] : changing) {
+            text = std::regex_replace(text, std::regex(what), by);
         }
-        for (const char* name : {"free_space", "error_guard", "answer_us"}) fields.erase(name);
-        Struct expected;
-        EXPECT_TRUE(
-            google::protobuf::util::JsonStringToMessage('{' + common + rest + '}', &expected).ok());
-        EXPECT_EQ(got.DebugString(), expected.DebugString());
+        return text;
+    };
+    EXPECT_EQ(status(daemon_user),
+              R"(0{"directory":"DIR","running":true,PID,"stopped":false,"lock_held":true,)"
+              R"("answers":true,"answer_us":#,"collection":true,"diagnostics":false,)"
+              R"("partial_file":{"size":3,"limit":409600},)"
+              R"("reports":{"count":1,"lowest":7,"highest":7},"output":{"size":5,"limit":4833280},)"
+              R"("free_space":{"size":#,"needed":1331200,"inodes":#},"keys_from":"command_line",)"
+              R"("sealing":{"on":true,"key":"usable","path":"DIR/keys/kiv_report.pem"},)"
+              R"("verification":{"on":true,"key":"usable","path":"DIR/keys/kiv_config.pem"},)"
+              R"("config_checksum":"SUM","error_guard":{"used":0,"limit":100,)"
+              R"("suppressed":false,"suppressed_until":null,"saved_at":#}})"
+              "\n");
+    if (daemon_user != 0) {
+        const std::string seen = status(1);  // who sees no more than that it runs
+        for (const char* part : {R"("running":true,PID,"stopped":false,"lock_held":true)",
+                                 R"("collection":null,"diagnostics":null)",
+                                 R"("partial_file":{"size":null,"limit":null})",
+                                 R"("output":{"size":5,"limit":null})", R"("used":null)"}) {
+            EXPECT_NE(seen.find(part), std::string::npos) << part << seen;
+        }
     }
     EXPECT_EQ(daemon.stop(), 0);
-    const Struct after = ask({"status", "--json"});
-    EXPECT_FALSE(after.fields().at("running").bool_value());
-    EXPECT_EQ(after.fields().at("status").number_value(), 3);
+    EXPECT_TRUE(status(0).starts_with(R"(3{"directory":"DIR","running":false,)")) << status(0);
 }
 
-// Named like the others that use the one port of the debug interface.
-class debug_operator : public operator_commands {};
-
-TEST_F(debug_operator, every_command_ends_in_time_when_the_daemon_is_stopped) {
+TEST_F(operator_commands, every_command_ends_in_time_when_the_daemon_is_stopped) {
+    const unique_fd port_lock = lock_debug_port();
     daemon_process daemon = launch({{"-C", "-d"}});
     if (!daemon.wait_ready()) GTEST_SKIP() << "port 2305 is in use";
     write_file("config", "c");
@@ -218,34 +167,23 @@ TEST_F(debug_operator, every_command_ends_in_time_when_the_daemon_is_stopped) {
     const std::vector<std::vector<std::string>> commands = {
         {"alive"},
         {"flush"},
-        {"save"},
-        {"device-id"},
         {"wanted", "p", "n"},
         {"config", "install", "config"},
-        {"config", "announce"},
         {"config", "get", "p", "n"},
-        {"collection", "on"},
         {"remove-report", "all"},
         {"group", "add", "x"},
-        {"group", "delete", "x"},
-        {"group", "replace", "x", "y"},
         {"files", "list"},
         {"files", "get", "1"},
         {"status"},
-        {"status", "--json"},
-        {"check"},
         {"check", "--json"},
         {"watch"},
         {"watch", "--host", "localhost"},
     };
-    const auto start_time = std::chrono::steady_clock::now();
     std::vector<daemon_process> tools;
     for (const auto& command : commands) tools.push_back(kivctl(command));
     for (size_t i = 0; i < tools.size(); ++i) {
         EXPECT_EQ(tools[i].wait_exit(), 3) << commands[i].front() << tools[i].log();
     }
-    // twice the time is what one would take that gives it to each of its questions
-    EXPECT_LT(std::chrono::steady_clock::now() - start_time, std::chrono::milliseconds(3900));
     // data is done when it is in the daemon's queue, and then there is no more room
     int status = 0;
     for (int i = 0; i < 2000 && status == 0; ++i) {

@@ -7,7 +7,6 @@
 #include <sys/wait.h>
 
 #include "daemon_test.h"
-#include "format/request_table.h"
 
 namespace kivd {
 namespace {
@@ -58,37 +57,6 @@ class permission : public daemon_test {
         if (getuid() != 0) GTEST_SKIP() << "only root can be somebody else";
     }
 };
-
-TEST_F(permission, strangers_are_refused_every_privileged_request_on_every_socket) {
-    daemon_process daemon = start();
-    request({"EV p reported x", "FL", "EV p kept x", "CI p counter 1"});
-    EXPECT_EQ(wait_report(1).events_size(), 1);
-    const std::string state = read_file("private/kivd.state");
-    std::vector<std::string> requests;
-    std::vector<std::string> refusals;
-    for (const request_row& row : request_table) {
-        if (row.access == request_access::everyone) continue;
-        requests.push_back(std::string(row.name) + " 1 1");  // all that any of them needs
-        refusals.push_back(std::string("W kivd: ") + row.refusal);
-    }
-    EXPECT_EQ(refusals.front(), "W kivd: flush (FL) request denied due to permission!");
-
-    size_t sockets = 0;
-    for (const socket_kind kind : {datagram, packets, stream}) {
-        EXPECT_EQ(ask_as(stranger, kind, requests), kind == datagram ? "" : "0-1FAIL1");
-        ++sockets;
-        for (const std::string& each : refusals) {
-            ASSERT_TRUE(wait_until([&] { return daemon.count_in_log(each) == sockets; })) << each;
-        }
-    }
-    EXPECT_EQ(report_paths().size(), 1U);
-    EXPECT_FALSE(exists("private/counters.txt"));
-    EXPECT_TRUE(read_file("private/events").ends_with("x"));
-    EXPECT_EQ(read_file("private/kivd.state"), state);
-    EXPECT_EQ(ask_as(stranger, packets, {"EV p from a stranger"}), "1");
-    EXPECT_TRUE(read_file("private/events").ends_with("a stranger"));
-    EXPECT_EQ(daemon.stop(), 0);
-}
 
 // Datagrams and connections know their senders in different ways.
 TEST_F(permission, own_user_and_root_are_obeyed_on_every_socket) {

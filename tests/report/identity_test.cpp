@@ -53,32 +53,6 @@ TEST_F(identity, properties_have_substitutes_and_give_way_to_header_info) {
     EXPECT_EQ(groups(), "P3 G A " + std::string(32, 'b') + "; ");
 }
 
-TEST_F(identity, a_change_sends_out_what_was_collected_under_a_known_identity) {
-    (void)events_add("p", "first", {});
-    fs::remove(paths::state);
-    update_header_info();  // no change
-    properties.clear();
-    update_header_info();  // nothing new is known
-    EXPECT_FALSE(exists(paths::state));
-
-    properties["ro.qeli.version.sw"] = "P2";
-    update_header_info();
-    wait_for_compactor();
-    EXPECT_EQ(contents(gunzip_file("output/kiv_1")), "P1; first ; ");
-    EXPECT_NE(read_file(paths::state).find("product: P2\n"), std::string::npos);
-    (void)events_add("p", "second", {});
-    set_config_checksum({1});
-    update_header_info();
-    wait_for_compactor();
-    EXPECT_EQ(contents(gunzip_file("output/kiv_2")), "P2; second ; ");
-
-    fs::remove(paths::state);
-    (void)events_add("p", "third", {});
-    restart();  // the product was not known before
-    EXPECT_TRUE(events_pending());
-    EXPECT_NE(read_file(paths::state).find("product: P2\n"), std::string::npos);
-}
-
 TEST_F(identity, group_ids_are_kept_in_order_and_across_a_restart) {
     for (const char* id : {"A", "B", "C", "B", "D", "E", "F", "G"}) set_group_id(id);
     EXPECT_EQ(groups(), "P1 B C D E F G; ");

@@ -37,24 +37,16 @@ TEST_F(state_file, odd_lines_cost_no_more_than_their_value) {
         std::string loaded;
         std::string saved;
     } cases[] = {
-        {"config-checksum: " + digits, "config-checksum: " + digits},
         {"config-checksum: " + digits.substr(1), "config-checksum: " + std::string(40, '0')},
-        {"config-checksum: " + digits + "8", "config-checksum: " + std::string(40, '0')},
         {"config-checksum: ABCDEF" + std::string(34, 'a'),
          "config-checksum: 000000" + std::string(34, 'a')},
         {"product: " + std::string(240, 'p'), "product: " + std::string(63, 'p')},
-        {"serial_num: " + std::string(63, 's'), "serial_num: " + std::string(11, 's')},
-        {"device_id: " + std::string(41, 'd'), "device_id: " + std::string(40, 'd')},
         {"product: a\nproduct:", "product: a"},
         {"last-flush: 9223372036854775808", "last-flush: 9223372036854775807"},
         {"report-max-size: 4294967295", "report-max-size: 2147483647"},
-        {"report-max-size: -1", "report-max-size: -1"},
         {"data-collection: 12", "data-collection: 1"},
-        {"data-collection: 01", "data-collection: 0"},
         {"error_nr: 99999999999", "error_nr: 2147483647"},
-        {"error_time: -99999999999", "error_time: -2147483648"},
         {"group_id: A\ngroup_id: A\ngroup_id:\ngroup_id: B", "group_id: A\ngroup_id: B"},
-        {"group_id: " + std::string(40, 'g'), "group_id: " + std::string(33, 'g')},
         {"unknown: x\n: \n\n" + "\0product: z"s, "product: unknown"},
         {std::string(1 << 20, 'x'), "build_type: unknown"},
     };
@@ -64,17 +56,6 @@ TEST_F(state_file, odd_lines_cost_no_more_than_their_value) {
         EXPECT_NE(all.find("\nsw_version: 2\nvariant: 1\n"), std::string::npos);
         EXPECT_NE(("\n" + all).find("\n" + saved + "\n"), std::string::npos);
     }
-}
-
-TEST_F(state_file, a_failed_save_keeps_the_old_file) {
-    const std::string old = reloaded("product: old\n");
-    get_header_record().product_id.set("new");
-    fs::create_directory(paths::state_new);
-    state_save();
-    EXPECT_EQ(read_file(paths::state), old);
-    fs::remove(paths::state_new);
-    state_save();
-    EXPECT_NE(read_file(paths::state).find("product: new\n"), std::string::npos);
 }
 
 }  // namespace

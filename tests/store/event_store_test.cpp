@@ -39,18 +39,6 @@ TEST_F(event_store, a_file_has_one_header_and_is_full_at_its_limit) {
     EXPECT_EQ(read_file(paths::events).substr(0, 212), header + event + event);
 }
 
-TEST_F(event_store, no_file_begins_without_its_whole_header) {
-    fs::create_symlink("/dev/full", paths::events);
-    (void)add();
-    EXPECT_FALSE(events_pending());
-    limit_file_size(100);
-    (void)add();
-    EXPECT_FALSE(events_pending());
-    limit_file_size(RLIM_INFINITY);
-    (void)add();
-    EXPECT_EQ(read_file(paths::events), header + event);
-}
-
 TEST_F(event_store, a_torn_event_is_cut_off_at_the_next_start) {
     (void)add();
     for (rlim_t written = 0; written < event.size(); ++written) {

@@ -4,9 +4,8 @@
 #include <gtest/gtest.h>
 #include <zlib.h>
 
-#include <cstdio>
-
 #include "settings.pb.h"
+#include "support/outside_tools.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {
@@ -56,11 +55,9 @@ std::string config_file(const std::string& compressed_data, const std::string& s
 }
 
 std::string openssl(const std::string& arguments) {
-    FILE* const pipe = popen(("openssl " + arguments + " 2>openssl.err").c_str(), "r");
-    std::string output;
-    for (int c = 0; pipe != nullptr && (c = fgetc(pipe)) != EOF;) output += static_cast<char>(c);
-    EXPECT_EQ(pipe != nullptr ? pclose(pipe) : -1, 0) << arguments << read_file("openssl.err");
-    return output;
+    const outcome ended = run("openssl " + arguments + " 2>openssl.err");
+    EXPECT_EQ(ended.status, 0) << arguments << read_file("openssl.err");
+    return ended.output;
 }
 
 void make_keys(const std::string& name, int bits) {

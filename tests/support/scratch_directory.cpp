@@ -1,5 +1,4 @@
 #include "support/scratch_directory.h"
-#include "record/header_record.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -17,10 +16,6 @@
 #include "util/clock.h"
 
 namespace kivd {
-directory_in_memory::directory_in_memory() {
-    if (access("/dev/shm", W_OK) == 0) setenv("TEST_TMPDIR", "/dev/shm/", 0);
-}
-
 scratch_directory::scratch_directory() {
     directory = testing::TempDir() + "kivd-XXXXXX";
     EXPECT_NE(mkdtemp(directory.data()), nullptr);
@@ -28,9 +23,8 @@ scratch_directory::scratch_directory() {
     for (const char* name : {"private", "output", "input"}) fs::create_directory(name);
 
     const sockaddr_un address = {AF_UNIX, "kiv_cl"};
-    receiver_.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    EXPECT_EQ(bind(receiver_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address),
-              0);
+    receiver.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    EXPECT_EQ(bind(receiver.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
     properties = {{"ro.qeli.version.sw", "P1"}};
     restart();
 }
@@ -56,7 +50,7 @@ std::string scratch_directory::next_report() {
 
 std::string scratch_directory::next_packet() {
     std::string packet(32768, '\0');
-    const ssize_t size = recv(receiver_.get(), packet.data(), packet.size(), MSG_DONTWAIT);
+    const ssize_t size = recv(receiver.get(), packet.data(), packet.size(), MSG_DONTWAIT);
     packet.resize(size > 0 ? static_cast<size_t>(size) : 0);
     return packet;
 }
@@ -79,6 +73,16 @@ std::string read_file(const std::string& path) {
 }
 
 bool exists(const std::string& path) { return fs::exists(fs::symlink_status(path)); }
+
+size_t open_descriptors(const std::string& path) {
+    size_t count = 0;
+    for (const auto& entry : fs::directory_iterator("/proc/self/fd")) {
+        std::error_code gone;
+        const fs::path target = fs::read_symlink(entry.path(), gone);
+        if (!gone && (path.empty() || target == path)) ++count;
+    }
+    return count;
+}
 
 std::string doc_example(const std::string& file, const std::string& kind, const std::string& name) {
     const std::string text = read_file(SOURCE_DIRECTORY "/docs/" + file);

@@ -17,12 +17,6 @@ namespace kivd {
 namespace fs = std::filesystem;
 using namespace std::string_literals;
 
-// A base before the one that makes a directory: that one is then in memory, if it can be. Replacing
-// thousands of files on a disk takes minutes.
-struct directory_in_memory {
-    directory_in_memory();
-};
-
 // The daemon's modules as after a start, in a fresh directory with private/, output/ and input/
 // that is gone afterwards. The product is "P1".
 class scratch_directory : public testing::Test {
@@ -37,9 +31,9 @@ class scratch_directory : public testing::Test {
     std::string next_packet();
 
     std::string directory;
+    unique_fd receiver;  // where they come in
 
  private:
-    unique_fd receiver_;
     int reports_ = 0;
 };
 
@@ -49,6 +43,9 @@ void limit_file_size(rlim_t size);
 void write_file(const std::string& path, std::string_view bytes);
 std::string read_file(const std::string& path);
 bool exists(const std::string& path);
+
+// How many descriptors of this process stand for the file; of all files when there is no path.
+size_t open_descriptors(const std::string& path = "");
 
 // The bytes of the example "hex NAME" in a file of docs/, or the text of "text NAME".
 std::string doc_example(const std::string& file, const std::string& kind, const std::string& name);

@@ -45,12 +45,9 @@ TEST(config_lint, of_filters_finds_what_does_not_outlive_a_start) {
     } cases[] = {
         {numbered_filter(include, 19'999, "p", "n"), ""},
         {numbered_filter(include, 20'000, "p", "n"), "item 1 (numbered 1): from its next start"},
-        {numbered_filter(exclude, 19'998, "p", "n"), ""},
         {numbered_filter(exclude, 20'000, "p", "n"), "item 20000 (p n): from its next start on"},
-        {numbered_filter(include, 1, std::string(1019, 'p'), "n"), ""},
         {numbered_filter(include, 1, std::string(1020, 'p'), "n"), "Corrupt data when reading"},
         {numbered_filter(include, 2, "__type", "exclude"), "(numbered 1): from its next start on"},
-        {numbered_filter(exclude, 2, "numbered", "*"), "new probe filter not activated!"},
         {numbered_filter(exclude, 1, "*", "*"), "new probe filter not activated!"},
         {numbered_filter(include, 1, "*", "*"), ""},
     };
@@ -71,20 +68,16 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
         std::string found;                                       // empty: nothing
     } cases[] = {
         {{}, ""},
-        {{{"p:n", ""}}, ""},
         {{{"p:" + n1006, ""}}, ""},  // 1007 bytes in all
         {{{"p:" + n1006 + "n", ""}}, "...: package and name make a record of up to 1025"},
         {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "the daemon's list of parts does not bring it"},
-        {{{"p:", ""}}, "f: error: p:: its name is empty"},
         {{{":n", ""}}, "f: error: :n: its package is empty"},
         {{{"p:n m", ""}}, "f: warning: p:n m: its name holds a blank"},
         {{{"p:n" + nul, ""}}, "f: error: p:n\\x00: its name holds a NUL"},
         {{{"p:n" + nul, ""}, {"p:n", ""}}, "f: error: p:n: is given twice"},
         {{{"kivd:_last_id", ""}}, "all: error: the daemon logs \"kivd-conf: Skipped part with"},
-        {{{"shop:_last_id", ""}}, ""},
         {{{"kivd:Setings", ""}}, "error: kivd:Setings: the daemon does not know it, is Settings"},
         {{{"kivd:runactionsonce", ""}}, "is RunActionsOnce meant?"},
-        {{{"kivd:Menu", ""}}, "warning: kivd:Menu: the daemon does not know it"},
         {{{settings, "\x08\x80\x80\xc0\x02"}}, ""},  // 5242880, the other's default
         {{{settings, "\x08\x81\x80\xc0\x02"}},
          "f: error: kivd:Settings: the daemon logs \"kivd-settings: Bad settings found"},
@@ -92,10 +85,8 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
          "report_max_size (409600) > output_dir_max_size (409599). Default"},
         {{{settings, "\x08"}},
          "error: kivd:Settings: cannot be decoded as kivd.Settings; the daemon"},
-        {{{"kivd:RunActions", "\x08"}}, "kivd:RunActions: cannot be decoded as"},
         {{{settings, "\x18\x01"}, {"kivd:RunActionsOnce", "\x08\x01"}},
          "error: kivd:Settings: permanently_disable together with remove_reports"},
-        {{{settings, "\x18\x01"}, {"kivd:RunActionsOnce", "\x08" + nul}}, ""},
         {{{filter_part, ""}}, "all: warning: there is no filter of events that outlives a start"},
         {{{filter_part, "\x0a"}},
          "error: kivd:FilterConfig: cannot be decoded as kiv.config.FilterConfig"},
