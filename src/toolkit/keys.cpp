@@ -13,6 +13,7 @@
 #include "format/config_file.h"
 #include "toolkit/text_escape.h"
 #include "util/bytes.h"
+#include "util/unique_fd.h"
 
 namespace kivd {
 namespace {
