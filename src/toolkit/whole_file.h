@@ -3,10 +3,16 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdio>
+#include <optional>
 #include <string>
 #include <string_view>
 
 namespace kivd {
+
+// What is left of a stream, up to one byte more than `max_size`; nothing, with errno set, when it
+// cannot be read.
+[[nodiscard]] std::optional<std::string> read_up_to(FILE* file, size_t max_size);
 
 [[nodiscard]] std::string read_whole_file(const std::string& path, size_t max_size);
 

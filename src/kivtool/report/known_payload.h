@@ -1,11 +1,16 @@
-// Payloads of events whose messages are known here.
+// Messages in one line, and those that are known to be payloads of events.
 #pragma once
+
+#include <google/protobuf/message.h>
 
 #include <string>
 
 #include "report.pb.h"
 
 namespace kivd {
+
+// The fields as protobuf text, each with a blank behind it.
+[[nodiscard]] std::string one_line(const google::protobuf::Message& message);
 
 // Whether events of that package and name hold a known message.
 [[nodiscard]] bool is_of_known_kind(const kiv::Event& event);
