@@ -8,11 +8,11 @@ namespace {
 
 struct utf8_lead {
     uint8_t first, last;                // of the lead byte
-    uint8_t second_first, second_last;  // of the byte behind it; all others are 80 to BF
+    uint8_t second_first, second_last;  // of the next byte; any further ones are 80 to BF
     size_t length;
 };
 
-// The second byte's range leaves out overlong forms, surrogates and what lies beyond U+10FFFF.
+// The second byte's range excludes overlong forms, surrogates and everything above U+10FFFF.
 // clang-format off
 constexpr utf8_lead leads[] = {
     {0x00, 0x7f, 0x00, 0xff, 1},
@@ -54,7 +54,7 @@ void append_hex(std::string& to, std::string_view bytes) {
     }
 }
 
-// How much of the start of `text` is characters that nothing is ever done to.
+// The number of leading characters that never need escaping.
 size_t plain_length(std::string_view text) {
     size_t length = 0;
     while (length < text.size() && byte_at(text, length) >= 0x20 && byte_at(text, length) < 0x7f &&

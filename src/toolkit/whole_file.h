@@ -16,8 +16,8 @@ namespace kivd {
 
 [[nodiscard]] std::string read_whole_file(const std::string& path, size_t max_size);
 
-// Puts a new file in the place of the one at `path`, if there is one: by a rename, so that what
-// was there stays when the new one cannot be written. Refuses devices and the like.
+// Writes a new file and renames it to `path`, so an old one stays when the new one cannot be
+// written. Refuses to replace devices and the like.
 void replace_file(const std::string& path, std::string_view bytes);
 
 }  // namespace kivd

@@ -33,8 +33,8 @@ fs::path place_for_trials() {
     return has_memory ? fs::path("/dev/shm") : fs::temp_directory_path();
 }
 
-// The daemon's modules as after its first start, in a directory that is the current one for as long
-// as they live.
+// The daemon's modules as after a first start, in a new directory, which is the current one as long
+// as this lives.
 class trial_daemon {
  public:
     trial_daemon() : previous_(fs::current_path()) {
@@ -63,19 +63,19 @@ class trial_daemon {
     fs::path own_;
 };
 
-// Takes a step of the daemon; whatever it complains of is an error.
+// Runs a step of the daemon; each of its complaints becomes an error.
 void judge(const lint_place& place, lint_findings& findings, auto step) {
     (void)take_log();
     step();
     for (const std::string& line : take_log()) {
         const bool is_complaint = !line.starts_with("I ");
         if (!is_complaint || line.starts_with("E kivd-error: "))
-            continue;  // not told for lack of it
+            continue;  // there is no daemon to send errors to
         findings.error(place, "the daemon logs \"" + printable(line.substr(2)) + '"');
     }
 }
 
-// The one that counts, of parts with the same name; null when there is none.
+// The last part of that name, which is the one that counts; null when there is none.
 const part_content* find_own(std::span<const part_content> parts, std::string_view name) {
     const auto found = std::find_if(parts.rbegin(), parts.rend(), [name](const auto& part) {
         return part.package == daemon_package && part.name == name;
@@ -83,7 +83,7 @@ const part_content* find_own(std::span<const part_content> parts, std::string_vi
     return found == parts.rend() ? nullptr : &*found;
 }
 
-// The first part that no program could get, which stands for others; null when there is none.
+// The first part that is not available to programs; null when all are.
 const part_content* find_lost(std::span<const part_content> parts) {
     const auto lost = std::ranges::find_if(parts, [](const part_content& part) {
         return !get_config_fd(part.package.c_str(), part.name.c_str()).ok();
@@ -91,7 +91,7 @@ const part_content* find_lost(std::span<const part_content> parts) {
     return lost == parts.end() ? nullptr : &*lost;
 }
 
-// Which items of the filter stand for probes that are kept.
+// For each item of the filter, whether the probe of that name is kept.
 std::vector<bool> find_matches(const written_filter& filter) {
     std::vector<bool> matches;
     for (const auto& item : filter.filter.item()) {
@@ -107,7 +107,7 @@ void warn_of_nothing(const written_filter& filter, lint_findings& findings) {
     findings.warning(filter.place, std::string("the daemon keeps no ") + filter.things);
 }
 
-// The first difference, which stands for others; -1 for none.
+// -1 when there is none.
 int first_difference(const std::vector<bool>& before, const std::vector<bool>& after) {
     const auto [at, ignored] = std::ranges::mismatch(before, after);
     return at == before.end() ? -1 : static_cast<int>(at - before.begin());
@@ -164,7 +164,7 @@ void try_config(std::string_view bytes, std::span<const part_content> parts,
                        "which also removes the mark of a disabled daemon; the daemon stops until "
                        "its next start only");
     }
-    fs::remove(paths::disable_marker);  // else it would not start again
+    fs::remove(paths::disable_marker);  // a disabled daemon would not start again
     const part_content* const filter_part = find_own(parts, "FilterConfig");
     const auto filters = filter_part ? filters_of(*filter_part) : std::vector<written_filter>();
     for (const written_filter& each : filters) warn_of_nothing(each, findings);

@@ -35,12 +35,12 @@ constexpr daemon_part all_daemon_parts[] = {
     {"RunActionsOnce", type_of<RunActionsOnce>},
 };
 
-// Both count from 0, as protobuf does.
+// `line` and `column` count from 0, as in protobuf.
 std::string located(int line, int column, const std::string& reason) {
     return std::to_string(line + 1) + ":" + std::to_string(column + 1) + ": " + printable(reason);
 }
 
-// Keeps the first error: those behind it are often its consequences.
+// Keeps the first error: later ones often follow from it.
 class first_error : public protobuf::io::ErrorCollector {
  public:
     void AddError(int line, protobuf::io::ColumnNumber column,
@@ -51,8 +51,8 @@ class first_error : public protobuf::io::ErrorCollector {
     std::string text;
 };
 
-// Where the first required field is missing; empty when `message` is complete. What stands in a
-// list in brackets is only known to be where the list is.
+// Says where the first required field is missing; empty when `message` is complete. An element of a
+// list in brackets is located at the list.
 std::string find_absent_field(const Message& message, const TextFormat::ParseInfoTree* places) {
     std::vector<std::string> absent;
     message.FindInitializationErrors(&absent);
@@ -92,7 +92,7 @@ std::string encode_part(const Message& type, const std::string& text, std::strin
     TextFormat::Parser parser;
     parser.RecordErrorsTo(&error);
     parser.WriteLocationsTo(&places);
-    parser.AllowPartialMessage(true);  // the parser itself cannot say where a field is missing
+    parser.AllowPartialMessage(true);  // the parser could not say where a field is missing
     if (!parser.ParseFromString(text, message.get())) return error.text;
     payload = message->SerializePartialAsString();
     return find_absent_field(*message, &places);

@@ -1,4 +1,4 @@
-// Messages in one line, and those that are known to be payloads of events.
+// Messages on one line, and the payloads of events whose message is known.
 #pragma once
 
 #include <google/protobuf/message.h>
@@ -9,15 +9,14 @@
 
 namespace kivd {
 
-// The fields as protobuf text, each with a blank behind it.
+// The fields as protobuf text, each followed by a blank.
 [[nodiscard]] std::string one_line(const google::protobuf::Message& message);
 
-// Whether events of that package and name hold a known message.
+// Whether the message of such events is known, judging by package and name.
 [[nodiscard]] bool is_of_known_kind(const kiv::Event& event);
 
-// The payload as protobuf text in one line, "kernel.ProcessKill { pid: 7 }", with nothing in it
-// that a terminal would act on. Empty when the event is not of a known kind or its payload cannot
-// be decoded as that.
+// The payload as protobuf text on one line, "kernel.ProcessKill { pid: 7 }", safe for a terminal.
+// Empty when the message is not known or the payload cannot be decoded as one.
 [[nodiscard]] std::string known_payload_text(const kiv::Event& event);
 
 }  // namespace kivd

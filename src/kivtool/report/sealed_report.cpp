@@ -18,7 +18,7 @@ namespace {
 constexpr size_t iv_size = 16;
 constexpr size_t block_size = 16;
 
-// Which of the two it is cannot be told: a wrong key only makes other bytes.
+// The two cannot be told apart: a wrong key only gives other bytes.
 constexpr char not_opened[] = "the report is sealed for another key, or damaged";
 
 uint8_t* start_of(std::string& text) { return reinterpret_cast<uint8_t*>(text.data()); }
