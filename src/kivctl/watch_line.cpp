@@ -46,17 +46,6 @@ parts take_apart(const std::string& packet) {
     return found;
 }
 
-bool is_text(string_view bytes) {
-    while (!bytes.empty()) {
-        const size_t length = utf8_length(bytes);
-        const auto first = static_cast<uint8_t>(bytes[0]);
-        const bool is_control = (first < 0x20 && !is_blank(bytes[0])) || first == 0x7f;
-        if (length == 0 || is_control) return false;
-        bytes.remove_prefix(length);
-    }
-    return true;
-}
-
 std::string quoted(string_view text) { return '"' + printable(text, text_characters) + '"'; }
 
 std::string hex(string_view bytes) {

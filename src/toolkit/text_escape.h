@@ -8,9 +8,9 @@
 
 namespace kivd {
 
-// The length in bytes of the UTF-8 character that `text` starts with, 0 when it starts with
-// something else.
-[[nodiscard]] size_t utf8_length(std::string_view text);
+// Whether `bytes` can be read as lines: UTF-8, and no ASCII control characters but tabs and line
+// ends.
+[[nodiscard]] bool is_text(std::string_view bytes);
 
 // `text` as UTF-8: invalid bytes become \xHH and a backslash becomes two, so that different texts
 // stay different.

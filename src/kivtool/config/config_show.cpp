@@ -19,19 +19,6 @@ using problem_list = std::vector<std::string>;
 
 constexpr size_t longest_shown_text = 200;  // bytes
 
-// Whether it is readable: lines of UTF-8.
-bool is_text(std::string_view bytes) {
-    while (!bytes.empty()) {
-        const size_t length = utf8_length(bytes);
-        if (length == 0) return false;
-        const std::string_view character = bytes.substr(0, length);
-        const bool is_plain = printable(character) == character || character == "\\";
-        if (!is_plain && character != "\n" && character != "\t") return false;
-        bytes.remove_prefix(length);
-    }
-    return true;
-}
-
 void print_part(const kiv::config::ConfigPart& part, std::ostream& out, problem_list& problems) {
     const std::string id = printable(part.package()) + " " + printable(part.name());
     const std::string& payload = part.payload();
