@@ -28,7 +28,7 @@ struct facts {
 
 using lines = std::vector<std::string>;
 
-// For a part of the facts that may be unknown.
+// Unknown facts give an unknown result.
 template <class type>
 fault_list if_known(const std::optional<type>& known, auto describe) {
     return known ? fault_list(describe(*known)) : std::nullopt;
@@ -74,7 +74,7 @@ fault_list find_certificate_path(const facts& f) {
     });
 }
 
-// Without a daemon nobody knows where it would look.
+// Without a daemon nobody knows where it would look for keys.
 bool is_known(const key_facts& keys, key_verdict verdict) {
     return verdict != key_verdict::unknown && keys.source != key_source::assumed;
 }

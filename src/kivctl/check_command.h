@@ -1,4 +1,4 @@
-// `kivctl check`: says what is weak without anybody noticing, a line for each finding.
+// `kivctl check`: reports weaknesses that nobody would notice otherwise, one per line.
 #pragma once
 
 #include <string>
@@ -9,8 +9,8 @@ struct check_options {
     std::string base;
     unsigned timeout_ms = 0;
     bool is_json = false;
-    std::string key_directory;  // where the keys ought to be; empty: where the daemon looks
-    std::string user;           // who ought to read them; empty: who the daemon runs as
+    std::string key_directory;  // where the keys should be; empty: where the daemon looks
+    std::string user;           // who should read them; empty: whoever the daemon runs as
 };
 
 // Gives the exit status: 0 when there is nothing, 1 when something was found, 3 when the daemon

@@ -16,7 +16,7 @@
 namespace kivd {
 namespace {
 
-// `text` as a number, cut to the range of the type; false when it isn't one.
+// Reads `text` as a number, saturated to the range of the type. False when it isn't a number.
 bool parse_number(const std::string& text, int64_t& number) {
     const char* end = text.data() + text.size();
     const auto parsed = std::from_chars(text.data(), end, number);
@@ -44,7 +44,7 @@ bool is_file_number(const std::string& text) {
     return is_number && number >= 1 && number <= std::numeric_limits<int32_t>::max();
 }
 
-// The daemon reads anything that isn't a number as 0, and removes every report then.
+// The daemon would read anything that isn't a number as 0, and remove every report.
 std::string check_report_number(const std::string& text) {
     if (text == "all" || is_file_number(text)) return "";
     return "\"" + text + "\" is neither a report number, 1 or more, nor \"all\"";
@@ -89,7 +89,7 @@ int ask_whether_wanted(kiv_handle* daemon, const given& g) {
     return result == 1 ? status_done : status_refused;
 }
 
-// `result` is that of handing over a configuration.
+// `result` is what libkiv returned for a configuration.
 int tell_whether_taken(int result, const char* when_not) {
     if (result < 0) return result;
     if (result == 0) throw failure(when_not);

@@ -1,4 +1,4 @@
-// The commands of kivctl, as data: what the command line shows of each, and what carries it out.
+// The commands of kivctl as a table: how the command line shows each one, and what runs it.
 #pragma once
 
 #include <span>
@@ -27,7 +27,7 @@ struct given {
     std::string key_directory;
     std::string user;
 
-    // options before the command
+    // Options before the command.
     std::string base = KIV_DEFAULT_DIRECTORY;
     unsigned timeout_ms = 2000;
 };
@@ -37,7 +37,7 @@ struct argument {
     std::string given::*target = nullptr;
     const char* description = nullptr;
     bool is_required = false;
-    // Gives a complaint, empty when all is well; or null.
+    // Returns a complaint, or an empty text when all is well. May be null.
     std::string (*check)(const std::string&) = nullptr;
     const char* value_name = nullptr;  // of an option
     bool given::*flag = nullptr;       // in place of `target`, for an option without a value
@@ -49,10 +49,10 @@ struct command {
     const char* group;  // null for none
     const char* name;
     const char* description;
-    argument arguments[4];  // the last ones nameless
-    // Gives the exit status, or what libkiv gave when it failed.
+    argument arguments[4];  // unused ones have no name
+    // Returns the exit status, or the error of libkiv.
     int (*run)(kiv_handle*, const given&);
-    handle_use handle = handle_use::needed;  // none: that of `run` is null
+    handle_use handle = handle_use::needed;  // none: `run` gets a null handle
 };
 
 struct command_group {

@@ -82,8 +82,9 @@ std::optional<std::string> find_requested_checksum() {
     return text_of_checksum(checksum).data();
 }
 
-// Without the part that switches the store it stays as it was: then only two things tell that it is
-// off. It would want this event whatever the filter says, and its directory goes with it.
+// A configuration without this part leaves the store as it was. Then only two signs show that it is
+// off: this event, which the store wants whatever the filter says, is unwanted, or its directory is
+// gone.
 std::optional<bool> find_diagnostics(daemon_questions& questions) {
     const config_part_answer part = questions.own_part("RunActions");
     if (part.payload) {
@@ -104,7 +105,7 @@ std::optional<bool> find_diagnostics(daemon_questions& questions) {
 std::optional<uint64_t> find_partial_size() {
     struct stat status = {};
     if (stat(paths::events, &status) == 0) return static_cast<uint64_t>(status.st_size);
-    // private/ has to be there, else this is no directory of a daemon
+    // without private/ this is no daemon's directory
     if (errno != ENOENT || access(paths::private_dir, X_OK) != 0) return std::nullopt;
     return 0;
 }
@@ -112,13 +113,13 @@ std::optional<uint64_t> find_partial_size() {
 void add_entry(output_facts& found, std::string_view name) {
     const std::string path = paths::output_dir + std::string(name);
     struct stat status = {};
-    if (lstat(path.c_str(), &status) != 0) return;  // a collector was faster
+    if (lstat(path.c_str(), &status) != 0) return;  // a collector has just taken it
     found.size += static_cast<uint64_t>(status.st_size);
     if (path == paths::disable_marker) {
         found.has_marker = true;
         return;
     }
-    // A report by another name could not be deleted by the daemon.
+    // The daemon could not delete a report under any other name.
     const auto number = parse_report_name(name.data());
     if (!number || !S_ISREG(status.st_mode)) {
         found.bad_names.emplace_back(name);
@@ -165,7 +166,7 @@ key_facts find_keys(const process_facts& process, const std::optional<std::strin
             found.report_key = found.config_key = key_verdict::switched_off;
             return found;
         }
-        // looked for from where it was started, which it has left
+        // relative to where it was started, which it has left
         if (!directory.starts_with('/')) return found;
     }
     const auto user = user_name.empty() ? process.user : find_user(user_name);

@@ -1,5 +1,5 @@
-// How a daemon stands: what its directory, /proc and its answers tell. What is missing cannot be
-// known from here, mostly for want of permission; nothing is guessed.
+// The state of a daemon, from its directory, /proc and its answers. A missing value cannot be known
+// from here, mostly for lack of permission; nothing is guessed.
 #pragma once
 
 #include <cstdint>
@@ -31,12 +31,12 @@ struct output_facts {
     int32_t lowest = 0;  // 0 without reports
     int32_t highest = 0;
     bool has_marker = false;
-    std::vector<std::string> bad_names;  // which are neither reports nor the daemon's own
+    std::vector<std::string> bad_names;  // neither reports nor the daemon's own
 };
 
 struct space_facts {
     uint64_t bytes = 0;
-    std::optional<uint64_t> inodes;  // none where the file system doesn't count them
+    std::optional<uint64_t> inodes;  // missing where the file system doesn't count them
 };
 
 struct error_guard_facts {
@@ -57,7 +57,7 @@ struct key_facts {
 
 struct daemon_state {
     process_facts process;
-    int answer = 0;  // 0 when it answers, else what libkiv gave
+    int answer = 0;  // 0 when it answers, else the error of libkiv
     std::optional<int64_t> answer_us;
     std::optional<saved_state> saved;
     std::optional<bool> has_diagnostics;
@@ -71,10 +71,10 @@ struct daemon_state {
     std::optional<error_guard_facts> error_guard;
 };
 
-// Makes the daemon's directory the current one; whether that was possible.
+// Makes the daemon's directory the current one. False, with errno set, when that fails.
 [[nodiscard]] bool enter_base(const std::string& base);
 
-// Of the daemon of the current directory. A user that does not exist is thrown as a failure.
+// Looks at the daemon of the current directory. Throws a failure when `user` does not exist.
 [[nodiscard]] daemon_state gather_state(daemon_questions& questions,
                                         const std::optional<std::string>& key_directory,
                                         const std::string& user);

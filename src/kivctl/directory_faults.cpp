@@ -25,7 +25,7 @@ constexpr size_t list_size_max = list_record_size_max * (list_records_max + 1);
 
 enum class maker : bool { daemon, worker };
 
-// A file that is there for as long as something is made of it.
+// A file that exists only while something is being made of it.
 struct temporary {
     std::string path;
     ino_t inode;
@@ -71,7 +71,7 @@ std::string find_list_fault(string_view content, bool is_filter) {
         }
         content.remove_prefix(record->size() + list_record_end.size());
     }
-    // a filter that is just full is not known to be read to its end
+    // the daemon treats a filter with exactly that many as cut short
     const bool is_full = records == list_records_max;
     if (is_full && (is_filter || content.size() >= list_record_end.size())) {
         return "there are more than " + std::to_string(list_records_max - (is_filter ? 1 : 0)) +
@@ -80,7 +80,7 @@ std::string find_list_fault(string_view content, bool is_filter) {
     return "";
 }
 
-// Whether a filter of those records keeps every probe.
+// Whether a filter with these records keeps every probe.
 bool accepts_everything(string_view content) {
     constexpr string_view marker("__type\0exclude", 14);
     bool is_exclude = false, has_items = false, has_all = false;
@@ -115,7 +115,7 @@ constexpr filter_file filter_files[] = {
     {"staticdata_filter", paths::static_data_filter, &filter_config::staticdata_filter},
 };
 
-// The content of a file that is there; empty and `is_missing` when it is not.
+// Nothing when the file cannot be read; a missing one is empty, and `is_missing` is set.
 std::optional<std::string> read_list(const char* path, bool& is_missing) {
     struct stat status = {};
     is_missing = stat(path, &status) != 0 && errno == ENOENT;

@@ -11,7 +11,7 @@
 namespace kivd {
 namespace {
 
-// The daemon counts through from its lowest number to its highest, whatever there is in between.
+// The daemon counts from its lowest number to its highest, gaps included.
 constexpr int missing_files_max = 1000;
 
 void print_file(int32_t number, int fd) {

@@ -1,5 +1,5 @@
-// `kivctl files`: the daemon's diagnostics files. Both give the exit status, or what libkiv gave
-// when it failed; all else that fails is thrown.
+// `kivctl files`: the daemon's diagnostics files. Both return the exit status, or the error of
+// libkiv; other failures are thrown.
 #pragma once
 
 #include <cstdint>
@@ -9,8 +9,8 @@
 
 namespace kivd {
 
-// Prints a line for each file: its number and its size. The answers have to come within that time,
-// all of them together.
+// Prints a line for each file: its number and its size. All answers together have to come within
+// that time.
 int list_files(kiv_handle* daemon, unsigned timeout_ms);
 
 // Writes the file with that number to `path`, or to standard output when that is empty.

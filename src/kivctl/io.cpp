@@ -6,8 +6,10 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <ctime>
+#include <utility>
 
+#include "toolkit/whole_file.h"
+#include "util/clock.h"
 #include "util/file_io.h"
 #include "util/unique_fd.h"
 
@@ -15,12 +17,6 @@ namespace kivd {
 namespace {
 
 [[noreturn]] void fail(const std::string& what) { throw failure(what + ": " + strerror(errno)); }
-
-int64_t monotonic_ms() {
-    timespec now = {};
-    (void)clock_gettime(CLOCK_MONOTONIC, &now);
-    return int64_t{now.tv_sec} * 1000 + now.tv_nsec / 1'000'000;
-}
 
 // False, with errno set, when `file` cannot take it.
 bool copy_content(int fd, FILE* file) {
@@ -45,26 +41,20 @@ std::string read_source(const std::string& path, size_t size_max, const char* ki
     FILE* file = is_input ? stdin : opened.get();
     const std::string source = name_source(path);
     if (file == nullptr) fail("cannot open " + source);
-    std::string content(size_max + 1, '\0');  // one more shows that there is more
-    content.resize(fread(content.data(), 1, content.size(), file));
-    if (ferror(file) != 0) fail("cannot read " + source);
-    if (content.size() > size_max) {
+    std::optional<std::string> content = read_up_to(file, size_max);
+    if (!content) fail("cannot read " + source);
+    if (content->size() > size_max) {
         throw failure(source + " is too large for " + kind + ", which has at most " +
                       std::to_string(size_max) + " bytes");
     }
-    return content;
+    return std::move(*content);
 }
 
 std::optional<std::string> read_if_possible(const std::string& path, size_t size_max) {
     const unique_file file = open_to_read(path.c_str());
     if (!file) return std::nullopt;
-    std::string content;
-    char bytes[16'384];
-    while (const size_t size = fread(bytes, 1, sizeof bytes, file.get())) {
-        content.append(bytes, size);
-        if (content.size() > size_max) return std::nullopt;
-    }
-    return ferror(file.get()) == 0 ? std::optional(content) : std::nullopt;
+    std::optional<std::string> content = read_up_to(file.get(), size_max);
+    return content && content->size() <= size_max ? content : std::nullopt;
 }
 
 deadline::deadline(unsigned milliseconds) : end_ms_(monotonic_ms() + milliseconds) {}

@@ -1,4 +1,4 @@
-// The files that kivctl reads and writes, and its standard output. What fails is thrown as one
+// The files that kivctl reads and writes, and its standard output. Failures are thrown as one
 // sentence.
 #pragma once
 
@@ -25,17 +25,17 @@ struct failure : std::runtime_error {
     exit_status status;
 };
 
-// What to call the file of that path in messages: "-" is standard input.
+// The name of the file in messages: "-" is standard input.
 std::string name_source(const std::string& path);
 
-// The content of the file, at most `size_max` bytes; `kind` says what it is to be.
+// The content of the file, at most `size_max` bytes; `kind` says what it should be.
 std::string read_source(const std::string& path, size_t size_max, const char* kind);
 
-// The content of a file or of what is in /proc; nothing when it cannot be read or is larger. Never
+// The content of a file, also of one in /proc; nothing when it cannot be read or is larger. Never
 // waits for a writer.
 [[nodiscard]] std::optional<std::string> read_if_possible(const std::string& path, size_t size_max);
 
-// When a command has to be through.
+// When a command has to be finished.
 class deadline {
  public:
     explicit deadline(unsigned milliseconds);
@@ -52,7 +52,7 @@ void print_content(int fd);
 // Writes all that can be read from `fd` to the file of that path, which is created or replaced.
 void save_content(int fd, const std::string& path);
 
-// Standard output couldn't be written to, as errno says.
+// Throws that standard output cannot be written to, with the reason in errno.
 [[noreturn]] void fail_output();
 
 }  // namespace kivd

@@ -74,7 +74,7 @@ bool is_open_to_all(const std::string& path, mode_t mode) {
     return stat(path.c_str(), &status) == 0 && (status.st_mode & mode) == mode;
 }
 
-// Whether every user can read the file: it, and each directory on the way.
+// Whether every user can read the file and search each directory on the way.
 bool is_readable_to_all(const char* path) {
     char real_path[PATH_MAX];
     if (realpath(path, real_path) == nullptr || !is_open_to_all(real_path, S_IROTH)) return false;

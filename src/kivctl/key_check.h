@@ -14,9 +14,9 @@ namespace kivd {
 enum class key_verdict : uint8_t {
     unknown,
     usable,
-    unusable,      // can be read, but is not a key for that use: nothing is done that needs it
-    unreadable,    // is there, but not for the daemon: its protection is off
-    missing,       // off likewise
+    unusable,      // readable, but no key for that use: whatever needs it is not done at all
+    unreadable,    // the daemon may not read it, so its protection is off
+    missing,       // also off
     switched_off,  // off by the command line
 };
 

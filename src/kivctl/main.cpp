@@ -17,7 +17,7 @@
 namespace kivd {
 namespace {
 
-// How results of libkiv are told; {base} and {timeout} stand for the options.
+// What is said about errors of libkiv; {base} and {timeout} stand for the options.
 struct explanation {
     int error;
     exit_status status;
@@ -114,7 +114,7 @@ std::string replace(std::string text, const std::string& from, const std::string
     return text;
 }
 
-// Tells what went wrong when libkiv failed; gives the exit status.
+// Returns the exit status, after saying what went wrong when libkiv failed.
 int conclude(int result, const given& arguments) {
     if (result >= 0) return result;
     const auto* found = std::ranges::find(explanations, -result, &explanation::error);
@@ -148,7 +148,7 @@ int parse_and_run(int argc, char** argv) {
     } catch (const CLI::Success& help) {
         return app.exit(help);
     } catch (const CLI::RequiredError& error) {
-        // a mistyped command counts as a missing one, but is the better thing to name
+        // a mistyped command counts as a missing one, but naming it helps more
         const auto unknown = app.remaining(true);
         const std::string text =
             unknown.empty() ? error.what() : "unexpected \"" + unknown.front() + "\"";

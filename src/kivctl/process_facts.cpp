@@ -36,11 +36,11 @@ std::optional<pid_t> read_pid() {
 
 struct lock {
     std::optional<bool> is_held;
-    std::optional<pid_t> pid;  // of who took it
+    std::optional<pid_t> pid;  // of whoever took it
 };
 
-// /proc/locks tells without taking part: whoever tried the lock himself could keep a daemon that is
-// just starting from having it. Some file systems give another device there than stat() does.
+// Trying the lock could keep a daemon that is just starting from taking it; reading /proc/locks
+// cannot. On some file systems the device there differs from that of stat().
 lock find_lock(const struct stat& file, std::optional<pid_t> written_pid) {
     const auto locks = read_if_possible("/proc/locks", proc_file_size_max);
     if (!locks) return {std::nullopt, written_pid};
@@ -112,7 +112,7 @@ std::optional<user_ids> find_ids(pid_t pid) {
     const auto gids = status_numbers(*status, "Gid");
     if (uids.size() < 2 || gids.size() < 2) return std::nullopt;
     const auto groups = status_numbers(*status, "Groups");
-    return user_ids{uids[1], gids[1], {groups.begin(), groups.end()}};  // those in effect
+    return user_ids{uids[1], gids[1], {groups.begin(), groups.end()}};  // the effective ones
 }
 
 }  // namespace
@@ -127,7 +127,7 @@ process_facts find_daemon_process() {
     const auto [is_held, pid] = find_lock(file, read_pid());
     found.is_lock_held = is_held;
     if (is_held == false || (pid && !exists(*pid))) {
-        found.is_running = false;  // held nevertheless: by a child that has outlived the daemon
+        found.is_running = false;  // a child that has outlived the daemon may still hold the lock
     } else if (is_held && pid) {
         found.is_running = true;
     }
@@ -147,7 +147,7 @@ std::optional<bool> has_worker(const process_facts& daemon) {
     const auto arguments = read_proc(*daemon.pid, "cmdline");
     if (!text || !arguments) return std::nullopt;
     std::istringstream children(*text);
-    for (pid_t child = 0; children >> child;) {  // a log reader is another program
+    for (pid_t child = 0; children >> child;) {  // a log reader runs another program
         if (read_proc(child, "cmdline") == arguments) return true;
     }
     return false;

@@ -1,5 +1,5 @@
-// The process that serves a working directory, as its lock file and /proc show it to anybody. Who
-// holds the lock is read from /proc/locks: to try the lock could keep a daemon that is just
+// The process that serves a working directory, as anybody can see it from its lock file and /proc.
+// Who holds the lock is read from /proc/locks: to try the lock could keep a daemon that is just
 // starting from having it.
 #pragma once
 
@@ -23,20 +23,21 @@ struct daemon_arguments {
     bool is_test_mode = false;
 };
 
-// What is missing could not be found out.
+// A missing value could not be found out.
 struct process_facts {
     std::optional<bool> is_lock_held;
-    std::optional<bool> is_running;  // a process of its own, whatever it does
+    std::optional<bool> is_running;  // even if it is stopped
     std::optional<pid_t> pid;        // of the running one
     std::optional<bool> is_stopped;  // by a signal or a debugger
     std::optional<daemon_arguments> arguments;
     std::optional<user_ids> user;
 };
 
-// Those of the daemon of the current directory.
+// Looks for the daemon of the current directory.
 [[nodiscard]] process_facts find_daemon_process();
 
-// Whether a child of the daemon, or one that has outlived it, makes a report or compresses a file.
+// Whether a child of the daemon, perhaps one that has outlived it, is making a report or
+// compressing a file.
 [[nodiscard]] std::optional<bool> has_worker(const process_facts& daemon);
 
 [[nodiscard]] std::optional<user_ids> find_user(const std::string& name);

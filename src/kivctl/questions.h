@@ -1,4 +1,4 @@
-// What kivctl asks a daemon, all of it within one time limit.
+// Asks a daemon several questions within one time limit.
 #pragma once
 
 #include <cstdint>
@@ -14,16 +14,15 @@ namespace kivd {
 
 struct config_part_answer {
     bool is_known = false;
-    std::optional<std::string> payload;  // none when the configuration in force has no such part
+    std::optional<std::string> payload;  // missing when the configuration in force has no such part
 };
 
 class daemon_questions {
  public:
-    // Of the daemon of the current directory.
+    // Asks the daemon of the current directory.
     explicit daemon_questions(unsigned timeout_ms);
 
-    // 0 when it answers, else what libkiv gave. Without an answer the other questions are not
-    // asked.
+    // 0 when it answers, else the error of libkiv. Once there was none, nothing more is asked.
     [[nodiscard]] int is_alive();
     [[nodiscard]] std::optional<bool> is_wanted(const char* package, const char* name);
     // A part of the package "kivd".

@@ -130,12 +130,10 @@ std::string describe_error_guard(const std::optional<error_guard_facts>& guard) 
     return text + ", as saved at " + local_time(guard->saved_at);
 }
 
-std::optional<uint64_t> report_limit(const daemon_state& state) {
-    return state.saved ? std::optional(uint64_t{state.saved->max_report_size}) : std::nullopt;
-}
-
-std::optional<uint64_t> output_size(const daemon_state& state) {
-    return state.output ? std::optional(state.output->size) : std::nullopt;
+// A part of facts that may be unknown.
+template <class type, class field_type>
+std::optional<field_type> get(const std::optional<type>& facts, field_type type::*field) {
+    return facts ? std::optional((*facts).*field) : std::nullopt;
 }
 
 std::optional<bool> collection(const daemon_state& state) {
@@ -149,9 +147,10 @@ void print_text(const status_options& options, const daemon_state& state) {
         {"answers", describe_answer(state, options.timeout_ms)},
         {"collection", on_or_off(collection(state))},
         {"diagnostics", on_or_off(state.has_diagnostics)},
-        {"partial file", share(state.partial_size, report_limit(state))},
+        {"partial file",
+         share(state.partial_size, get(state.saved, &saved_state::max_report_size))},
         {"reports", describe_reports(state.output)},
-        {"output size", share(output_size(state), state.output_budget)},
+        {"output size", share(get(state.output, &output_facts::size), state.output_budget)},
         {"free space", describe_space(state)},
         {"sealing", describe_key(state.keys, state.keys.report_key, state.keys.report_key_path)},
         {"verification",
@@ -175,19 +174,13 @@ json json_of_key(const std::string& path, key_verdict verdict) {
             {"path", path.empty() ? json() : json_text(path)}};
 }
 
-// A number of `facts`, or null without them.
-template <class type, class field_type>
-json json_field(const std::optional<type>& facts, field_type type::*field) {
-    return facts ? json((*facts).*field) : json();
-}
-
 json json_of_error_guard(const std::optional<error_guard_facts>& guard) {
     const bool is_suppressed = guard && guard->suppressed_until != 0;
-    return {{"used", json_field(guard, &error_guard_facts::used)},
+    return {{"used", json_or_null(get(guard, &error_guard_facts::used))},
             {"limit", error_period_limit},
             {"suppressed", guard ? json(is_suppressed) : json()},
             {"suppressed_until", is_suppressed ? json(guard->suppressed_until) : json()},
-            {"saved_at", json_field(guard, &error_guard_facts::saved_at)}};
+            {"saved_at", json_or_null(get(guard, &error_guard_facts::saved_at))}};
 }
 
 json to_json(const status_options& options, const daemon_state& state) {
@@ -203,16 +196,16 @@ json to_json(const status_options& options, const daemon_state& state) {
         {"diagnostics", json_or_null(state.has_diagnostics)},
         {"partial_file",
          {{"size", json_or_null(state.partial_size)},
-          {"limit", json_or_null(report_limit(state))}}},
+          {"limit", json_or_null(get(state.saved, &saved_state::max_report_size))}}},
         {"reports",
-         {{"count", json_field(state.output, &output_facts::reports)},
-          {"lowest", json_field(state.output, &output_facts::lowest)},
-          {"highest", json_field(state.output, &output_facts::highest)}}},
+         {{"count", json_or_null(get(state.output, &output_facts::reports))},
+          {"lowest", json_or_null(get(state.output, &output_facts::lowest))},
+          {"highest", json_or_null(get(state.output, &output_facts::highest))}}},
         {"output",
-         {{"size", json_or_null(output_size(state))},
+         {{"size", json_or_null(get(state.output, &output_facts::size))},
           {"limit", json_or_null(state.output_budget)}}},
         {"free_space",
-         {{"size", json_field(state.space, &space_facts::bytes)},
+         {{"size", json_or_null(get(state.space, &space_facts::bytes))},
           {"needed", json_or_null(state.space_needed)},
           {"inodes", state.space ? json_or_null(state.space->inodes) : json()}}},
         {"keys_from", text_of(state.keys.source).name},

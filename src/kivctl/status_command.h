@@ -1,4 +1,4 @@
-// `kivctl status`: how the daemon stands, for people or as JSON.
+// `kivctl status`: the state of the daemon, for people or as JSON.
 #pragma once
 
 #include <string>
@@ -11,7 +11,7 @@ struct status_options {
     bool is_json = false;
 };
 
-// Gives the exit status: 0 when the daemon answers, 3 when not.
+// Gives the exit status: 0 when the daemon answers, 3 otherwise.
 int run_status(const status_options& options);
 
 }  // namespace kivd

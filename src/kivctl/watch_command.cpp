@@ -33,15 +33,15 @@ namespace {
 
 constexpr char port[] = "2305";
 
-// All that has been read is written before the next wait, so there is nothing to be saved, whatever
-// this interrupts; a write that waits for its reader too.
+// Everything that has been read is written before the next wait, so nothing is lost here, not even
+// when this interrupts a write.
 void end_now(int /*signal*/) { _exit(status_done); }
 
 void end_on_signals() {
     struct sigaction action = {};
     action.sa_handler = end_now;
     for (const int number : {SIGINT, SIGTERM}) (void)sigaction(number, &action, nullptr);
-    (void)signal(SIGPIPE, SIG_IGN);  // EPIPE says it
+    (void)signal(SIGPIPE, SIG_IGN);  // writes then fail with EPIPE
 }
 
 [[noreturn]] void fail_to_connect(const watch_options& options, const std::string& why) {
@@ -50,15 +50,15 @@ void end_on_signals() {
                   status_unreachable);
 }
 
-// A name service may take its time, and a name may stand for several machines: all of
-// that together has one limit.
+// A name service may be slow and a name may stand for several machines, so one limit covers the
+// whole attempt.
 void give_up(int /*signal*/) {
     constexpr char text[] = "kivctl: the debug interface could not be reached in time\n";
     (void)!write(STDERR_FILENO, text, sizeof text - 1);
     _exit(status_unreachable);
 }
 
-// Gives up in so many milliseconds; with 0 no more.
+// Gives up after so many milliseconds; 0 removes the limit.
 void limit_time(unsigned milliseconds) {
     (void)signal(SIGALRM, give_up);
     const itimerval limit = {
@@ -66,7 +66,7 @@ void limit_time(unsigned milliseconds) {
     (void)setitimer(ITIMER_REAL, &limit, nullptr);
 }
 
-// 0 when it answers, else as libkiv says.
+// 0 when it answers, else the error of libkiv.
 int ask_daemon(const watch_options& options, unsigned timeout_ms) {
     const std::unique_ptr<kiv_handle, releaser<kiv_destroy>> daemon(
         kiv_create_from_path(options.base.c_str()));
@@ -81,7 +81,7 @@ bool is_loopback(const addrinfo& address) {
     return ntohl(internet.sin_addr.s_addr) >> 24U == IN_LOOPBACKNET;
 }
 
-// A connection to a daemon that is stopped is made all the same, and nothing would ever come.
+// The kernel also connects to a daemon that is stopped, and nothing would ever arrive.
 void check_local_daemon(const watch_options& options, unsigned timeout_ms) {
     if (ask_daemon(options, timeout_ms) != -ETIMEDOUT) return;
     throw failure("the daemon in " + options.base + " has not answered within " +
@@ -89,11 +89,11 @@ void check_local_daemon(const watch_options& options, unsigned timeout_ms) {
                   status_unreachable);
 }
 
-// Not ok, with errno set, when it cannot be had.
+// Not ok, with errno set, when the connection fails.
 unique_fd connect_to(const addrinfo& address) {
     unique_fd fd(socket(address.ai_family, address.ai_socktype | SOCK_CLOEXEC, 0));
     if (!fd.ok()) return fd;
-    const int on = 1;  // so that a machine that vanished is noticed some day
+    const int on = 1;  // notices a machine that has vanished
     (void)setsockopt(fd.get(), SOL_SOCKET, SO_KEEPALIVE, &on, sizeof on);
     if (connect(fd.get(), address.ai_addr, address.ai_addrlen) != 0) fd.reset();
     return fd;
@@ -132,7 +132,7 @@ bool is_local(int fd) {
     return own.sin_addr.s_addr == other.sin_addr.s_addr;
 }
 
-// The side that closes first holds its port for a minute, and as long no daemon could be started
+// The side that closes first keeps the port for a minute, during which no daemon could be started
 // with -d. A reset frees it.
 void reset_connection(unique_fd& connection) {
     const linger no_time = {1, 0};
@@ -140,7 +140,7 @@ void reset_connection(unique_fd& connection) {
     connection.reset();
 }
 
-// The connection was closed; a daemon that met a full one has left a frame unfinished.
+// Throws why the connection was closed. A daemon that found it full has left a frame unfinished.
 [[noreturn]] void tell_why_closed(const watch_options& options, bool was_local,
                                   bool is_inside_frame) {
     std::string text;
@@ -158,14 +158,14 @@ void reset_connection(unique_fd& connection) {
     throw failure(text, status_unreachable);
 }
 
-// False when nobody reads standard output any more; true when there is something on `fd`.
+// Waits for input on `fd`. False when nobody reads standard output any more.
 bool wait_readable(int fd) {
     pollfd entries[] = {{fd, POLLIN, 0}, {STDOUT_FILENO, 0, 0}};
     while (poll(entries, std::size(entries), -1) < 0 && errno == EINTR) continue;
     return entries[1].revents == 0;
 }
 
-// False when nobody reads it any more.
+// False when nobody reads standard output any more.
 bool write_output(std::string_view text) {
     if (write_all(STDOUT_FILENO, text.data(), text.size())) return true;
     if (errno == EPIPE) return false;
@@ -184,7 +184,7 @@ std::string local_time() {
     return text;
 }
 
-// What is to be shown of the frames that are there.
+// Takes the whole frames and gives what to show of them.
 std::string take_frames(frame_reader& frames, const watch_options& options) {
     std::string text;
     const std::string time = local_time();
@@ -203,7 +203,7 @@ std::string take_frames(frame_reader& frames, const watch_options& options) {
 
 int run_watch(const watch_options& options) {
     end_on_signals();
-    // else the connection would get its number
+    // otherwise the connection would get its number
     if (fcntl(STDOUT_FILENO, F_GETFD) < 0) fail_output();
     unique_fd connection = connect_to_host(options);
     const bool was_local = is_local(connection.get());

@@ -20,7 +20,7 @@ size_t read_head(std::string_view head) {
     return size;
 }
 
-// The packet in a message; none when the message holds anything else.
+// The packet in a message; nothing when the message holds anything else.
 std::optional<std::string_view> find_packet(std::string_view message) {
     if (message[0] != packet_key) return std::nullopt;
     std::span<const uint8_t> packet = bytes_of(message.substr(1));

@@ -1,4 +1,4 @@
-// The stream of the debug interface, taken apart. A frame is the length of the rest in four bytes,
+// Splits the stream of the debug interface into frames: the length of the rest in four bytes,
 // big-endian, then a request packet as field 1 of a protobuf message.
 #pragma once
 
@@ -9,24 +9,24 @@
 
 namespace kivd {
 
-// Both are good until bytes are added.
+// Both are valid until bytes are added.
 struct debug_frame {
     std::string_view bytes;   // the whole of it
     std::string_view packet;  // the request in it
 };
 
-// Holds at most one frame that is not whole yet, beside what was added last.
+// Holds at most one incomplete frame beside what was added last.
 class frame_reader {
  public:
-    // What the stream goes on with.
+    // Takes the next bytes of the stream.
     void add(std::string_view bytes);
 
-    // The next whole frame; none when bytes are missing or the stream is broken.
+    // The next frame; nothing when it is incomplete or the stream is broken.
     [[nodiscard]] std::optional<debug_frame> next();
 
-    // What came is no frame; nothing behind it can be found any more.
+    // Bytes that are no frame have come; the next frame cannot be found any more.
     [[nodiscard]] bool is_broken() const { return is_broken_; }
-    // Bytes of a frame are there that is not whole.
+    // There are bytes of an incomplete frame.
     [[nodiscard]] bool is_inside_frame() const { return start_ < data_.size(); }
 
  private:

@@ -14,12 +14,12 @@ namespace {
 
 using std::string_view;
 
-constexpr size_t text_characters = 120;  // what is shown at most, of any part of a packet
+constexpr size_t text_characters = 120;  // shown of any part of a packet
 constexpr size_t hex_bytes = 32;
 
 string_view until_nul(string_view bytes) { return bytes.substr(0, bytes.find('\0')); }
 
-// Takes the next word off `left`, which a NUL ends, but not what ended the word.
+// Takes the next word off `left`, which ends in a NUL; what ended the word stays.
 string_view take_word(string_view& left) {
     const request_word word = find_word(left.data());
     left.remove_prefix(static_cast<size_t>(word.end - left.data()));
@@ -30,10 +30,10 @@ string_view take_word(string_view& left) {
 struct parts {
     const request_row* shape = nullptr;  // null: no known command
     string_view package, name;
-    string_view left;  // with what ended the last of these; the packet when there is no command
+    string_view left;  // what follows; the whole packet when there is no command
 };
 
-// They stay in `packet`.
+// The parts are views of `packet`.
 parts take_apart(const std::string& packet) {
     parts found;
     found.left = packet;
@@ -44,17 +44,6 @@ parts take_apart(const std::string& packet) {
     found.package = take_word(found.left);
     found.name = take_word(found.left);
     return found;
-}
-
-bool is_text(string_view bytes) {
-    while (!bytes.empty()) {
-        const size_t length = utf8_length(bytes);
-        const auto first = static_cast<uint8_t>(bytes[0]);
-        const bool is_control = (first < 0x20 && !is_blank(bytes[0])) || first == 0x7f;
-        if (length == 0 || is_control) return false;
-        bytes.remove_prefix(length);
-    }
-    return true;
 }
 
 std::string quoted(string_view text) { return '"' + printable(text, text_characters) + '"'; }
@@ -83,7 +72,8 @@ std::string describe_rest(const parts& p) {
         while (!left.empty() && is_blank(left[0])) left.remove_prefix(1);
         return printable(left, text_characters);
     }
-    left.remove_prefix(std::min<size_t>(1, left.size()));  // one delimiter; more are part of it
+    left.remove_prefix(
+        std::min<size_t>(1, left.size()));  // one delimiter; further ones belong to the text
     return with_size(left);
 }
 

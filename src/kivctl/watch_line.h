@@ -1,5 +1,5 @@
-// Request packets as lines for people. A packet is whatever a producer sent: all of it that is
-// shown is made fit for a terminal and cut.
+// Request packets as lines for people. A packet is whatever a producer sent, so everything is
+// escaped for a terminal and cut.
 #pragma once
 
 #include <string>

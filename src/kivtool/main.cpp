@@ -1,4 +1,4 @@
-// kivtool: looks into what kivd leaves on disk and makes what it is configured with. Needs no
+// kivtool: shows what kivd leaves on disk and makes its configuration files. Needs no running
 // daemon.
 #include <google/protobuf/stubs/logging.h>
 #include <unistd.h>
@@ -123,8 +123,8 @@ CLI::App* add_show(CLI::App& config, show_given& given) {
 }  // namespace
 
 int main(int argc, char** argv) try {
-    google::protobuf::SetLogHandler(nullptr);  // problems are told once, by us
-    std::ios::sync_with_stdio(false);          // reports are long
+    google::protobuf::SetLogHandler(nullptr);  // we report problems ourselves
+    std::ios::sync_with_stdio(false);          // for speed
 
     CLI::App app("Looks into the files that kivd leaves and makes those that it is given.",
                  "kivtool");

@@ -8,11 +8,11 @@ namespace {
 
 struct utf8_lead {
     uint8_t first, last;                // of the lead byte
-    uint8_t second_first, second_last;  // of the byte behind it; all others are 80 to BF
+    uint8_t second_first, second_last;  // of the next byte; any further ones are 80 to BF
     size_t length;
 };
 
-// The second byte's range leaves out overlong forms, surrogates and what lies beyond U+10FFFF.
+// The second byte's range excludes overlong forms, surrogates and everything above U+10FFFF.
 // clang-format off
 constexpr utf8_lead leads[] = {
     {0x00, 0x7f, 0x00, 0xff, 1},
@@ -39,6 +39,17 @@ bool is_tail(std::string_view text, const utf8_lead& lead) {
     return true;
 }
 
+// The length in bytes of the UTF-8 character that `text` starts with, 0 when it starts with
+// something else.
+size_t utf8_length(std::string_view text) {
+    if (text.empty()) return 0;
+    for (const utf8_lead& lead : leads) {
+        if (byte_at(text, 0) < lead.first || byte_at(text, 0) > lead.last) continue;
+        return is_tail(text, lead) ? lead.length : 0;
+    }
+    return 0;
+}
+
 // `character` is one UTF-8 character: C0, DEL, or C1, which is C2 80 to C2 9F.
 bool is_control(std::string_view character) {
     if (character.size() == 1) return byte_at(character, 0) < 0x20 || character[0] == 0x7f;
@@ -54,7 +65,7 @@ void append_hex(std::string& to, std::string_view bytes) {
     }
 }
 
-// How much of the start of `text` is characters that nothing is ever done to.
+// The number of leading characters that never need escaping.
 size_t plain_length(std::string_view text) {
     size_t length = 0;
     while (length < text.size() && byte_at(text, length) >= 0x20 && byte_at(text, length) < 0x7f &&
@@ -90,13 +101,14 @@ std::string escape(std::string_view text, bool controls_too, size_t max_characte
 
 }  // namespace
 
-size_t utf8_length(std::string_view text) {
-    if (text.empty()) return 0;
-    for (const utf8_lead& lead : leads) {
-        if (byte_at(text, 0) < lead.first || byte_at(text, 0) > lead.last) continue;
-        return is_tail(text, lead) ? lead.length : 0;
+bool is_text(std::string_view bytes) {
+    while (!bytes.empty()) {
+        const size_t length = utf8_length(bytes);
+        const bool is_space = bytes[0] == '\t' || bytes[0] == '\r' || bytes[0] == '\n';
+        if (length == 0 || (is_control(bytes.substr(0, 1)) && !is_space)) return false;
+        bytes.remove_prefix(length);
     }
-    return 0;
+    return true;
 }
 
 std::string escape_non_utf8(std::string_view text) {

@@ -1,5 +1,5 @@
-// Text from reports and requests, made fit to be shown: names and values are whatever bytes a
-// producer sent.
+// Makes text from reports and requests safe to show: names and values are whatever bytes a producer
+// sent.
 #pragma once
 
 #include <cstddef>
@@ -8,15 +8,16 @@
 
 namespace kivd {
 
-// The length in bytes of the UTF-8 character that `text` starts with, 0 when it starts with none.
-[[nodiscard]] size_t utf8_length(std::string_view text);
+// Whether `bytes` can be read as lines: UTF-8, and no ASCII control characters but tabs and line
+// ends.
+[[nodiscard]] bool is_text(std::string_view bytes);
 
-// `text` as UTF-8: bytes that belong to no character become \xHH and a backslash becomes two, so
-// that different texts stay different.
+// `text` as UTF-8: invalid bytes become \xHH and a backslash becomes two, so that different texts
+// stay different.
 [[nodiscard]] std::string escape_non_utf8(std::string_view text);
 
-// The same for a terminal: control characters become \xHH too, and what goes beyond
-// `max_characters` characters of `text` is cut and replaced by "...".
+// The same for a terminal: control characters become \xHH too, and a text of more than
+// `max_characters` characters ends in "..." there.
 [[nodiscard]] std::string printable(std::string_view text, size_t max_characters = 200);
 
 }  // namespace kivd

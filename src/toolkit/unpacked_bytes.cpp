@@ -34,14 +34,14 @@ unpacked_bytes::unpacked_bytes(const std::string& path)
 }
 
 unpacked_bytes::unpacked_bytes(std::string_view bytes, const char* place) : place_(place) {
-    // zlib's input pointer is not const, but nothing is ever written through it.
+    // zlib's input pointer is not const, but zlib never writes through it.
     inflater_.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
     inflater_.avail_in = static_cast<uInt>(bytes.size());
     bytes_read_ = bytes.size();
     start();
 }
 
-// Looks at the first bytes.
+// Decides by the first bytes whether this is gzip.
 void unpacked_bytes::start() {
     is_gzip_ = text_of({inflater_.next_in, inflater_.avail_in}).starts_with(gzip_magic);
     if (is_gzip_ && inflateInit2(&inflater_, gzip_only) != Z_OK) throw std::bad_alloc();
@@ -61,7 +61,7 @@ std::string unpacked_bytes::position() const {
     return "byte " + std::to_string(offset()) + " of " + place_;
 }
 
-// Makes sure that there is input; false at the end of the source or with a problem.
+// Makes sure that there is input. False at the end of the source and after a problem.
 bool unpacked_bytes::fill() {
     if (inflater_.avail_in > 0) return true;
     if (!file_) return false;

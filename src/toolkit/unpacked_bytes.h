@@ -15,26 +15,26 @@ namespace kivd {
 
 inline constexpr std::string_view gzip_magic = "\x1f\x8b";  // that gzip data starts with
 
-// Reads one source from start to end. What starts with the magic bytes of gzip is decompressed, all
-// of its members end to end; anything else comes as it is.
+// Reads one source from start to end. If it starts with the magic bytes of gzip, all its members
+// are decompressed; anything else is passed through.
 class unpacked_bytes {
  public:
     // A file; "-" is standard input.
     explicit unpacked_bytes(const std::string& path);
-    // Bytes in memory, less than 4 GiB, that outlive this object. `place` is what problems call
-    // them, such as "the sealed data".
+    // Bytes in memory, less than 4 GiB, that outlive this object. `place` names them in
+    // problems, such as "the sealed data".
     unpacked_bytes(std::string_view bytes, const char* place);
     ~unpacked_bytes();
     unpacked_bytes(const unpacked_bytes&) = delete;
     unpacked_bytes& operator=(const unpacked_bytes&) = delete;
 
-    // Appends at least one byte to `to`, or gives false: at the end, or with a problem.
+    // Appends at least one byte to `to`. False at the end and after a problem.
     [[nodiscard]] bool read_some(std::string& to);
 
     // Why there were no more bytes, as the end of a sentence; empty at a good end.
     [[nodiscard]] const std::string& problem() const { return problem_; }
     [[nodiscard]] bool is_gzip() const { return is_gzip_; }
-    // The problem is only that other bytes follow behind whole gzip members.
+    // The only problem is that other bytes follow the last gzip member.
     [[nodiscard]] bool has_foreign_tail() const { return has_foreign_tail_; }
     // How much of the source has been used so far.
     [[nodiscard]] uint64_t offset() const { return bytes_read_ - inflater_.avail_in; }
@@ -48,9 +48,9 @@ class unpacked_bytes {
     std::string position() const;
 
     const char* place_;
-    unique_file file_;  // null: all there is to read is at hand from the start
+    unique_file file_;  // null when the bytes are in memory
     std::array<Bytef, 65536> input_;
-    z_stream inflater_{};  // also says what is left of the input when it is not gzip
+    z_stream inflater_{};  // also keeps track of input that is not gzip
     uint64_t bytes_read_ = 0;
     bool is_gzip_ = false;
     bool in_member_ = false;

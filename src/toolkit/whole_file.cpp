@@ -3,11 +3,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
 #include <stdexcept>
+#include <utility>
 
 #include "toolkit/text_escape.h"
 #include "util/unique_fd.h"
@@ -32,19 +34,26 @@ bool write_new_file(const std::string& path, std::string_view bytes) {
 
 }  // namespace
 
+std::optional<std::string> read_up_to(FILE* file, size_t max_size) {
+    std::string bytes;
+    std::array<char, 65536> piece;
+    while (bytes.size() <= max_size) {
+        const size_t wanted = std::min(piece.size(), max_size + 1 - bytes.size());
+        const size_t size = fread(piece.data(), 1, wanted, file);
+        bytes.append(piece.data(), size);
+        if (size < wanted) break;
+    }
+    return ferror(file) == 0 ? std::optional(std::move(bytes)) : std::nullopt;
+}
+
 std::string read_whole_file(const std::string& path, size_t max_size) {
     const unique_file file(fopen(path.c_str(), "re"));
     if (!file) fail_with_reason(path, "cannot be opened");
-    std::string bytes;
-    std::array<char, 65536> piece;
-    while (const size_t size = fread(piece.data(), 1, piece.size(), file.get())) {
-        bytes.append(piece.data(), size);
-        if (bytes.size() > max_size) {
-            fail(path, "has more than " + std::to_string(max_size) + " bytes");
-        }
-    }
-    if (ferror(file.get())) fail_with_reason(path, "cannot be read");
-    return bytes;
+    std::optional<std::string> bytes = read_up_to(file.get(), max_size);
+    if (!bytes) fail_with_reason(path, "cannot be read");
+    if (bytes->size() > max_size)
+        fail(path, "has more than " + std::to_string(max_size) + " bytes");
+    return std::move(*bytes);
 }
 
 void replace_file(const std::string& path, std::string_view bytes) {

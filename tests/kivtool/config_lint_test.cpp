@@ -70,7 +70,7 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
         {{}, ""},
         {{{"p:" + n1006, ""}}, ""},  // 1007 bytes in all
         {{{"p:" + n1006 + "n", ""}}, "...: package and name make a record of up to 1025"},
-        {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "the daemon's list of parts does not bring it"},
+        {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "the daemon loses this part"},
         {{{":n", ""}}, "f: error: :n: its package is empty"},
         {{{"p:n m", ""}}, "f: warning: p:n m: its name holds a blank"},
         {{{"p:n" + nul, ""}}, "f: error: p:n\\x00: its name holds a NUL"},
@@ -125,7 +125,7 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
     }
     EXPECT_EQ(found_in(many), "");
     many.push_back({"p", "last", "", "f", nullptr});
-    EXPECT_TRUE(says(found_in(many), "p:last: the daemon's list of parts does not bring it"));
+    EXPECT_TRUE(says(found_in(many), "p:last: the daemon loses this part"));
     EXPECT_TRUE(says(found_in({}), "all: warning: there is no filter of events"));
 }
 

@@ -26,7 +26,7 @@ std::string no_package(bool is_signed, std::string_view rest) {
     return text;
 }
 
-// Why bytes are no configuration file; empty when they are one.
+// Why the bytes are not a configuration file; empty when they are.
 std::string fault_of(std::string_view bytes, config_fields& fields) {
     if (bytes.empty()) return "the file is empty";
     switch (find_config_fields(bytes_of(bytes), fields)) {
@@ -95,7 +95,7 @@ std::string compress_package(const kiv::config::ConfigPackage& package) {
     return compressed_data;
 }
 
-// Fields are written by their numbers, the signature first.
+// protobuf writes fields in the order of their numbers, so the signature comes first.
 std::string join_config_file(const kiv::config::ConfigResponse& file) {
     const std::string bytes = file.SerializeAsString();
     if (bytes.size() <= max_config_file_size) return bytes;

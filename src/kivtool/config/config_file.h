@@ -1,5 +1,5 @@
-// Configuration files: a compressed package of parts and, before it, a signature over the
-// compressed bytes. The form is checked as the daemon checks it.
+// Reading and writing configuration files: a compressed package of parts and, before it, a
+// signature over the compressed bytes. Format: format/config_file.h.
 #pragma once
 
 #include <cstddef>
@@ -15,22 +15,23 @@ namespace kivd {
 struct config_file {
     std::optional<std::string_view> signature;
     std::string_view compressed_data;
-    size_t ignored_size = 0;  // bytes behind them
+    size_t ignored_size = 0;  // bytes after the package
 };
 
-// All of these throw what is wrong, as a sentence about the file or the end of one.
+// All of these throw a std::runtime_error that says what is wrong, as a sentence or the end of one
+// about the file.
 
-// Finds the fields in the bytes of a file; they stay there.
+// The fields are views of `bytes`.
 [[nodiscard]] config_file split_config_file(std::string_view bytes);
 
-// `notes` gets a sentence for whatever is unusual but taken.
+// `notes` gets a sentence for whatever is unusual but accepted.
 [[nodiscard]] kiv::config::ConfigPackage decompress_package(std::string_view compressed_data,
                                                             std::vector<std::string>& notes);
 
-// Packs and compresses; what is the same gives the same bytes.
+// The same package always gives the same bytes.
 [[nodiscard]] std::string compress_package(const kiv::config::ConfigPackage& package);
 
-// The bytes of a file.
+// The bytes of the file, which must not be too many.
 [[nodiscard]] std::string join_config_file(const kiv::config::ConfigResponse& file);
 
 }  // namespace kivd

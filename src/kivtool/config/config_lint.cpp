@@ -20,18 +20,19 @@
 namespace kivd {
 namespace {
 
-// Around package and name in a record of the daemon's list of parts: NULs, a line feed, whether it
-// is in use, and an id of up to 10 digits.
+// What a record of the daemon's list of parts holds beside package and name, in bytes: an id of up
+// to 10 digits, whether the part is in use, NULs and a line feed.
 constexpr size_t max_record_overhead = 17;
 
 constexpr char refuses[] = "; the daemon refuses the configuration";
 
-constexpr size_t near = 2;           // letters in which two names differ
-constexpr size_t longest_near = 64;  // letters of a name that may be near another
+constexpr size_t near = 2;           // letters by which similar names may differ
+constexpr size_t longest_near = 64;  // letters of a name that is compared
 
 lint_place place_of(const part_content& part) { return {part.path, 0, id_of(part)}; }
 
-// How many letters to change, add or take away to make one of the other; capitals are no others.
+// How many letters have to be changed, added or removed to get from one to the other, ignoring
+// case.
 size_t distance(std::string_view a, std::string_view b) {
     std::vector<size_t> row(b.size() + 1);
     std::iota(row.begin(), row.end(), size_t{0});
@@ -78,13 +79,13 @@ void lint_id(const part_content& part, lint_findings& findings) {
                                          "start");
 }
 
-// What the daemon takes without complaint, but its author will not have meant.
+// Finds what the daemon accepts without complaint, but the author can hardly have meant.
 void lint_parts(std::span<const part_content> parts, lint_findings& findings) {
     std::set<std::pair<std::string_view, std::string_view>> seen;
     for (const part_content& part : parts) {
         lint_id(part, findings);
         lint_own_part(part, findings);
-        // As the daemon reads them, up to a NUL.
+        // The daemon reads them up to a NUL.
         if (!seen.emplace(part.package.c_str(), part.name.c_str()).second) {
             findings.error(place_of(part), "is given twice; the daemon takes the last one");
         }
@@ -93,7 +94,7 @@ void lint_parts(std::span<const part_content> parts, lint_findings& findings) {
     }
 }
 
-// The parts of a configuration file. What is wrong with the file itself is an error, too.
+// The parts of a configuration file; a fault of the file itself becomes an error.
 std::vector<part_content> read_config_file(const std::string& path, std::string_view bytes,
                                            lint_findings& findings) {
     const lint_place place = {path, 0, ""};
@@ -125,7 +126,7 @@ void lint_file(const std::string& path, lint_findings& findings) {
     findings.append(std::move(about_file));
 }
 
-// Parts that are to become one configuration.
+// Examines parts as one configuration.
 void lint_given(std::span<const part_content> parts, lint_findings& findings) {
     constexpr char path[] = "configuration";
     std::string bytes;

@@ -13,14 +13,13 @@
 
 namespace kivd {
 
-// Looks over a configuration file, of which `parts` have been read or made it. `path` is what
-// findings about the whole call it.
+// Examines a configuration file with these parts. Findings about the whole file call it `path`.
 void lint_config(std::string_view bytes, std::span<const part_content> parts,
                  const std::string& path, lint_findings& findings);
 
-// Looks over configuration files, and over the parts given as PACKAGE:NAME=FILE, which are to
-// become one. Findings go to `out`, a line each, and what cannot be read to `err`. Gives the exit
-// status: 1 when something could not be read or an error was found.
+// Examines configuration files, and the parts given as PACKAGE:NAME=FILE as one more of them.
+// Findings go to `out`, a line each, and what cannot be read to `err`. Returns the exit status: 1
+// when something could not be read or an error was found.
 [[nodiscard]] int run_config_lint(const std::vector<std::string>& arguments, std::ostream& out,
                                   std::ostream& err);
 

@@ -19,19 +19,6 @@ using problem_list = std::vector<std::string>;
 
 constexpr size_t longest_shown_text = 200;  // bytes
 
-// Whether people can read it: UTF-8 in lines.
-bool is_text(std::string_view bytes) {
-    while (!bytes.empty()) {
-        const size_t length = utf8_length(bytes);
-        if (length == 0) return false;
-        const std::string_view character = bytes.substr(0, length);
-        const bool is_plain = printable(character) == character || character == "\\";
-        if (!is_plain && character != "\n" && character != "\t") return false;
-        bytes.remove_prefix(length);
-    }
-    return true;
-}
-
 void print_part(const kiv::config::ConfigPart& part, std::ostream& out, problem_list& problems) {
     const std::string id = printable(part.package()) + " " + printable(part.name());
     const std::string& payload = part.payload();
@@ -46,7 +33,7 @@ void print_part(const kiv::config::ConfigPart& part, std::ostream& out, problem_
     }
 }
 
-// Whether the configuration would be taken by a daemon with this key.
+// Says whether a daemon with this key would accept the configuration.
 void print_verdict(const config_file& file, EVP_PKEY& key, std::ostream& out,
                    problem_list& problems) {
     if (!file.signature) {
@@ -92,7 +79,7 @@ int run_config_show(const std::string& path, const std::optional<std::string>& k
     } catch (const std::runtime_error& error) {
         problems.emplace_back(error.what());
     }
-    out.flush();  // what could be read stands before what went wrong
+    out.flush();  // so that faults come after what could be read
     for (const std::string& text : problems) {
         err << "kivtool: " << printable(path) << ": " << text << '\n';
     }

@@ -7,8 +7,8 @@
 
 namespace kivd {
 
-// Prints the file's checksum and parts to `out` and what is wrong with it to `err`. With the path
-// of a public key, checks the signature as well. Gives the exit status: 0 when all was well.
+// Prints the file's checksum and parts to `out` and its faults to `err`. Given the path of a public
+// key, checks the signature as well. Returns the exit status: 0 when all was well.
 [[nodiscard]] int run_config_show(const std::string& path,
                                   const std::optional<std::string>& key_path, std::ostream& out,
                                   std::ostream& err);

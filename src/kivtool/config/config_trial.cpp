@@ -1,5 +1,7 @@
 #include "kivtool/config/config_trial.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
@@ -25,12 +27,18 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// The daemon's modules as after its first start, in a directory that is the current one for as long
-// as they live.
+// In memory, if possible: a configuration may have 20,000 parts, each of which becomes a file.
+fs::path place_for_trials() {
+    const bool has_memory = getenv("TMPDIR") == nullptr && access("/dev/shm", W_OK) == 0;
+    return has_memory ? fs::path("/dev/shm") : fs::temp_directory_path();
+}
+
+// The daemon's modules as after a first start, in a new directory, which is the current one as long
+// as this lives.
 class trial_daemon {
  public:
     trial_daemon() : previous_(fs::current_path()) {
-        std::string name = fs::temp_directory_path() / "kivtool-XXXXXX";
+        std::string name = place_for_trials() / "kivtool-XXXXXX";
         if (mkdtemp(name.data()) == nullptr) {
             throw std::system_error(errno, std::generic_category(), name);
         }
@@ -50,29 +58,24 @@ class trial_daemon {
     trial_daemon(const trial_daemon&) = delete;
     trial_daemon& operator=(const trial_daemon&) = delete;
 
-    // Whether there was a filter of events.
-    [[nodiscard]] bool restart() {
-        release_modules();
-        return start_modules();
-    }
-
  private:
     fs::path previous_;
     fs::path own_;
 };
 
-// Takes a step of the daemon; whatever it complains of is an error.
+// Runs a step of the daemon; each of its complaints becomes an error.
 void judge(const lint_place& place, lint_findings& findings, auto step) {
     (void)take_log();
     step();
     for (const std::string& line : take_log()) {
         const bool is_complaint = !line.starts_with("I ");
-        if (!is_complaint || line.starts_with("E kivd-error: ")) continue;  // no daemon to be told
+        if (!is_complaint || line.starts_with("E kivd-error: "))
+            continue;  // there is no daemon to send errors to
         findings.error(place, "the daemon logs \"" + printable(line.substr(2)) + '"');
     }
 }
 
-// The one that counts, of parts with the same name; null when there is none.
+// The last part of that name, which is the one that counts; null when there is none.
 const part_content* find_own(std::span<const part_content> parts, std::string_view name) {
     const auto found = std::find_if(parts.rbegin(), parts.rend(), [name](const auto& part) {
         return part.package == daemon_package && part.name == name;
@@ -80,16 +83,15 @@ const part_content* find_own(std::span<const part_content> parts, std::string_vi
     return found == parts.rend() ? nullptr : &*found;
 }
 
-// Which of the parts a program could get.
-std::vector<bool> find_kept(std::span<const part_content> parts) {
-    std::vector<bool> kept;
-    for (const part_content& part : parts) {
-        kept.push_back(get_config_fd(part.package.c_str(), part.name.c_str()).ok());
-    }
-    return kept;
+// The first part that is not available to programs; null when all are.
+const part_content* find_lost(std::span<const part_content> parts) {
+    const auto lost = std::ranges::find_if(parts, [](const part_content& part) {
+        return !get_config_fd(part.package.c_str(), part.name.c_str()).ok();
+    });
+    return lost == parts.end() ? nullptr : &*lost;
 }
 
-// Which items of the filter stand for probes that are kept.
+// For each item of the filter, whether the probe of that name is kept.
 std::vector<bool> find_matches(const written_filter& filter) {
     std::vector<bool> matches;
     for (const auto& item : filter.filter.item()) {
@@ -105,29 +107,25 @@ void warn_of_nothing(const written_filter& filter, lint_findings& findings) {
     findings.warning(filter.place, std::string("the daemon keeps no ") + filter.things);
 }
 
-// The first difference, which stands for others; -1 for none.
+// -1 when there is none.
 int first_difference(const std::vector<bool>& before, const std::vector<bool>& after) {
     const auto [at, ignored] = std::ranges::mismatch(before, after);
     return at == before.end() ? -1 : static_cast<int>(at - before.begin());
 }
 
-void try_restart(trial_daemon& daemon, std::span<const part_content> parts,
-                 const std::vector<written_filter>& filters, const lint_place& whole,
-                 lint_findings& findings) {
-    const auto kept = find_kept(parts);
+void try_restart(std::span<const part_content> parts, const std::vector<written_filter>& filters,
+                 const lint_place& whole, lint_findings& findings) {
     std::vector<std::vector<bool>> matches;
     for (const written_filter& each : filters) matches.push_back(find_matches(each));
     bool has_event_filter = false;
-    judge(whole, findings, [&] { has_event_filter = daemon.restart(); });
+    judge(whole, findings, [&] {
+        release_modules();
+        has_event_filter = start_modules();
+    });
 
-    const auto still_kept = find_kept(parts);
-    for (size_t i = 0; i < parts.size(); ++i) {
-        if (!kept[i] || still_kept[i]) continue;
-        const part_content& part = parts[i];
-        findings.error({part.path, 0, id_of(part)},
-                       "the daemon's list of parts does not bring it through the next start, and "
-                       "perhaps others");
-        break;
+    if (const part_content* const lost = find_lost(parts)) {
+        findings.error({lost->path, 0, id_of(*lost)},
+                       "the daemon loses this part at its next start, and perhaps others");
     }
     for (size_t i = 0; i < filters.size(); ++i) {
         const int other = first_difference(matches[i], find_matches(filters[i]));
@@ -152,15 +150,12 @@ void try_config(std::string_view bytes, std::span<const part_content> parts,
         const part_content* const part = find_own(parts, name);
         return part ? lint_place{part->path, 0, id_of(*part)} : whole;
     };
-    trial_daemon daemon;
+    const trial_daemon daemon;
     bool is_stored = false;
     judge(whole, findings, [&] { is_stored = store_configuration(bytes_of(bytes)); });
     if (!is_stored) return;
     judge(place_of_own("Settings"), findings, apply_settings);
     judge(place_of_own("FilterConfig"), findings, apply_filter_config);
-    const part_content* const filter_part = find_own(parts, "FilterConfig");
-    const auto filters = filter_part ? filters_of(*filter_part) : std::vector<written_filter>();
-    for (const written_filter& each : filters) warn_of_nothing(each, findings);
     const bool was_disabled = fs::exists(paths::disable_marker);
     judge(place_of_own("RunActionsOnce"), findings, run_actions_once);
     if (was_disabled && !fs::exists(paths::disable_marker)) {
@@ -169,8 +164,11 @@ void try_config(std::string_view bytes, std::span<const part_content> parts,
                        "which also removes the mark of a disabled daemon; the daemon stops until "
                        "its next start only");
     }
-    fs::remove(paths::disable_marker);  // it would not start any more
-    try_restart(daemon, parts, filters, whole, findings);
+    fs::remove(paths::disable_marker);  // a disabled daemon would not start again
+    const part_content* const filter_part = find_own(parts, "FilterConfig");
+    const auto filters = filter_part ? filters_of(*filter_part) : std::vector<written_filter>();
+    for (const written_filter& each : filters) warn_of_nothing(each, findings);
+    try_restart(parts, filters, whole, findings);
 }
 
 }  // namespace kivd

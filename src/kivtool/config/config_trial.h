@@ -1,5 +1,5 @@
-// What the daemon does with a configuration, found out by its own modules, which take it in an
-// empty directory of their own.
+// Finds out what the daemon does with a configuration by letting its own modules take it, in an
+// empty directory.
 #pragma once
 
 #include <span>
@@ -12,9 +12,9 @@
 namespace kivd {
 
 // Has the daemon take the configuration file `bytes`, which holds `parts`, and start again. Finds
-// what it complains of, and what it has lost or answers otherwise after the start. No action that
-// starts something is run, and no signature checked. `path` is what findings about the whole call
-// the configuration. Throws when there is no directory to be had.
+// whatever it complains about, and what it has lost or decides differently after the start. Actions
+// that would start a program or the diagnostics are not run, and no signature is checked. Findings
+// about the whole file call it `path`. Throws when no directory can be made.
 void try_config(std::string_view bytes, std::span<const part_content> parts,
                 const std::string& path, lint_findings& findings);
 

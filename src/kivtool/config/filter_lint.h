@@ -16,19 +16,18 @@ namespace kivd {
 // One of the filters in a part kivd:FilterConfig.
 struct written_filter {
     filter_kind kind;
-    const char* things;  // that it is about
+    const char* things;  // it decides about
     kiv::config::Filter filter;
     lint_place place;
-    const google::protobuf::TextFormat::ParseInfoTree* places;  // of its items; null when unknown
+    const google::protobuf::TextFormat::ParseInfoTree* places;  // of its fields; null when unknown
 
     [[nodiscard]] lint_place place_of_item(int index) const;
 };
 
-// As far as the part can be decoded. They hold on to its places.
+// As far as the part can be decoded. `part` has to outlive them.
 [[nodiscard]] std::vector<written_filter> filters_of(const part_content& part);
 
-// Looks over a package or a name: `nobody` says what does not happen when it is empty or has a
-// blank.
+// Examines a package or a name. `nobody` says why an empty one, or one with a blank, is of no use.
 void lint_text(const lint_place& place, const char* what, const std::string& text,
                const char* nobody, lint_findings& findings);
 

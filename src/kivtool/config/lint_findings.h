@@ -1,4 +1,4 @@
-// What a look at a configuration has found.
+// Findings about a configuration.
 #pragma once
 
 #include <google/protobuf/descriptor.h>
@@ -14,10 +14,10 @@ namespace kivd {
 
 struct lint_finding {
     bool is_error;
-    std::string text;  // a line: where, error or warning, about what, and what the daemon does
+    std::string text;  // one line: place, error or warning, subject, what the daemon does
 };
 
-// Where something is: a file, a line in it counted from 1, what it is about. No line: 0.
+// A file, a line in it, counted from 1 (0: unknown), and what the finding is about.
 struct lint_place {
     std::string path;
     int line = 0;
@@ -43,7 +43,7 @@ class lint_findings {
 // "PACKAGE:NAME", printable.
 [[nodiscard]] std::string id_of(const part_content& part);
 
-// The line of a field, 0 when that is not known. `index` is that of a list, or -1.
+// The line of a field, 0 when unknown. `index` is the position in a list, -1 for any other field.
 [[nodiscard]] int line_of(const google::protobuf::TextFormat::ParseInfoTree* places,
                           const google::protobuf::FieldDescriptor& field, int index = -1);
 

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <iterator>
 #include <memory>
+#include <sstream>
 #include <vector>
 
 #include "config.pb.h"
@@ -34,12 +35,12 @@ constexpr daemon_part all_daemon_parts[] = {
     {"RunActionsOnce", type_of<RunActionsOnce>},
 };
 
-// Both count from 0, as protobuf does.
+// `line` and `column` count from 0, as in protobuf.
 std::string located(int line, int column, const std::string& reason) {
     return std::to_string(line + 1) + ":" + std::to_string(column + 1) + ": " + printable(reason);
 }
 
-// Keeps the first error: those behind it are often its consequences.
+// Keeps the first error: later ones often follow from it.
 class first_error : public protobuf::io::ErrorCollector {
  public:
     void AddError(int line, protobuf::io::ColumnNumber column,
@@ -50,46 +51,28 @@ class first_error : public protobuf::io::ErrorCollector {
     std::string text;
 };
 
-// The name of the first required field that is absent in `message` itself; empty when all are
-// there.
-std::string absent_field(const Message& message) {
-    for (int i = 0; i < message.GetDescriptor()->field_count(); ++i) {
-        const FieldDescriptor* field = message.GetDescriptor()->field(i);
-        if (field->is_required() && !message.GetReflection()->HasField(message, field)) {
-            return field->name();
+// Says where the first required field is missing; empty when `message` is complete. An element of a
+// list in brackets is located at the list.
+std::string find_absent_field(const Message& message, const TextFormat::ParseInfoTree* places) {
+    std::vector<std::string> absent;
+    message.FindInitializationErrors(&absent);
+    if (absent.empty()) return "";
+    const protobuf::Descriptor* type = message.GetDescriptor();
+    TextFormat::ParseLocation location(0, 0);
+    std::istringstream path(absent.front());  // such as "event_filter.item[1].name"
+    std::string step;
+    while (std::getline(path, step, '.') && !path.eof()) {
+        const size_t bracket = step.find('[');
+        const FieldDescriptor* field = type->FindFieldByName(step.substr(0, bracket));
+        const int index = bracket == std::string::npos ? -1 : std::stoi(step.substr(bracket + 1));
+        if (places) {
+            const auto inner = places->GetLocation(field, index);
+            if (inner.line >= 0) location = inner;
+            places = places->GetTreeForNested(field, index);
         }
+        type = field->message_type();
     }
-    return "";
-}
-
-// Finds the first message in `message` that is not complete. `locations` says where each was read,
-// but of messages in a list in brackets only where the list is; `start` is where `message` was.
-std::string find_incomplete(const Message& message, const TextFormat::ParseInfoTree* locations,
-                            TextFormat::ParseLocation start) {
-    const std::string absent = absent_field(message);
-    if (!absent.empty()) {
-        return located(start.line, start.column,
-                       message.GetTypeName() + " lacks \"" + absent + "\"");
-    }
-    const auto* reflection = message.GetReflection();
-    std::vector<const FieldDescriptor*> fields;
-    reflection->ListFields(message, &fields);
-    for (const FieldDescriptor* field : fields) {
-        if (field->cpp_type() != FieldDescriptor::CPPTYPE_MESSAGE) continue;
-        const int size = field->is_repeated() ? reflection->FieldSize(message, field) : 1;
-        for (int i = 0; i < size; ++i) {
-            const int index = field->is_repeated() ? i : -1;  // as the tree wants it
-            const Message& inner = field->is_repeated()
-                                       ? reflection->GetRepeatedMessage(message, field, i)
-                                       : reflection->GetMessage(message, field);
-            if (inner.IsInitialized()) continue;
-            if (!locations) return find_incomplete(inner, nullptr, start);
-            const auto location = locations->GetLocation(field, index);
-            return find_incomplete(inner, locations->GetTreeForNested(field, index),
-                                   location.line < 0 ? start : location);
-        }
-    }
-    return "";
+    return located(location.line, location.column, type->full_name() + " lacks \"" + step + "\"");
 }
 
 }  // namespace
@@ -109,10 +92,10 @@ std::string encode_part(const Message& type, const std::string& text, std::strin
     TextFormat::Parser parser;
     parser.RecordErrorsTo(&error);
     parser.WriteLocationsTo(&places);
-    parser.AllowPartialMessage(true);  // the parser itself cannot say where a field is missing
+    parser.AllowPartialMessage(true);  // the parser could not say where a field is missing
     if (!parser.ParseFromString(text, message.get())) return error.text;
     payload = message->SerializePartialAsString();
-    return find_incomplete(*message, &places, {0, 0});
+    return find_absent_field(*message, &places);
 }
 
 std::string decode_part(const Message& type, const std::string& payload, std::string& text) {

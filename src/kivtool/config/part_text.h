@@ -1,4 +1,4 @@
-// The parts of a configuration that the daemon reads itself, as protobuf text.
+// The parts of a configuration that are for the daemon itself, as protobuf text.
 #pragma once
 
 #include <google/protobuf/message.h>
@@ -18,18 +18,18 @@ struct daemon_part {
 };
 [[nodiscard]] std::span<const daemon_part> daemon_parts();
 
-// An empty message of the type that the part holds; null when the part is for others.
+// An empty message of the part's type; null when the part is not for the daemon.
 [[nodiscard]] const google::protobuf::Message* daemon_part_type(std::string_view package,
                                                                 std::string_view name);
 
-// Encodes `text`; `places` gets where its fields are. Gives what is wrong as "LINE:COLUMN: reason",
-// both counted from 1, empty when `payload` has been made.
+// Encodes `text`; `places` tells where its fields are. Returns its first fault as
+// "LINE:COLUMN: reason", both counted from 1; empty when it has none.
 [[nodiscard]] std::string encode_part(const google::protobuf::Message& type,
                                       const std::string& text, std::string& payload,
                                       google::protobuf::TextFormat::ParseInfoTree& places);
 
-// The other way; every line of `text` is indented. Gives what is wrong as the end of a sentence
-// about the part, empty when all is well; `text` then holds what could be read.
+// Decodes `payload` to indented lines, as far as possible. Returns what is wrong as the end of a
+// sentence about the part; empty when nothing is.
 [[nodiscard]] std::string decode_part(const google::protobuf::Message& type,
                                       const std::string& payload, std::string& text);
 

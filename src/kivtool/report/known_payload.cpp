@@ -40,16 +40,20 @@ const auto* find_kind(const kiv::Event& event) {
 
 bool is_of_known_kind(const kiv::Event& event) { return find_kind(event) != std::end(known_kinds); }
 
+std::string one_line(const Message& message) {
+    google::protobuf::TextFormat::Printer printer;
+    printer.SetSingleLineMode(true);
+    std::string text;
+    (void)printer.PrintToString(message, &text);
+    return text;
+}
+
 std::string known_payload_text(const kiv::Event& event) {
     const auto* const kind = find_kind(event);
     if (kind == std::end(known_kinds)) return "";
     const std::unique_ptr<Message> message(kind->message().New());
     if (!message->ParseFromString(event.payload())) return "";
-    google::protobuf::TextFormat::Printer printer;
-    printer.SetSingleLineMode(true);
-    std::string fields;
-    if (!printer.PrintToString(*message, &fields)) return "";
-    return message->GetTypeName() + " { " + fields + "}";
+    return message->GetTypeName() + " { " + one_line(*message) + "}";
 }
 
 }  // namespace kivd

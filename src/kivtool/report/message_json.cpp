@@ -19,14 +19,14 @@ using google::protobuf::Reflection;
 constexpr int no_list = -1;
 
 std::string base64(const std::string& bytes) {
-    std::string text((bytes.size() + 2) / 3 * 4 + 1, '\0');  // with a NUL
+    std::string text((bytes.size() + 2) / 3 * 4 + 1, '\0');  // with its NUL
     const int size = EVP_EncodeBlock(reinterpret_cast<uint8_t*>(text.data()),
                                      bytes_of(bytes).data(), static_cast<int>(bytes.size()));
     text.resize(static_cast<size_t>(size));
     return text;
 }
 
-// The value of a field, or the one at `index` of a list.
+// The value of a field, or of the element at `index` of a repeated one.
 json value_of(const Message& message, const FieldDescriptor& field, int index) {
     const Reflection& all = *message.GetReflection();
     const auto get = [&](auto of_field, auto of_list) -> decltype(auto) {

@@ -8,7 +8,7 @@
 
 namespace kivd {
 
-// The value of a field that is no list.
+// The value of a field that is not repeated.
 [[nodiscard]] json field_json(const google::protobuf::Message& message,
                               const google::protobuf::FieldDescriptor& field);
 

@@ -1,4 +1,4 @@
-// Something kept for each probe of reports, in bounded memory whatever the reports hold.
+// Keeps a value for each probe in reports. Takes bounded memory, whatever the reports hold.
 #pragma once
 
 #include <cstddef>
@@ -12,12 +12,12 @@
 namespace kivd {
 
 inline constexpr size_t max_table_probes = 50'000;
-inline constexpr size_t max_table_text = size_t{8} << 20;  // bytes of packages and names
+inline constexpr size_t max_table_text = size_t{8} << 20;  // bytes, of packages and names
 
 template <class value>
 class probe_table {
  public:
-    // What is kept for the probe, perhaps new; null when there is no room for another probe.
+    // The value of the probe, a new one if need be; null when there is no room for another probe.
     value* find_or_add(std::string_view package, std::string_view name) {
         const auto package_size = static_cast<uint32_t>(package.size());
         key_.assign(reinterpret_cast<const char*>(&package_size), sizeof package_size);
@@ -34,7 +34,7 @@ class probe_table {
 
     [[nodiscard]] size_t size() const { return entries_.size(); }
 
-    // Calls `function` with package, name and what is kept, in no order.
+    // Calls `function` with package, name and value, in no particular order.
     void for_each(auto function) const {
         for (const auto& [key, kept] : entries_) {
             uint32_t package_size = 0;
@@ -47,7 +47,7 @@ class probe_table {
  private:
     std::unordered_map<std::string, value> entries_;
     size_t text_size_ = 0;
-    std::string key_;  // the last one looked for
+    std::string key_;  // of the last lookup; avoids allocating
 };
 
 }  // namespace kivd

@@ -1,4 +1,4 @@
-// A line on a terminal that says how far a long job is, and goes away when something else is
+// A line on a terminal that shows the progress of a long job, and is erased before anything else is
 // written.
 #pragma once
 
@@ -11,13 +11,13 @@ namespace kivd {
 
 class progress_line {
  public:
-    // Null: there is no terminal, nothing is shown.
+    // Null shows nothing.
     explicit progress_line(std::ostream* terminal) : terminal_(terminal) {}
     ~progress_line() { clear(); }
     progress_line(const progress_line&) = delete;
     progress_line& operator=(const progress_line&) = delete;
 
-    // Shows the line, but not each time: it is for calling often.
+    // May be called often: it updates the line only now and then.
     void show(size_t files_done, size_t files, uint64_t records);
     void clear();
 

@@ -32,7 +32,7 @@ std::unique_ptr<report_view> make_view(const report_options& options, std::ostre
     return nullptr;
 }
 
-// Shows files one after the other and keeps what was wrong.
+// Shows one file after the other and remembers whether something was wrong.
 class report_shower {
  public:
     report_shower(report_view& view, EVP_PKEY* key, const report_options& options,
@@ -65,7 +65,7 @@ class report_shower {
     void tell(const std::string& path, const std::string& problem) {
         if (problem.empty()) return;
         progress_.clear();
-        out_.flush();  // what could be read stands before what went wrong
+        out_.flush();  // so that faults come after what could be read
         err_ << "kivtool: " << printable(path) << ": " << problem << '\n';
         status_ = 1;
     }
@@ -81,7 +81,7 @@ class report_shower {
             is_started = true;
             view_.add(*record);
             progress_.show(files_done_, files_, ++records_);
-            if (!out_) return "";  // the rest would be lost too
+            if (!out_) return "";  // the rest could not be written either
         }
         if (!is_started) return reader.problem();
         progress_.clear();

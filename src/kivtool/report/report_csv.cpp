@@ -1,10 +1,9 @@
 #include "kivtool/report/report_csv.h"
 
-#include <google/protobuf/text_format.h>
-
 #include <cstdio>
 #include <string>
 
+#include "kivtool/report/known_payload.h"
 #include "kivtool/report/report_json.h"
 #include "kivtool/report/time_text.h"
 #include "toolkit/text_escape.h"
@@ -33,10 +32,7 @@ std::string quoted(std::string_view text) {
 }
 
 std::string message_text(const google::protobuf::Message& message) {
-    google::protobuf::TextFormat::Printer printer;
-    printer.SetSingleLineMode(true);
-    std::string text;
-    (void)printer.PrintToString(message, &text);
+    std::string text = one_line(message);
     while (text.ends_with(' ')) text.pop_back();
     return text;
 }

@@ -25,8 +25,8 @@ json record_json(const report_record& record) {
 }
 
 // The daemon writes a header, then events, then counters, then static data, so each list can be
-// written while its records come. A record of a list that has already been closed is not shown, and
-// that is told: to show it, everything behind would have to be kept somewhere until the end.
+// written as its records arrive. A record that belongs to a list already closed is left out, and an
+// error says so: showing it would mean keeping everything else on disk until the end.
 class json_view : public report_view {
  public:
     explicit json_view(std::ostream& out) : out_(out) {}

@@ -8,15 +8,15 @@
 
 namespace kivd {
 
-// One document for each file, a record a line, in the order of the file. Each field of a report has
-// one place in it: what comes again behind other fields is left out, which finish_file() tells.
+// One document for each file, one record per line, in the order of the file. A field of a report
+// that comes again after other fields is left out, and finish_file() says so.
 [[nodiscard]] std::unique_ptr<report_view> make_json_view(std::ostream& out);
 
-// One object for each record, in a line: "file", "kind" (as record_kind has it), and the record's
-// own fields.
+// One object for each record, on one line: "file", "kind" (see record_kind), and the record's own
+// fields.
 [[nodiscard]] std::unique_ptr<report_view> make_json_lines_view(std::ostream& out);
 
-// What a record is called: header, event, counter, static; else its field in the schema.
+// header, event, counter or static; for any other record, the name of its field in the schema.
 [[nodiscard]] const char* record_kind(const report_record& record);
 
 }  // namespace kivd

@@ -7,11 +7,11 @@
 
 namespace kivd {
 
-// A file, or the reports kiv_N of a directory, in the order of their numbers. They are named one by
-// one, since there may be a great many.
+// A file, or the reports of a directory in the order of their numbers. Paths are made on demand,
+// since there may be very many.
 class report_paths {
  public:
-    // A directory that cannot be read, or has no reports in it, leaves a problem.
+    // A directory that cannot be read, or that holds no reports, is a problem.
     explicit report_paths(const std::string& path);
 
     [[nodiscard]] size_t size() const { return is_directory_ ? numbers_.size() : 1; }

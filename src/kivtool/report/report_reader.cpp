@@ -20,13 +20,13 @@ using google::protobuf::Message;
 using google::protobuf::MessageFactory;
 
 constexpr unsigned wire_type_length_delimited = 2;
-constexpr int key_bytes = 0x80;  // a key of one byte is below
+constexpr int key_bytes = 0x80;  // keys of one byte are below
 
 bool is_message(const FieldDescriptor& field) {
     return field.type() == FieldDescriptor::TYPE_MESSAGE;
 }
 
-// The field whose records start with `key`, null when there is none.
+// The field whose records start with `key`; null when there is none.
 const FieldDescriptor* find_field(uint8_t key) {
     static const auto fields = [] {
         std::array<const FieldDescriptor*, key_bytes> found{};
@@ -44,7 +44,7 @@ bool is_part_of_seal(const FieldDescriptor& field) {
            field.number() == kiv::Report::kEncryptedCompressedDataFieldNumber;
 }
 
-// Whether the record is a part of a seal; such a one is put there.
+// Whether the record is part of a seal; if so, puts it into `seal`.
 bool take_seal(const report_record& record, std::string_view content, kiv::Report& seal) {
     if (!is_part_of_seal(*record.field)) return false;
     seal.GetReflection()->SetString(&seal, record.field, std::string(content));
@@ -53,13 +53,13 @@ bool take_seal(const report_record& record, std::string_view content, kiv::Repor
 
 }  // namespace
 
-// The bytes of a file, or of what was sealed in one, cut into records.
+// Cuts the bytes of a file, or of sealed data, into records.
 class report_layer {
  public:
     explicit report_layer(const std::string& path) : bytes_(path) {}
     report_layer(std::string_view content, const char* place) : bytes_(content, place) {}
 
-    // Finds the next record; gives the size of its key and length. 0 is the end, or a problem.
+    // Finds the next record. Returns the size of its key and length; 0 at the end and on a problem.
     size_t frame(const reading_limits& limits, report_record& record) {
         const std::string_view start = ahead(1 + max_varint32_size);
         if (start.empty()) return stop(bytes_.problem());
@@ -92,13 +92,13 @@ class report_layer {
         return head_size;
     }
 
-    // Steps behind a record; its bytes are there until the next one is looked for.
+    // Steps over a record; its bytes stay valid until the next one is looked for.
     void take(size_t size) {
         start_ += size;
         offset_ += size;
     }
 
-    // What follows: fewer than `size` bytes at the end of the data.
+    // The next `size` bytes; fewer at the end of the data.
     std::string_view ahead(size_t size) {
         while (data_.size() - start_ < size) {
             data_.erase(0, start_);
@@ -134,7 +134,7 @@ class report_layer {
         return stop(text);
     }
 
-    // Where the data ends within a record, what ended the data is the reason.
+    // When the data ends within a record, the reason is whatever ended the data.
     size_t stop_cut(const std::string& reason) {
         return stop(bytes_.problem().empty() ? reason : bytes_.problem());
     }
@@ -185,12 +185,12 @@ bool report_reader::decode(size_t head_size) {
     return false;
 }
 
-// Whether the record is a header and what follows it is a seal.
+// Whether the record is a header and a seal follows it.
 bool report_reader::stands_before_seal() {
     if (record_.field->number() != kiv::Report::kHeaderFieldNumber) return false;
     const size_t size = record_.bytes.size();
     const std::string_view both = layer_->ahead(size + 1);
-    record_.bytes = both.substr(0, size);  // it may have been moved
+    record_.bytes = both.substr(0, size);  // ahead() may have moved it
     if (both.size() == size) return false;
     const FieldDescriptor* next = find_field(static_cast<uint8_t>(both[size]));
     return next && is_part_of_seal(*next);
@@ -206,7 +206,7 @@ void report_reader::end_layer() {
     if (problem_.empty()) problem_ = std::exchange(seal_problem_, "");
 }
 
-// Goes on with what is sealed; false when that is not possible.
+// Goes on with the sealed data. False when that is not possible.
 bool report_reader::open_seal() {
     std::string reason;
     if (in_seal_) {

@@ -1,6 +1,5 @@
-// Reading a report file record by record, so that a file of any size takes little memory and what
-// is wrong with it can be said and located. A record is one field of kiv.Report: a key byte, the
-// length, the content.
+// Reads a report file record by record, so that a file of any size takes little memory and faults
+// can be located. A record is one field of kiv.Report: a key byte, the length, the content.
 #pragma once
 
 #include <google/protobuf/message.h>
@@ -17,12 +16,11 @@
 
 namespace kivd {
 
-// How much of a file is taken in before reading stops, since a small gzip file can stand for any
-// amount of data.
+// Where reading stops, since a small gzip file can expand to any amount of data.
 struct reading_limits {
     uint64_t data_size = uint64_t{1} << 30;  // bytes, decompressed
     size_t message_size = size_t{1} << 20;   // bytes of a record that is a message
-    size_t bytes_size = size_t{256} << 20;   // and of one that is not, such as ciphertext
+    size_t bytes_size = size_t{256} << 20;   // of any other record, such as ciphertext
 };
 
 struct report_record {
@@ -31,7 +29,7 @@ struct report_record {
     std::string_view bytes;                          // the whole record
 };
 
-// The message of a record whose field is known to hold such.
+// The message of a record whose type is known.
 template <class message>
 const message& get(const report_record& record) {
     return static_cast<const message&>(*record.message);
@@ -41,25 +39,27 @@ class report_layer;
 
 class report_reader {
  public:
-    // `key` opens sealed reports; null: they stay closed.
+    // `key` opens sealed reports; without one they stay closed.
     report_reader(const std::string& path, EVP_PKEY* key, const reading_limits& limits = {});
     ~report_reader();
     report_reader(const report_reader&) = delete;
     report_reader& operator=(const report_reader&) = delete;
 
-    // The next whole record, null at the end. It is there until the next call. Those of a sealed
-    // report are what was sealed; the empty header before the seal is left out.
+    // The next complete record, null at the end; valid until the next call. A sealed report gives
+    // the records that were sealed, without the empty header in front of the seal.
     [[nodiscard]] const report_record* next();
 
-    // At the end: why there was no more, as the end of a sentence; empty at a good end.
+    // At the end: why there is no more, as the end of a sentence; empty at a good end.
     [[nodiscard]] const std::string& problem() const { return problem_; }
-    // What follows is about the sealed data in a report that was opened.
+    // For a report that was opened, the following describe the sealed data.
     [[nodiscard]] bool is_gzip() const { return is_gzip_; }
-    [[nodiscard]] uint64_t file_size() const { return file_size_; }  // bytes that were used
-    [[nodiscard]] uint64_t data_size() const { return data_size_; }  // bytes of all whole records
+    [[nodiscard]] uint64_t file_size() const { return file_size_; }  // bytes read
+    [[nodiscard]] uint64_t data_size() const {
+        return data_size_;
+    }  // bytes of all complete records
 
  private:
-    static constexpr int fields = 16;  // what a key byte has room for
+    static constexpr int fields = 16;  // fits into a key byte
 
     bool decode(size_t head_size);
     bool stands_before_seal();
@@ -69,7 +69,8 @@ class report_reader {
     reading_limits limits_;
     EVP_PKEY* key_;
     std::unique_ptr<report_layer> layer_;
-    std::array<std::unique_ptr<google::protobuf::Message>, fields> messages_;  // used again
+    std::array<std::unique_ptr<google::protobuf::Message>, fields>
+        messages_;  // reused for each record
     report_record record_{};
     kiv::Report seal_;     // what is needed to open it, as far as it has been read
     std::string content_;  // of the seal that was opened

@@ -60,7 +60,7 @@ std::string offset_text(int32_t seconds) {
 }
 
 std::string duration_text(int64_t first_ms, int64_t last_ms) {
-    // Unsigned, since two hostile times can be further apart than a signed number holds.
+    // Unsigned, since forged times may be too far apart for a signed number.
     const uint64_t seconds =
         (static_cast<uint64_t>(last_ms) - static_cast<uint64_t>(first_ms)) / 1000;
     if (seconds < 60) return std::to_string(seconds) + " s";
@@ -71,7 +71,7 @@ std::string duration_text(int64_t first_ms, int64_t last_ms) {
     return std::to_string(seconds / 86400) + " d " + std::to_string(seconds / 3600 % 24) + " h";
 }
 
-// A line of what is known about the sender; nothing when it is not known.
+// One line; nothing when `text` is empty.
 void print_fact(std::ostream& out, const char* what, const std::string& text) {
     if (text.empty()) return;
     out << "  " << std::left << std::setw(15) << what << text << '\n';
@@ -116,7 +116,7 @@ void print_contents(std::ostream& out, const report_tally& tally) {
     }
 }
 
-// "events (10 of 14)", as the head of a list that shows `shown`.
+// The heading of a list that shows `shown` entries: "events (10 of 14)".
 void print_head(std::ostream& out, const char* what, size_t shown, size_t all) {
     out << "\n  " << what;
     if (shown < all) out << " (" << shown << " of " << all << ")";

@@ -8,9 +8,9 @@
 
 namespace kivd {
 
-// For each file, who the report is from, the time it spans, what is in it; then the same for all of
-// them together, when there are several: counters and static data with the latest value that any of
-// them has. Text from the reports is made fit for a terminal and cut; times are UTC.
+// For each file, who the report is from, the time it spans and what is in it. Several files are
+// followed by the same for all of them together, with the latest value of each counter and static
+// value. Text from reports is escaped for a terminal and cut; times are UTC.
 [[nodiscard]] std::unique_ptr<report_view> make_summary_view(std::ostream& out);
 
 }  // namespace kivd

@@ -9,7 +9,7 @@
 namespace kivd {
 namespace {
 constexpr size_t shown_value = 60;    // characters
-constexpr size_t kept_messages = 40;  // some more than are shown: not all of them decode
+constexpr size_t kept_messages = 40;  // more than are shown, since some may not decode
 }  // namespace
 
 void time_span::add(int64_t time) {

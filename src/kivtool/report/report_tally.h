@@ -1,4 +1,4 @@
-// What a summary tells of reports, gathered while they are read. Takes bounded memory.
+// Gathers what a summary says about reports while they are read. Takes bounded memory.
 #pragma once
 
 #include <cstddef>
@@ -30,7 +30,7 @@ struct event_tally {
     void add(const event_tally& other);
 };
 
-// Of these, the later one stays.
+// add() keeps the later of the two.
 struct latest_counter {
     int64_t value = 0;
     int64_t time = std::numeric_limits<int64_t>::min();
@@ -48,7 +48,7 @@ struct latest_static {
 
 struct report_tally {
     void add(const report_record& record);
-    // What another report holds, which is the later one.
+    // Adds the content of another report, a later one.
     void add(const report_tally& other);
 
     bool has_header = false;
@@ -59,7 +59,7 @@ struct report_tally {
     uint64_t events = 0;
     uint64_t counters = 0;
     uint64_t statics = 0;
-    uint64_t unlisted = 0;  // records of probes that the tables have no room for
+    uint64_t unlisted = 0;  // records whose probe found no room in the tables
     probe_table<event_tally> by_event;
     probe_table<latest_counter> by_counter;
     probe_table<latest_static> by_static;
@@ -69,7 +69,7 @@ struct report_tally {
     void add(const kiv::Event& event);
     void add(const kiv::Counter& counter);
     void add(const kiv::StaticData& item);
-    // `records` are lost to the table when it has no room for another probe.
+    // Counts `records` as unlisted when the table has no room for another probe.
     template <class value>
     void add(probe_table<value>& table, std::string_view package, std::string_view name,
              const value& its, uint64_t records = 1);

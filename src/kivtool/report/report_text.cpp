@@ -12,7 +12,7 @@ namespace {
 
 namespace protobuf = google::protobuf;
 
-// An event, and what its payload is when that is known.
+// Prints an event, and its payload if the message is known.
 class event_printer : public protobuf::TextFormat::MessagePrinter {
  public:
     void Print(const protobuf::Message& message, bool /*single_line_mode*/,
@@ -30,7 +30,7 @@ class text_view : public report_view {
     explicit text_view(std::ostream& out) : out_(out) {
         auto for_events = std::make_unique<event_printer>();
         if (printer_.RegisterMessagePrinter(kiv::Event::descriptor(), for_events.get())) {
-            (void)for_events.release();  // the printer's now
+            (void)for_events.release();  // now owned by the printer
         }
     }
 

@@ -8,9 +8,8 @@
 
 namespace kivd {
 
-// Protobuf's text format behind a comment line that names the file, so that the whole can be
-// encoded again. Behind the fields of an event whose payload is a known message, a comment line
-// shows that.
+// Protobuf's text format, which can be encoded again. A comment line in front names the file; after
+// the fields of an event whose payload is a known message, another one shows that message.
 [[nodiscard]] std::unique_ptr<report_view> make_text_view(std::ostream& out);
 
 }  // namespace kivd

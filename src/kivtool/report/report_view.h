@@ -7,7 +7,7 @@
 
 namespace kivd {
 
-// Takes the records of one file after the other, and shows them while they come or at the end.
+// Takes the records of one file after the other, and shows them at once or at the end.
 class report_view {
  public:
     report_view() = default;
@@ -15,12 +15,12 @@ class report_view {
     report_view(const report_view&) = delete;
     report_view& operator=(const report_view&) = delete;
 
-    // A file whose first record is about to come; one without records is not told of.
+    // Comes before the first record of a file; not for files without records.
     virtual void start_file(const std::string& path) = 0;
     virtual void add(const report_record& record) = 0;
-    // The end of it. Gives what could not be shown, as the end of a sentence, or nothing.
+    // Comes at its end. Returns what could not be shown, as the end of a sentence.
     virtual std::string finish_file(const report_reader& file) = 0;
-    // The end of all files.
+    // Comes after all files.
     virtual void finish() {}
 };
 

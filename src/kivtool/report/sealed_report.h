@@ -1,4 +1,4 @@
-// Reports that are encrypted for their collectors: AES-128-CBC under a key of their own, which is
+// Opens reports that are encrypted for their collectors: AES-128-CBC with a random key, which is
 // encrypted with the collectors' RSA key.
 #pragma once
 
@@ -13,9 +13,9 @@ namespace kivd {
 // Whether the report's content is encrypted.
 [[nodiscard]] bool is_sealed(const kiv::Report& report);
 
-// Decrypts what the report holds into `content`, the gzip file that it was before. Gives why that
-// cannot be done as the end of a sentence, empty when it is done. There is no proof that nobody
-// changed the content, but that it is gzip data.
+// Decrypts the report into `content`, the gzip file that was sealed. Returns why that is not
+// possible as the end of a sentence; empty on success. The content is not authenticated: that it is
+// gzip data is the only check.
 [[nodiscard]] std::string open_sealed(const kiv::Report& report, EVP_PKEY& private_key,
                                       std::string& content);
 

@@ -1,4 +1,4 @@
-// Times in reports as people read them, in UTC.
+// Times in reports for people, in UTC.
 #pragma once
 
 #include <cstdint>
@@ -6,7 +6,7 @@
 
 namespace kivd {
 
-// `format` is that of strftime. A time before 1970 or behind the year 9999 is "N ms".
+// `format` is that of strftime. A time before 1970 or after 9999 becomes "N ms".
 [[nodiscard]] std::string time_text(int64_t ms, const char* format = "%Y-%m-%d %H:%M:%S");
 
 }  // namespace kivd
