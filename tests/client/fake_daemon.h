@@ -43,7 +43,7 @@ struct control_answer {
         const size_t size = descriptors.size() * sizeof(int);
         msghdr message = {nullptr, 0, &part, 1, control, size > 0 ? CMSG_SPACE(size) : 0, 0};
         *reinterpret_cast<cmsghdr*>(control) = {CMSG_LEN(size), SOL_SOCKET, SCM_RIGHTS};
-        memcpy(CMSG_DATA(reinterpret_cast<cmsghdr*>(control)), descriptors.data(), size);
+        if (size > 0) memcpy(control + CMSG_LEN(0), descriptors.data(), size);
         (void)sendmsg(fd, &message, MSG_NOSIGNAL);
     }
 
