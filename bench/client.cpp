@@ -98,15 +98,15 @@ double slowest_call(kiv_handle* kiv, unsigned calls) {
 
 void measure_stopped_daemon(const setup& s) {
     const scratch_directory directory(s.scratch);
-    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
+    daemon_process daemon = start_daemon(s, directory.path(), compression::off);
     (void)ask(connect_control(directory.path()).get(), "IA");
     kiv_handle* const kiv = kiv_create_from_path(directory.path().c_str());
     if (kiv == nullptr) give_up("no handle");
-    if (kill(daemon.process.pid(), SIGSTOP) != 0) give_up("cannot stop the daemon");
+    if (kill(daemon.pid(), SIGSTOP) != 0) give_up("cannot stop the daemon");
     std::vector<double> slowest_us;
     for (unsigned i = 0; i < amount(s, 25, 7); ++i) slowest_us.push_back(slowest_call(kiv, 2000));
-    (void)kill(daemon.process.pid(), SIGCONT);
-    (void)daemon.process.stop();
+    (void)kill(daemon.pid(), SIGCONT);
+    stop(daemon);
     kiv_destroy(kiv);
     print_row("slowest of 2000 calls, daemon stopped", slowest_us, "us", {bound::at_most, 1000});
 }
@@ -114,7 +114,7 @@ void measure_stopped_daemon(const setup& s) {
 // Events that the daemon takes from threads that share a handle and wait for room.
 void measure_threads(const setup& s) {
     const scratch_directory directory(s.scratch);
-    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
+    daemon_process daemon = start_daemon(s, directory.path(), compression::off);
     (void)ask(connect_control(directory.path()).get(), "IA");
     kiv_handle* const kiv = kiv_create_from_path(directory.path().c_str());
     if (kiv == nullptr) give_up("no handle");
@@ -141,7 +141,7 @@ void measure_threads(const setup& s) {
         eight.push_back(rate_with(thread_count));
     }
     if (kiv_dropped(kiv) != 0) give_up("events were dropped");
-    (void)daemon.process.stop();
+    stop(daemon);
     kiv_destroy(kiv);
     print_row("events a second, 1 thread", one, "");
     print_row("events a second, 8 threads, one handle", eight, "");

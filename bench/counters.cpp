@@ -60,10 +60,9 @@ double bare_round(const setup& s, unsigned datagrams) {
 
 double daemon_round(const setup& s, unsigned counters, unsigned datagrams) {
     const scratch_directory directory(s.scratch);
-    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
-    const double result =
-        cpu_per_datagram(daemon.process.pid(), directory.path(), counters, datagrams);
-    (void)daemon.process.stop();
+    daemon_process daemon = start_daemon(s, directory.path(), compression::off);
+    const double result = cpu_per_datagram(daemon.pid(), directory.path(), counters, datagrams);
+    stop(daemon);
     return result;
 }
 
@@ -140,8 +139,8 @@ void measure_memory(const setup& s) {
     std::vector<double> bytes;
     for (unsigned i = 0; i < amount(s, 3, 1); ++i) {
         const scratch_directory directory(s.scratch);
-        running_daemon daemon = start_daemon(s, directory.path(), compression::off);
-        const pid_t pid = daemon.process.pid();
+        daemon_process daemon = start_daemon(s, directory.path(), compression::off);
+        const pid_t pid = daemon.pid();
         // The first ones bring in whatever a packet needs, however many counters there are.
         for (unsigned n = 0; n < few; ++n) touch_counters(directory.path(), 1);
         (void)usleep(settle_us);
@@ -149,7 +148,7 @@ void measure_memory(const setup& s) {
         touch_counters(directory.path(), most);
         (void)usleep(settle_us);
         bytes.push_back(static_cast<double>(private_dirty_bytes(pid) - before) / (most - 1));
-        (void)daemon.process.stop();
+        stop(daemon);
     }
     print_row("memory a counter", bytes, "bytes", {bound::at_most, 110});
 }

@@ -17,26 +17,13 @@ namespace {
 
 constexpr int watch_interval_ms = 20;
 
-// Replaces the process by the daemon.
-void run_daemon(const setup& s, const std::string& directory, compression compress,
-                const std::string& key_directory) {
-    send_output_nowhere();
-    std::vector<const char*> words = {
-        s.kivd.c_str(), "-D", "-C", "-c", key_directory.c_str(), "-b", directory.c_str()};
-    if (compress == compression::off) words.push_back("-Z");
-    words.push_back(nullptr);
-    (void)execv(s.kivd.c_str(), const_cast<char* const*>(words.data()));
-    _exit(127);
-}
-
 }  // namespace
 
-running_daemon start_daemon(const setup& s, const std::string& directory, compression compress,
+daemon_process start_daemon(const setup& s, const std::string& directory, compression compress,
                             const std::string& key_directory) {
-    running_daemon daemon;
-    daemon.started_ns = now_ns();
-    daemon.process = fork_child([&] { run_daemon(s, directory, compress, key_directory); });
-    return daemon;
+    start_options options = {{"-D", "-C", "-c", key_directory, "-b", directory}};
+    if (compress == compression::off) options.arguments.emplace_back("-Z");
+    return {s.kivd, options};
 }
 
 void touch_counters(const std::string& directory, unsigned count) {

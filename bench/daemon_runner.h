@@ -24,16 +24,10 @@ struct setup {
 
 enum class compression : bool { off, on };
 
-struct running_daemon {
-    child_process process;
-    int64_t started_ns = 0;  // on the clock of now_ns
-};
-
 // Starts the daemon on `directory`, not detached, collecting, with the keys of a directory given
-// with its final "/", or without any; what it logs is lost. It need not be up yet when this
-// returns.
+// with its final "/", or without any. It need not be up yet when this returns.
 inline constexpr char no_keys[] = "NO_ENCRYPTION";
-[[nodiscard]] running_daemon start_daemon(const setup& s, const std::string& directory,
+[[nodiscard]] daemon_process start_daemon(const setup& s, const std::string& directory,
                                           compression compress,
                                           const std::string& key_directory = no_keys);
 

@@ -4,7 +4,6 @@
 
 #include <filesystem>
 #include <string>
-#include <utility>
 
 #include "bench/bare_receivers.h"
 #include "bench/load.h"
@@ -58,10 +57,10 @@ constexpr double accepted_loss = 0.02;
 child_process start_subject(const setup& s, subject who, const load& l,
                             const std::string& directory) {
     if (who == subject::daemon) {
-        running_daemon daemon = start_daemon(s, directory, compression::off);
+        daemon_process daemon = start_daemon(s, directory, compression::off);
         const unique_fd control = connect_control(directory);
         (void)ask(control.get(), "IA");
-        return std::move(daemon.process);
+        return daemon;
     }
     const auto kind = who == subject::batched ? receiver::batched : receiver::one_a_wait;
     return start_receiver(kind, directory, event_head_size(l.payload_size), event_payload_offset());
@@ -185,13 +184,13 @@ void run_round(const setup& s, subject who, take_function take, const load& l, s
     if (who != subject::daemon) {
         send_events(r, warm_up_events);
         take(r, l, into);
-        (void)process.stop();
+        stop(process);
         return;
     }
     report_remover remover(directory.path());
     send_events(r, warm_up_events);
     take(r, l, into);
-    (void)process.stop();  // which waits for the last compactor
+    stop(process);  // which waits for the last compactor
     check_stored_bytes(r, remover.finish());
 }
 

@@ -136,7 +136,7 @@ void run_event_round(const setup& s, const std::string& config,
     const scratch_directory directory(s.scratch);
     std::filesystem::create_directory(directory.path() + "/input");
     if (!config.empty()) write_file(directory.path() + "/input/config", config);
-    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
+    daemon_process daemon = start_daemon(s, directory.path(), compression::off);
     if (ask(connect_control(directory.path()).get(), "IA") != "1") give_up("no answer to IA");
     if (!config.empty() && !std::filesystem::exists(directory.path() + "/private/filters.txt"))
         give_up("the daemon does not use the filter");
@@ -149,14 +149,14 @@ void run_event_round(const setup& s, const std::string& config,
     };
     send(many);
     const unsigned events = amount(s, 200'000, 40'000);
-    const int64_t cpu_before = process_cpu_ns(daemon.process.pid());
+    const int64_t cpu_before = process_cpu_ns(daemon.pid());
     const int64_t start = now_ns();
     send(events);
     const double seconds = static_cast<double>(now_ns() - start) / 1e9 - settle_us / 1e6;
-    const int64_t cpu = process_cpu_ns(daemon.process.pid()) - cpu_before;
+    const int64_t cpu = process_cpu_ns(daemon.pid()) - cpu_before;
     into.events_per_second.push_back(events / seconds);
     into.cpu_us.push_back(static_cast<double>(cpu) / 1e3 / events);
-    (void)daemon.process.stop();
+    stop(daemon);
 }
 
 void measure_filtered_events(const setup& s) {

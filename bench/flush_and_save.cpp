@@ -48,9 +48,9 @@ struct flush_times {
 
 void run_flush(const setup& s, compression compress, unsigned counters, flush_times& into) {
     const scratch_directory directory(s.scratch);
-    running_daemon daemon = start_daemon(s, directory.path(), compress);
+    daemon_process daemon = start_daemon(s, directory.path(), compress);
     const unique_fd control = connect_control(directory.path());
-    const pid_t pid = daemon.process.pid();
+    const pid_t pid = daemon.pid();
     for (unsigned i = 0; i < amount(s, 20, 5) + 1; ++i) {
         touch_counters(directory.path(), counters);
         fill_event_file(directory.path());
@@ -66,7 +66,7 @@ void run_flush(const setup& s, compression compress, unsigned counters, flush_ti
         into.elapsed_ms.push_back(static_cast<double>(elapsed) / 1e6);
         into.cpu_ms.push_back(static_cast<double>(main_thread_cpu_ns(pid) - cpu_before) / 1e6);
     }
-    (void)daemon.process.stop();
+    stop(daemon);
 }
 
 struct record {
@@ -131,7 +131,7 @@ void measure_flush(const setup& s) {
 void measure_save(const setup& s) {
     print_section("Save: 20,000 counters, FS to the answer of the IA behind it");
     const scratch_directory directory(s.scratch);
-    running_daemon daemon = start_daemon(s, directory.path(), compression::off);
+    daemon_process daemon = start_daemon(s, directory.path(), compression::off);
     const unique_fd control = connect_control(directory.path());
     touch_counters(directory.path(), saved_counters);
     const std::string saved = directory.path() + "/private/counters.txt";
@@ -157,7 +157,7 @@ void measure_save(const setup& s) {
         daemon_ms.push_back(static_cast<double>(daemon_ns) / 1e6);
         plain_ms.push_back(static_cast<double>(plain_ns) / 1e6);
     }
-    (void)daemon.process.stop();
+    stop(daemon);
     print_row("fprintf for every record, rename", plain_ms, "ms");
     print_row("kivd", daemon_ms, "ms");
     print_row("kivd : fprintf", ratios(daemon_ms, plain_ms), "x", {bound::at_most, 0.6});

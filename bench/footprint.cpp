@@ -17,15 +17,15 @@ void measure_idle(const setup& s) {
     std::vector<double> wake_ups;
     for (unsigned i = 0; i < amount(s, 3, 1); ++i) {
         const scratch_directory directory(s.scratch);
-        running_daemon daemon = start_daemon(s, directory.path(), compression::on);
+        daemon_process daemon = start_daemon(s, directory.path(), compression::on);
         (void)ask(connect_control(directory.path()).get(), "IA");
         (void)usleep(settle_us);
-        const pid_t pid = daemon.process.pid();
+        const pid_t pid = daemon.pid();
         kilobytes.push_back(static_cast<double>(private_dirty_bytes(pid)) / 1024);
         const int64_t before = voluntary_switches(pid);
         (void)sleep(amount(s, 5, 2));
         wake_ups.push_back(static_cast<double>(voluntary_switches(pid) - before));
-        (void)daemon.process.stop();
+        stop(daemon);
     }
     print_row("private dirty memory", kilobytes, "KiB", {bound::at_most, 1024});
     print_row("wake-ups in some seconds without a request", wake_ups, "", {bound::at_most, 0});
@@ -34,22 +34,23 @@ void measure_idle(const setup& s) {
 void measure_start_and_stop(const setup& s) {
     const scratch_directory directory(s.scratch);
     {
-        running_daemon daemon = start_daemon(s, directory.path(), compression::on);
+        daemon_process daemon = start_daemon(s, directory.path(), compression::on);
         touch_counters(directory.path(), stored_counters);
-        (void)daemon.process.stop();
+        stop(daemon);
     }
     std::vector<double> start_ms;
     std::vector<double> clean_stop_ms;
     std::vector<double> saving_stop_ms;
     for (unsigned i = 0; i < amount(s, 20, 5); ++i) {
-        running_daemon daemon = start_daemon(s, directory.path(), compression::on);
+        const int64_t started_ns = now_ns();
+        daemon_process daemon = start_daemon(s, directory.path(), compression::on);
         const unique_fd control = connect_control(directory.path());
         (void)ask(control.get(), "IA");
-        start_ms.push_back(static_cast<double>(now_ns() - daemon.started_ns) / 1e6);
+        start_ms.push_back(static_cast<double>(now_ns() - started_ns) / 1e6);
         const bool saving = i % 2 == 1;
         if (saving) touch_counters(directory.path(), 1);
         (void)usleep(settle_us / 10);
-        const double taken = static_cast<double>(daemon.process.stop()) / 1e6;
+        const double taken = static_cast<double>(stop(daemon)) / 1e6;
         (saving ? saving_stop_ms : clean_stop_ms).push_back(taken);
     }
     print_row("start to the first answer, 10,000 counters stored", start_ms, "ms",

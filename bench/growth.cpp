@@ -49,14 +49,14 @@ void measure_payload(const setup& s, size_t payload_size) {
             start_receiver(receiver::batched, bare_directory.path(), event_head_size(payload_size),
                            event_payload_offset());
         bare.push_back(cpu_per_event(receiver.pid(), bare_directory.path(), payload_size));
-        (void)receiver.stop();
+        stop(receiver);
 
         const scratch_directory directory(s.scratch);
-        running_daemon kivd = start_daemon(s, directory.path(), compression::off);
+        daemon_process kivd = start_daemon(s, directory.path(), compression::off);
         (void)ask(connect_control(directory.path()).get(), "IA");
         report_remover remover(directory.path());
-        daemon.push_back(cpu_per_event(kivd.process.pid(), directory.path(), payload_size));
-        (void)kivd.process.stop();
+        daemon.push_back(cpu_per_event(kivd.pid(), directory.path(), payload_size));
+        stop(kivd);
         (void)remover.finish();
     }
     char title[64];
@@ -83,8 +83,8 @@ void measure_counter_count(const setup& s, unsigned counters) {
     for (unsigned i = 0; i < counters; ++i) packets.push_back(increment_packet(i));
     for (unsigned i = 0; i < amount(s, 5, 2); ++i) {
         const scratch_directory directory(s.scratch);
-        running_daemon kivd = start_daemon(s, directory.path(), compression::off);
-        const pid_t pid = kivd.process.pid();
+        daemon_process kivd = start_daemon(s, directory.path(), compression::off);
+        const pid_t pid = kivd.pid();
         const unique_fd control = connect_control(directory.path());
         // The first ones bring in whatever a packet needs, however many counters there are.
         for (unsigned n = 0; n < 100; ++n) touch_counters(directory.path(), 1);
@@ -96,7 +96,7 @@ void measure_counter_count(const setup& s, unsigned counters) {
             [&](unsigned n) -> const std::string& { return packets[n % counters]; }));
         save_ms.push_back(time_order(control.get(), "FS"));
         flush_ms.push_back(time_order(control.get(), "FL"));
-        (void)kivd.process.stop();
+        stop(kivd);
     }
     char title[64];
     (void)snprintf(title, sizeof title, "%u counters, all of them changed", counters);

@@ -105,7 +105,7 @@ class announced_daemon {
           control_(connect_control(directory)) {
         if (ask(control_.get(), "IA") != "1") give_up("no answer to IA");
     }
-    ~announced_daemon() { (void)daemon_.process.stop(); }
+    ~announced_daemon() { stop(daemon_); }
 
     // Puts the file into its place and gives the time from NC to the answer, in ms.
     [[nodiscard]] double take(std::string_view file) {
@@ -121,7 +121,7 @@ class announced_daemon {
 
  private:
     std::string directory_;
-    running_daemon daemon_;
+    daemon_process daemon_;
     unique_fd control_;
 };
 
@@ -139,7 +139,7 @@ void measure_parts(const setup& s, const std::string& key_directory) {
     {
         const std::string path = key_directory + "signature";
         child_process process = fork_child([&] { write_file(path, sign(key_directory, data)); });
-        process.join();
+        join(process);
         signature = read_file(path);
     }
     const std::string plain_file = make_config_file(data, "");
@@ -203,7 +203,7 @@ void measure_intake(const setup& s) {
     const scratch_directory keys(s.scratch);
     const std::string key_directory = keys.path() + "/";
     child_process maker = fork_child([&] { make_keys(keys.path(), config_key_name); });
-    maker.join();
+    join(maker);
     measure_parts(s, key_directory);
     measure_filter(s, only_distinct, outcome::in_force, "a filter in descending order");
     measure_filter(s, repeating, outcome::refused, "one that is refused for repetitions");

@@ -1,5 +1,5 @@
 // The client's side of the sockets: packets sent as fast as they are taken, and requests with an
-// answer. A call that waits over five seconds gives the run up.
+// answer. A call that waits for some seconds gives the run up.
 #pragma once
 
 #include <string>

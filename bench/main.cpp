@@ -94,14 +94,13 @@ void print_machine() {
 
 // Runs until the measurements have ended, a signal asks to stop or the time is up; false unless
 // they have ended well.
-bool supervise(child_process& worker, const sigset_t& signals) {
+bool supervise(kivd::child_process& worker, const sigset_t& signals) {
     const int64_t deadline = now_ns() + int64_t{run_limit_seconds} * 1'000'000'000;
     while (now_ns() < deadline) {
         const timespec rest{.tv_sec = 1, .tv_nsec = 0};
         const int signal_number = sigtimedwait(&signals, nullptr, &rest);
         if (signal_number == SIGINT || signal_number == SIGTERM) return false;
-        int status = 0;
-        if (worker.ended(status)) return status == 0;
+        if (const int status = worker.wait_exit(0); status >= 0) return status == 0;
     }
     fprintf(stderr, "kivd_bench: still not done, stopped\n");
     return false;
@@ -141,7 +140,7 @@ int main(int argc, char** argv) {
     const scratch_directory scratch(scratch_parent);
     s.scratch = scratch.path();
     print_machine();
-    child_process worker = fork_child([&] {
+    kivd::child_process worker = fork_child([&] {
         (void)sigprocmask(SIG_UNBLOCK, &signals, nullptr);
         for (const auto& known : sections) {
             const bool wanted =

@@ -2,12 +2,10 @@
 
 #include <fcntl.h>
 #include <linux/perf_event.h>
-#include <poll.h>
 #include <signal.h>
 #include <sys/mman.h>
 #include <sys/prctl.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -23,13 +21,7 @@ namespace kivd::bench {
 
 namespace {
 
-constexpr int stop_limit_ms = 5000;
 constexpr int join_limit_ms = 60'000;
-
-void wait_for(pid_t pid) {
-    while (waitpid(pid, nullptr, 0) == -1 && errno == EINTR) {
-    }
-}
 
 std::string proc_path(pid_t pid, const char* name) {
     return "/proc/" + std::to_string(pid) + "/" + name;
@@ -54,15 +46,6 @@ int64_t read_field(const std::string& path, const std::string& key) {
     return 0;
 }
 
-unique_fd open_process(pid_t pid) {
-    return unique_fd(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
-}
-
-bool becomes_readable(int fd, int limit_ms) {
-    pollfd event{.fd = fd, .events = POLLIN, .revents = 0};
-    return poll(&event, 1, limit_ms) == 1;
-}
-
 unique_fd open_counter(perf_event_attr& attributes, pid_t pid) {
     attributes.size = sizeof attributes;
     return unique_fd(static_cast<int>(
@@ -71,43 +54,14 @@ unique_fd open_counter(perf_event_attr& attributes, pid_t pid) {
 
 }  // namespace
 
-child_process& child_process::operator=(child_process&& other) noexcept {
-    if (this == &other) return *this;
-    kill_now();
-    pid_ = std::exchange(other.pid_, -1);
-    return *this;
-}
-
-void child_process::kill_now() noexcept {
-    if (pid_ <= 0) return;
-    (void)kill(pid_, SIGKILL);
-    wait_for(pid_);
-    pid_ = -1;
-}
-
-int64_t child_process::stop() {
-    const unique_fd watched = open_process(pid_);
+int64_t stop(child_process& process) {
     const int64_t start = now_ns();
-    (void)kill(pid_, SIGTERM);
-    const bool ended = becomes_readable(watched.get(), stop_limit_ms);
-    const int64_t taken = now_ns() - start;
-    const pid_t pid = pid_;
-    kill_now();
-    if (!ended) give_up("process %d did not end on SIGTERM", static_cast<int>(pid));
-    return taken;
+    if (process.stop() < 0) give_up("process %d did not end on SIGTERM", process.pid());
+    return now_ns() - start;
 }
 
-void child_process::join() {
-    const unique_fd watched = open_process(pid_);
-    int status = 0;
-    if (!becomes_readable(watched.get(), join_limit_ms) || !ended(status) || status != 0)
-        give_up("a measuring process did not end as it should");
-}
-
-bool child_process::ended(int& status) {
-    if (waitpid(pid_, &status, WNOHANG) != pid_) return false;
-    pid_ = -1;
-    return true;
+void join(child_process& process) {
+    if (process.wait_exit(join_limit_ms) != 0) give_up("a process did not end as it should");
 }
 
 child_process fork_child(const std::function<void()>& body) {
@@ -136,7 +90,7 @@ void run_in_child(std::span<double> figures, const std::function<void(std::span<
     child_process process = fork_child([&] {
         body({static_cast<double*>(shared), figures.size()});
     });
-    process.join();
+    join(process);
     memcpy(figures.data(), shared, size);
     (void)munmap(shared, size);
 }
@@ -151,7 +105,7 @@ int64_t run_program(const std::vector<std::string>& words) {
         (void)execvp(arguments[0], arguments.data());
         _exit(127);
     });
-    process.join();
+    join(process);
     return now_ns() - start;
 }
 

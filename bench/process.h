@@ -10,31 +10,16 @@
 #include <string>
 #include <vector>
 
+#include "bench/daemon_process.h"
 #include "util/unique_fd.h"
 
 namespace kivd::bench {
 
-// Owns a child process and kills it, by its id, when it has not been stopped.
-class child_process {
- public:
-    explicit child_process(pid_t pid = -1) noexcept : pid_(pid) {}
-    child_process(child_process&& other) noexcept : pid_(std::exchange(other.pid_, -1)) {}
-    child_process& operator=(child_process&& other) noexcept;
-    ~child_process() { kill_now(); }
-
-    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
-    // SIGTERM, then waits until the process is gone; one that takes over five seconds is killed
-    // and the run given up. The time from the signal to the end, in ns.
-    int64_t stop();
-    // Whether it has ended by itself; if so, with the status of waitpid.
-    [[nodiscard]] bool ended(int& status);
-    // Waits until it has; gives the run up when that takes over a minute or has ended badly.
-    void join();
-
- private:
-    void kill_now() noexcept;
-    pid_t pid_;
-};
+// SIGTERM, then waits until the process is gone; gives the run up when it isn't in time. The time
+// from the signal to the end, in ns.
+int64_t stop(child_process& process);
+// Waits until it has ended by itself; gives the run up when that takes over a minute or ends badly.
+void join(child_process& process);
 
 // Runs `body` in a child that dies with this process, and ends it when `body` returns.
 [[nodiscard]] child_process fork_child(const std::function<void()>& body);

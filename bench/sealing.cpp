@@ -192,7 +192,7 @@ void measure_sealing(const setup& s) {
     const scratch_directory keys(s.scratch);
     const std::string key_directory = keys.path() + "/";
     child_process maker = fork_child([&] { make_keys(keys.path(), report_key_name); });
-    maker.join();
+    join(maker);
     measure_size(s, key_directory, "50 KB", 50'000);
     measure_size(s, key_directory, "400 KB", 400'000);
     measure_size(s, key_directory, "5 MB", 5'000'000);

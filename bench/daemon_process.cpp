@@ -1,4 +1,4 @@
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 
 #include <fcntl.h>
 #include <linux/sockios.h>
@@ -7,6 +7,7 @@
 #include <sys/mman.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/time.h>
 #include <sys/un.h>
 #include <sys/wait.h>
@@ -22,8 +23,7 @@
 #include <filesystem>
 #include <fstream>
 #include <thread>
-
-#include "support/scratch_directory.h"
+#include <utility>
 
 namespace kivd {
 namespace {
@@ -80,6 +80,44 @@ std::string gunzip_file(const std::string& path) {
     return gzclose(file) == Z_OK && whole ? text : std::string();
 }
 
+child_process& child_process::operator=(child_process&& other) noexcept {
+    std::swap(pid_, other.pid_);
+    std::swap(status_, other.status_);
+    return *this;
+}
+
+child_process::~child_process() {
+    if (pid_ <= 0 || reap()) return;
+    send_signal(SIGKILL);
+    (void)wait_exit();
+}
+
+bool child_process::reap() {
+    if (status_ >= 0) return true;
+    int status = 0;
+    if (waitpid(pid_, &status, WNOHANG) != pid_) return false;
+    status_ = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    return true;
+}
+
+int child_process::wait_exit(int limit_ms) {
+    if (reap()) return status_;
+    const unique_fd process(static_cast<int>(syscall(SYS_pidfd_open, pid_, 0)));
+    pollfd end = {process.get(), POLLIN, 0};
+    (void)poll(&end, 1, limit_ms);
+    (void)reap();
+    return status_;
+}
+
+void child_process::send_signal(int signal) const {
+    if (pid_ > 0 && status_ < 0) (void)kill(pid_, signal);
+}
+
+int child_process::stop() {
+    send_signal(SIGTERM);
+    return wait_exit();
+}
+
 daemon_process::daemon_process(const std::string& program, const start_options& options)
     : output_(memfd_create("output", MFD_CLOEXEC)), log_(memfd_create("log", MFD_CLOEXEC)) {
     std::vector<char*> arguments = {const_cast<char*>(program.c_str())};
@@ -89,54 +127,14 @@ daemon_process::daemon_process(const std::string& program, const start_options& 
     arguments.push_back(nullptr);
     // Its children log, too: where two of them share a position, one line would end up in another.
     (void)fcntl(log_.get(), F_SETFL, O_APPEND);
-    pid_ = fork();
-    if (pid_ == 0) become(options, arguments.data(), output_.get(), log_.get());
-}
-
-daemon_process::daemon_process(daemon_process&& other) noexcept
-    : pid_(std::exchange(other.pid_, -1)),
-      status_(other.status_),
-      output_(std::move(other.output_)),
-      log_(std::move(other.log_)) {}
-
-daemon_process& daemon_process::operator=(daemon_process&& other) noexcept {
-    std::swap(pid_, other.pid_);
-    std::swap(status_, other.status_);
-    std::swap(output_, other.output_);
-    std::swap(log_, other.log_);
-    return *this;
-}
-
-daemon_process::~daemon_process() {
-    if (pid_ <= 0 || reap()) return;
-    send_signal(SIGKILL);
-    (void)wait_exit();
-}
-
-bool daemon_process::reap() {
-    if (status_ >= 0) return true;
-    int status = 0;
-    if (waitpid(pid_, &status, WNOHANG) != pid_) return false;
-    status_ = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    return true;
+    const pid_t child = fork();
+    if (child == 0) become(options, arguments.data(), output_.get(), log_.get());
+    child_process::operator=(child_process(child));
 }
 
 bool daemon_process::wait_ready() {
-    return wait_until([this] { return reap() || count_in_log(ready_text) > 0; }) && !reap();
-}
-
-int daemon_process::wait_exit(int limit_ms) {
-    (void)wait_until([this] { return reap(); }, limit_ms);
-    return status_;
-}
-
-void daemon_process::send_signal(int signal) const {
-    if (pid_ > 0 && status_ < 0) (void)kill(pid_, signal);
-}
-
-int daemon_process::stop() {
-    send_signal(SIGTERM);
-    return wait_exit();
+    const auto has_ended = [this] { return wait_exit(0) >= 0; };
+    return wait_until([&] { return has_ended() || count_in_log(ready_text) > 0; }) && !has_ended();
 }
 
 std::string daemon_process::output() const { return read_from(output_.get(), 0); }
@@ -155,7 +153,7 @@ size_t daemon_process::count_in_log(std::string_view text) const {
 }
 
 std::string daemon_process::proc(const char* name) const {
-    return "/proc/" + std::to_string(pid_) + "/" + name;
+    return "/proc/" + std::to_string(pid()) + "/" + name;
 }
 
 size_t daemon_process::descriptors() const {
@@ -176,19 +174,20 @@ bool daemon_process::wait_idle() const {
     std::string before;
     int quiet = 0;
     return wait_until([&] {
-        const std::string now = read_file(proc("schedstat"));
+        std::string now;
+        std::getline(std::ifstream(proc("schedstat")), now);
         quiet = now == before ? quiet + 1 : 0;
         before = now;
         return quiet == 100;  // looks, which is a fifth of a second or more
     });
 }
 
-unique_fd connect_client(socket_kind kind) {
+unique_fd connect_client(socket_kind kind, const std::string& directory) {
     struct {
         int type;
         const char* name;
     } static constexpr sockets[] = {
-        {SOCK_DGRAM, "kiv_cl"}, {SOCK_SEQPACKET, "kiv_co"}, {SOCK_STREAM, "kiv_co_stream"}};
+        {SOCK_DGRAM, "/kiv_cl"}, {SOCK_SEQPACKET, "/kiv_co"}, {SOCK_STREAM, "/kiv_co_stream"}};
     const auto& [type, name] = sockets[static_cast<size_t>(kind)];
     unique_fd fd(socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
     const timeval limit = {client_limit_s, 0};
@@ -196,7 +195,7 @@ unique_fd connect_client(socket_kind kind) {
     (void)setsockopt(fd.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
     sockaddr_un address = {};
     address.sun_family = AF_UNIX;
-    strncpy(address.sun_path, name, sizeof address.sun_path - 1);
+    (directory + name).copy(address.sun_path, sizeof address.sun_path - 1);
     if (connect(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         fd.reset();
     }
@@ -222,10 +221,13 @@ std::string framed(std::string_view request) {
 }
 
 bool wait_taken(int fd) {
-    return wait_until([fd] {
-        int left = 0;
-        return ioctl(fd, SIOCOUTQ, &left) != 0 || left == 0;
-    });
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(client_limit_s);
+    int left = 0;
+    while (ioctl(fd, SIOCOUTQ, &left) == 0 && left > 0) {
+        if (std::chrono::steady_clock::now() > deadline) return false;
+        (void)usleep(10);  // what is measured waits here
+    }
+    return true;
 }
 
 }  // namespace kivd
