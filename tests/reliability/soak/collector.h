@@ -6,18 +6,19 @@
 #include <sys/inotify.h>
 
 #include <cstdio>
+#include <cstring>
 #include <thread>
 
+#include "bench/traffic.h"
 #include "end_to_end/daemon_test.h"
-#include "traffic.h"
 
 namespace kivd::soak {
 
 class collector {
  public:
-    collector() {
+    explicit collector(size_t clients) : next_(clients) {
         EXPECT_GE(inotify_add_watch(inotify_.get(), "output", IN_MOVED_TO), 0) << strerror(errno);
-        for (int i = 0; i < client_count; ++i) next_[static_cast<size_t>(i)] = next_event(i, 0);
+        for (size_t i = 0; i < clients; ++i) expect_event_from({i, 0});
         thread_ = std::jthread([this](const std::stop_token& stop) {
             pollfd names = {inotify_.get(), POLLIN, 0};
             while (!stop.stop_requested()) {
@@ -27,13 +28,15 @@ class collector {
     }
 
     // When the daemon has ended: checks what it has left, and that nothing is missing.
-    void finish(const message_counts& counts) {
+    void finish(const std::vector<uint64_t>& counts) {
         thread_ = std::jthread();
         take_reports();
         EXPECT_EQ(report_paths().size(), 0U);
         check(parse(read_file("private/events")));
-        for (size_t i = 0; i < client_count; ++i) {
-            EXPECT_EQ(next_[i], next_event(static_cast<int>(i), counts[i])) << "of client " << i;
+        for (size_t i = 0; i < counts.size(); ++i) {
+            const uint64_t next = next_[i];
+            expect_event_from({i, counts[i]});
+            EXPECT_EQ(next, next_[i]) << "of client " << i;
         }
         const probe_values expected = values_after(counts);
         EXPECT_EQ(values_.counters, expected.counters);
@@ -44,8 +47,13 @@ class collector {
  private:
     static constexpr int look_for_stop_ms = 50;
 
-    // Their names come in the order in which they were made, which their numbers don't tell once
-    // some have been taken away.
+    // The next event of a client, whose messages before `id` are done with.
+    void expect_event_from(event_id id) {
+        while (kind_of(id) != "EV") ++id.number;
+        next_[id.client] = id.number;
+    }
+
+    // Their names come in the order in which they were made.
     void take_reports() {
         alignas(inotify_event) std::array<char, 65536> names;
         const ssize_t size = read(inotify_.get(), names.data(), names.size());
@@ -54,6 +62,9 @@ class collector {
             at += static_cast<ssize_t>(sizeof(inotify_event) + found->len);
             EXPECT_EQ(found->mask, uint32_t{IN_MOVED_TO});
             if (!std::string_view(found->name).starts_with("kiv_")) continue;
+            const int number = std::stoi(found->name + strlen("kiv_"));
+            EXPECT_TRUE(number == last_number_ + 1 || number == 1) << number;  // or all were gone
+            last_number_ = number;
             const std::string path = std::string("output/") + found->name;
             check(parse(gunzip_file(path)));
             EXPECT_TRUE(std::filesystem::remove(path)) << path;
@@ -64,31 +75,30 @@ class collector {
     void check(const kiv::Report& report) {
         EXPECT_NE(report.header().device_id(), "");
         for (const kiv::Event& event : report.events()) {
-            if (event.package() == "soak" && !testing::Test::HasFailure()) check(event);
+            if (!testing::Test::HasFailure()) check(event);
         }
         for (const auto& each : report.counters()) {
-            if (each.package() == "soak") values_.counters[each.name()] = each.value();
+            if (each.package() == load_package) values_.counters[each.name()] = each.value();
         }
         for (const auto& each : report.statics()) {
-            if (each.package() == "soak") values_.texts[each.name()] = each.value();
+            if (each.package() == load_package) values_.texts[each.name()] = each.value();
         }
     }
 
     void check(const kiv::Event& event) {
-        size_t client = client_count;
-        uint64_t number = 0;
-        (void)sscanf(event.name().c_str(), "%zu.%lu", &client, &number);
-        ASSERT_LT(client, size_t{client_count}) << event.name();
-        const int of = static_cast<int>(client);
-        EXPECT_EQ(number, next_[client]) << "of client " << client;
-        EXPECT_TRUE(event.payload() == payload_of(of, number)) << event.name();
-        next_[client] = next_event(of, number + 1);
+        const std::optional<event_id> id = find_event_id(event.package());
+        if (!id) return;  // the daemon's own
+        ASSERT_LT(id->client, next_.size()) << event.package();
+        EXPECT_EQ(id->number, next_[id->client]) << "of client " << id->client;
+        EXPECT_TRUE(is_intact(event.package(), event.payload())) << event.package();
+        expect_event_from({id->client, id->number + 1});
         ++events_;
     }
 
     const unique_fd inotify_{inotify_init1(IN_CLOEXEC | IN_NONBLOCK)};
-    message_counts next_ = {};  // the event of each client that comes next
-    probe_values values_;       // as last reported
+    std::vector<uint64_t> next_;  // the number of each client's event that comes next
+    probe_values values_;         // as last reported
+    int last_number_ = 0;
     uint64_t reports_ = 0;
     uint64_t events_ = 0;
     std::jthread thread_;  // last: it uses the others

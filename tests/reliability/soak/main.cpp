@@ -3,8 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <optional>
 
-#include "answer_times.h"
-#include "clients.h"
+#include "bench/flood.h"
 #include "collector.h"
 #include "settings.pb.h"
 #include "support/config_package.h"
@@ -12,7 +11,8 @@
 namespace kivd::soak {
 namespace {
 
-constexpr std::chrono::seconds idle_time(2);
+constexpr size_t connections = 500;
+constexpr size_t producers = 8;
 constexpr double requests_per_flush = 20000;
 constexpr double requests_per_save = 50000;
 constexpr double warm_up = 0.1;  // of the whole
@@ -40,11 +40,6 @@ class soak : public daemon_test {
         size_t descriptors;
         int64_t anonymous_kib;
     };
-    struct point {
-        double seconds;
-        double requests;
-        double cpu_seconds;
-    };
 
     soak() {
         // However long its reports lie there, none is deleted to make room.
@@ -54,6 +49,13 @@ class soak : public daemon_test {
         daemon_ = start();
     }
 
+    // Has it use its buffers as far as they go.
+    static void fill_buffers() {
+        const unique_fd producer = connect_client(socket_kind::datagram);
+        const std::string packet = "EV full buffers " + std::string(largest_payload, 'x');
+        for (int i = 0; i < 500; ++i) EXPECT_TRUE(send_text(producer.get(), packet));
+    }
+
     // What it has when it does nothing and the event file is open.
     holding at_rest() const {
         request({"FL", "EV rest event x"});
@@ -61,55 +63,36 @@ class soak : public daemon_test {
         return {daemon_.descriptors(), daemon_.anonymous_kib()};
     }
 
-    point reached(const clients& sending) const {
+    void print_progress(const flood& clients) const {
         const std::string used = read_file("/proc/" + std::to_string(daemon_.pid()) + "/schedstat");
-        return {seconds(), static_cast<double>(sending.total()), std::stod(used) / 1e9};
-    }
-    void print_stretch(const point& from, const point& to,
-                       const std::vector<milliseconds>& times) const {
-        const double requests = to.requests - from.requests;
+        const auto requests = static_cast<double>(clients.total());
+        const double taken = seconds() - started_;
         printf(
-            "%6.1f min: %.0f requests, %.0f a second, %.1f us of CPU each, %s; %ld KiB, "
+            "%6.1f min: %.0f requests, %.0f a second, %.1f us of CPU each; %ld KiB, "
             "%zu descriptors\n",
-            (to.seconds - started_) / 60, requests, requests / (to.seconds - from.seconds),
-            (to.cpu_seconds - from.cpu_seconds) / requests * 1e6, summary(times).c_str(),
+            taken / 60, requests, requests / taken, std::stod(used) / 1e3 / requests,
             daemon_.anonymous_kib(), daemon_.descriptors());
         (void)fflush(stdout);
     }
 
     // Until that part of the whole is done, with a line a minute.
-    void flood(clients& sending, double part, size_t descriptor_limit) {
+    void keep_busy(flood& clients, double part, size_t descriptor_limit) {
         const unique_fd control = connect_client(socket_kind::packets);
-        std::optional<answer_times> asking(std::in_place);
-        std::vector<milliseconds> all_times;
-        const auto take_times = [&] {
-            std::vector<milliseconds> times = asking->finish();
-            all_times.insert(all_times.end(), times.begin(), times.end());
-            return times;
-        };
-        const point first = reached(sending);
-        point last = first;
-        double flush = first.requests;
-        double save = first.requests;
-        double look = first.seconds;
-        double line = first.seconds + 60;
-        sending.send([&] {
-            const auto sent = static_cast<double>(sending.total());
+        auto flush = static_cast<double>(clients.total());
+        double save = flush;
+        double look = seconds();
+        double line = look + 60;
+        EXPECT_TRUE(clients.send([&] {
+            const auto sent = static_cast<double>(clients.total());
             if (is_due(sent, flush, requests_per_flush)) send_text(control.get(), "FL");
             if (is_due(sent, save, requests_per_save)) send_text(control.get(), "FS");
             EXPECT_TRUE(!is_due(seconds(), look, 1) || daemon_.descriptors() <= descriptor_limit);
-            if (is_due(seconds(), line, 60)) {
-                const point now = reached(sending);
-                print_stretch(std::exchange(last, now), now, take_times());
-                asking.emplace();
-            }
+            if (is_due(seconds(), line, 60)) print_progress(clients);
             const double hours = (seconds() - started_) / 3600;
             const double done = wanted_hours > 0 ? hours / wanted_hours : sent / wanted_requests;
             return done >= part || HasFailure();
-        });
-        (void)take_times();
-        puts(part < 1 ? "warm-up:" : "all behind it:");
-        print_stretch(first, reached(sending), all_times);
+        })) << "not answered as it should be";
+        print_progress(clients);
     }
 
     daemon_process daemon_;
@@ -117,26 +100,22 @@ class soak : public daemon_test {
 };
 
 TEST_F(soak, loses_nothing_and_holds_on_to_nothing) {
+    collector collecting(connections + producers);
+    fill_buffers();
     const holding alone = at_rest();
-    {
-        std::optional<answer_times> idle(std::in_place);
-        std::this_thread::sleep_for(idle_time);
-        printf("idle: %s\n", summary(idle->finish()).c_str());
-    }
-    collector collecting;
-    std::optional<clients> sending(directory);
+    std::optional<flood> clients(std::in_place, directory, connections, producers);
     const size_t descriptor_limit = at_rest().descriptors + working_descriptors;
-    flood(*sending, warm_up, descriptor_limit);
+    keep_busy(*clients, warm_up, descriptor_limit);
     const holding early = at_rest();
-    flood(*sending, 1, descriptor_limit);
+    keep_busy(*clients, 1, descriptor_limit);
     const holding late = at_rest();
     printf("at rest: %zu descriptors and %ld KiB early, %zu and %ld in the end\n",
            early.descriptors, early.anonymous_kib, late.descriptors, late.anonymous_kib);
     EXPECT_EQ(late.descriptors, early.descriptors);
     EXPECT_LE(late.anonymous_kib, early.anonymous_kib + growth_limit_kib);
 
-    const message_counts sent = sending->counts();
-    sending.reset();
+    const std::vector<uint64_t> sent = clients->counts();
+    clients.reset();
     EXPECT_TRUE(wait_until([&] { return daemon_.descriptors() == alone.descriptors; }))
         << daemon_.descriptors() << " instead of " << alone.descriptors;
     EXPECT_EQ(daemon_.stop(), 0);

@@ -1,4 +1,0 @@
-// Shared with the measurements.
-#pragma once
-
-#include "bench/daemon_process.h"
