@@ -1,124 +1,144 @@
 #include "reliability/torture/injection.h"
 
-#include <csignal>
-#include <fstream>
-#include <regex>
-#include <sstream>
+#include <fcntl.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sys/ioctl.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
-#include "support/scratch_directory.h"
+#include <algorithm>
+#include <atomic>
+#include <cerrno>
+#include <csignal>
+#include <cstddef>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <regex>
+#include <thread>
 
 namespace kivd {
 namespace {
 
-constexpr char trace_file[] = "../trace";
-constexpr char traced_names[] =
-    "trace=creat,open,openat,write,writev,pwrite64,pwritev,pwritev2,rename,renameat,renameat2,"
-    "unlink,unlinkat,mkdir,mkdirat,rmdir,link,linkat,symlink,truncate,ftruncate,fallocate,"
-    "copy_file_range,sendfile,chmod,fchmod,fchmodat,close,clone,statfs";
+// Which file a call is about: the descriptor or the path in one of its arguments.
+struct watched_call {
+    int number;
+    const char* name;
+    bool has_path;
+    int argument;
+};
+// clang-format off
+constexpr watched_call watched[] = {
+#ifdef SYS_open  // which younger machines don't have
+    {SYS_open, "open", true, 0}, {SYS_creat, "open", true, 0}, {SYS_rename, "rename", true, 0},
+    {SYS_unlink, "unlink", true, 0}, {SYS_mkdir, "mkdir", true, 0}, {SYS_rmdir, "rmdir", true, 0},
+    {SYS_link, "link", true, 0}, {SYS_chmod, "chmod", true, 0},
+#endif
+    {SYS_openat, "open", true, 1}, {SYS_renameat, "rename", true, 1},
+    {SYS_renameat2, "rename", true, 1}, {SYS_unlinkat, "unlink", true, 1},
+    {SYS_mkdirat, "mkdir", true, 1}, {SYS_linkat, "link", true, 1},
+    {SYS_truncate, "truncate", true, 0}, {SYS_fchmodat, "chmod", true, 1},
+    {SYS_statfs, "statfs", true, 0}, {SYS_write, "write", false, 0},
+    {SYS_writev, "writev", false, 0}, {SYS_pwrite64, "write", false, 0},
+    {SYS_pwritev, "writev", false, 0}, {SYS_ftruncate, "truncate", false, 0},
+    {SYS_fallocate, "write", false, 0}, {SYS_sendfile, "write", false, 0},
+    {SYS_copy_file_range, "write", false, 2}, {SYS_fchmod, "chmod", false, 0},
+    {SYS_close, "close", false, 0}, {SYS_read, "read", false, 0}, {SYS_pread64, "read", false, 0},
+    {SYS_readv, "read", false, 0}, {SYS_clone, "clone", false, 0},
+};
+// clang-format on
 
-// "12 writev(5</directory/private/events>, ..." or "12 rename("private/events", ..."
-const std::regex call_line(
-    R"re(^(\d+) +(\w+)\((?:AT_FDCWD<[^>]*>, )?(?:"([^"]*)"|\d+<(/[^>]*)>|child_stack))re");
+fault injected;
+std::string directory;  // files elsewhere are left alone
+pid_t first_process = 0;
+std::map<std::string, int> made;
+std::vector<std::string> calls;
+std::atomic<bool> was_hit = false;
+std::atomic<bool> has_ended = false;
 
-bool has_path(const std::string& name) { return name != "clone" && name != "statfs"; }
-
-bool changes_file(const traced_call& call) {
-    return has_path(call.name) && call.name != "close" && !call.reads;
-}
-
-std::string absolute(const std::string& path) { return fs::current_path().string() + "/" + path; }
-
-std::vector<traced_call> read_trace() {
-    std::vector<traced_call> calls;
-    std::ifstream file(trace_file);
-    for (std::string line; std::getline(file, line);) {
-        std::smatch match;
-        if (!std::regex_search(line, match, call_line)) continue;
-        std::string path = match[3].matched ? match[3] : match[4];
-        if (path.starts_with(absolute(""))) path.erase(0, absolute("").size());
-        if (path.starts_with('/')) continue;
-        if (!has_path(match[2])) path.clear();
-        const bool by_child = !calls.empty() && match[1] != calls.front().process;
-        const bool reads = line.find("O_RDONLY") != std::string::npos;
-        calls.push_back({match[1], by_child, match[2], path, reads, 0, {}});
+// The listener's descriptor, -1 when that is not permitted.
+int filter_this_thread() {
+    std::vector<sock_filter> program = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr))};
+    for (const watched_call& each : watched) {
+        program.push_back(BPF_JUMP(BPF_JMP | BPF_JEQ, static_cast<uint32_t>(each.number), 0, 1));
+        program.push_back(BPF_STMT(BPF_RET, SECCOMP_RET_USER_NOTIF));
     }
-    return calls;
+    program.push_back(BPF_STMT(BPF_RET, SECCOMP_RET_ALLOW));
+    const sock_fprog filter = {static_cast<unsigned short>(program.size()), program.data()};
+    (void)prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0);
+    return static_cast<int>(
+        syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, SECCOMP_FILTER_FLAG_NEW_LISTENER, &filter));
 }
 
-std::vector<std::string> strace(const std::vector<std::string>& more) {
-    std::vector<std::string> all = {strace_path, "-D", "-qqq",      "-o",
-                                    trace_file,  "-e", traced_names};
-    all.insert(all.end(), more.begin(), more.end());
-    return all;
+// Relative to the directory; empty for what is elsewhere, no file, or only opened to be read.
+std::string path_of(const seccomp_notif& asked, const watched_call& call) {
+    if (call.number == SYS_clone) return "-";
+    const std::string process = "/proc/" + std::to_string(asked.pid);
+    const uint64_t argument = asked.data.args[call.argument];
+    std::string path;
+    if (call.number == SYS_openat && (asked.data.args[2] & (O_ACCMODE | O_CREAT)) == O_RDONLY) {
+        return path;
+    }
+    if (call.has_path) {
+        std::ifstream memory(process + "/mem", std::ios::binary);
+        std::getline(memory.seekg(static_cast<std::streamoff>(argument)), path, '\0');
+    } else {
+        std::error_code closed;
+        path = std::filesystem::read_symlink(process + "/fd/" + std::to_string(argument), closed);
+        if (!path.starts_with(directory)) return {};
+    }
+    if (path.starts_with(directory)) path.erase(0, directory.size());
+    return path.starts_with('/') ? std::string() : path;
+}
+
+void decide(const seccomp_notif& asked, seccomp_notif_resp& answer) {
+    const auto* const call = std::ranges::find(watched, asked.data.nr, &watched_call::number);
+    const std::string path = path_of(asked, *call);
+    if (path.empty()) return;
+    const auto process = static_cast<pid_t>(asked.pid);
+    if (first_process == 0) first_process = process;
+    const std::string what = std::string(call->name) + " " + path;
+    const int number = ++made[std::to_string(process) + " " + what];
+    const std::string made_now =
+        (process == first_process ? "daemon " : "child ") + what + " " + std::to_string(number);
+    if (std::ranges::find(calls, made_now) == calls.end()) calls.push_back(made_now);
+    const bool is_later = was_hit && std::regex_match(what, std::regex(injected.later));
+    if (!is_later && made_now != injected.call) return;
+    was_hit = true;
+    if (injected.result == killed) (void)kill(process, SIGKILL);
+    answer = {asked.id, 0, static_cast<int>(std::max(injected.result, -4095L)), 0};
+}
+
+void answer_all(int listener) {
+    for (;;) {
+        seccomp_notif asked = {};
+        if (ioctl(listener, SECCOMP_IOCTL_NOTIF_RECV, &asked) != 0) continue;
+        seccomp_notif_resp answer = {asked.id, 0, 0, SECCOMP_USER_NOTIF_FLAG_CONTINUE};
+        if (!has_ended && static_cast<pid_t>(asked.pid) != getpid()) decide(asked, answer);
+        (void)ioctl(listener, SECCOMP_IOCTL_NOTIF_SEND, &answer);
+    }
 }
 
 }  // namespace
 
-std::vector<std::string> record_arguments() { return strace({"-f", "-y", "-s", "0"}); }
-
-std::vector<std::string> inject_arguments(const recording& all, const traced_call& hit,
-                                          const fault& injected) {
-    std::vector<std::string> arguments = strace({});
-    if (hit.by_child) arguments.emplace_back("-f");
-    // It knows the paths that a call is given as they are, those of descriptors from the root on.
-    for (const auto& path : injected.lasting ? all.paths[hit.by_child] : std::set{hit.path}) {
-        if (path.empty()) continue;
-        arguments.insert(arguments.end(), {"-P", path, "-P", absolute(path)});
-    }
-    std::map<std::string, std::string> when;  // by name; it counts for each process anew
-    for (const traced_call& call : all.calls) {
-        if (!injected.lasting || call.by_child != hit.by_child || !changes_file(call)) continue;
-        const auto made = hit.before.find(call.name);
-        when[call.name] = std::to_string(made != hit.before.end() ? made->second + 1 : 1) + "+";
-    }
-    if (!injected.lasting) when[hit.name] = std::to_string(hit.number);
-    for (const auto& [name, numbers] : when) {
-        std::string what = "inject=";
-        what.append(name).append(":").append(injected.what).append(":when=").append(numbers);
-        arguments.insert(arguments.end(), {"-e", what});
-    }
-    return arguments;
+bool inject(fault wanted) {
+    static std::atomic<int> listener = -1;
+    injected = std::move(wanted);
+    directory = std::filesystem::current_path().string() + "/";
+    std::thread([] {
+        listener.wait(-1);
+        answer_all(listener);
+    }).detach();
+    listener = filter_this_thread();
+    listener.notify_one();
+    return listener >= 0;
 }
 
-recording read_recording() {
-    recording all;
-    const std::vector<traced_call> trace = read_trace();
-    for (const traced_call& call : trace) {
-        if (changes_file(call)) all.paths[call.by_child].insert(call.path);
-    }
-    for (const std::string& path : all.paths[0]) all.paths[1].erase(path);
-    std::map<std::string, int> made;                                // by process, name and path
-    std::map<std::string, std::map<std::string, int>> made_in_all;  // by process, then name
-    std::set<std::string> children;  // what two children do alike counts once
-    for (traced_call call : trace) {
-        call.number = ++made[call.process + " " + call.name + " " + call.path];
-        call.before = made_in_all[call.process];
-        if (all.paths[call.by_child].contains(call.path)) ++made_in_all[call.process][call.name];
-        const std::string key = call.name + " " + call.path + " " + std::to_string(call.number);
-        const bool again = call.by_child && !children.insert(key).second;
-        if (!again && !call.reads) all.calls.push_back(call);
-    }
-    return all;
-}
-
-bool was_injected() {
-    constexpr int tracer_limit_ms = 2000;  // it writes when the daemon may have ended already
-    return wait_until(
-        [] {
-            const std::string trace = read_file(trace_file);
-            return trace.find("INJECTED") != std::string::npos ||
-                   trace.find("killed by SIGKILL") != std::string::npos;
-        },
-        tracer_limit_ms);
-}
-
-void end_injection(const daemon_process& daemon) {
-    std::istringstream status(read_file("/proc/" + std::to_string(daemon.pid()) + "/status"));
-    for (std::string key; status >> key;) {
-        pid_t tracer = 0;
-        // It would pass any other signal on to the daemon.
-        if (key == "TracerPid:" && status >> tracer && tracer > 0) (void)kill(tracer, SIGKILL);
-    }
-}
+bool was_injected() { return was_hit; }
+void end_injection() { has_ended = true; }
+const std::vector<std::string>& recorded_calls() { return calls; }
 
 }  // namespace kivd

@@ -1,45 +1,28 @@
-// Faults in single system calls, by strace.
+// Faults in single system calls. A thread of this process is asked about each call that has to do
+// with files (seccomp's notifications); it lets it through, fails it, or kills who makes it.
 #pragma once
 
-#include <map>
-#include <set>
+#include <climits>
 #include <string>
 #include <vector>
 
-#include "support/daemon_process.h"
-
 namespace kivd {
 
-struct traced_call {
-    std::string process;
-    bool by_child;     // the compactor or the compressor
-    std::string name;  // as strace calls it
-    std::string path;  // as the daemon calls it; empty where it doesn't matter
-    bool reads;
-    int number;                         // of those of its process with that name and path
-    std::map<std::string, int> before;  // what of each name its process had made on `paths`
-};
-
-// A life's calls on files, and what else may fail.
-struct recording {
-    std::vector<traced_call> calls;
-    std::set<std::string> paths[2];  // what is changed by the daemon, and by its children alone
-};
-
-// What happens to a call: "signal=SIGKILL" (ahead of it), "error=EIO", "retval=0".
+// A call goes by who makes it, its name, its path and how many of these its process has made:
+// "daemon write private/events 3", "child rename private/flushed_data.compacted 1".
 struct fault {
-    const char* what;
-    bool lasting;  // to this one, and all later ones that change files
+    std::string call;
+    long result = 0;    // what the call gives; -EIO, or `killed`
+    std::string later;  // also to those from then on: a regular expression, as "write .*"
 };
+inline constexpr long killed = LONG_MIN;  // the process, ahead of the call
 
-inline constexpr char strace_path[] = "/usr/bin/strace";
-
-// Both go in front of the daemon's command. What was recorded is read when it has ended.
-std::vector<std::string> record_arguments();
-std::vector<std::string> inject_arguments(const recording& all, const traced_call& hit,
-                                          const fault& injected);
-recording read_recording();
-bool was_injected();
-void end_injection(const daemon_process& daemon);
+// Once in a process: what this thread starts from now on is asked about. False when the kernel
+// doesn't permit that.
+[[nodiscard]] bool inject(fault wanted);
+[[nodiscard]] bool was_injected();
+void end_injection();
+// All that were made up to the end, in their order; what several children do alike, once.
+[[nodiscard]] const std::vector<std::string>& recorded_calls();
 
 }  // namespace kivd

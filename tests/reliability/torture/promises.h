@@ -7,21 +7,25 @@
 #include <string>
 #include <vector>
 
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
+#include "bench/traffic.h"
 
 namespace kivd {
 
-inline constexpr int ids_of_a_sender = 1000000;  // among which events keep their order
+inline constexpr size_t first_client = 1000;  // of a torture's own; others have lower numbers
+// The diagnostics keep events of such packages.
+inline constexpr char diag_package_end[] = "devicemonitor.powerstat";
+inline constexpr char event_name[] = "ShutDown";
 
 // What was sent to a daemon, and what of it has to be there.
 struct journal {
-    int last_id = 0;
+    uint64_t last_number = 0;
     int64_t last_value = 0;  // of the counter and the static value
     int64_t saved_value = 0;
-    std::set<int> sent;               // may be there, once
-    std::set<int> kept;               // acknowledged
-    std::set<int> logged;             // acknowledged, in the diagnostics
-    std::set<int> seen;               // there before a flush that replaces, or deletes to make room
+    std::set<event_id> sent;          // may be there, once
+    std::set<event_id> kept;          // acknowledged
+    std::set<event_id> logged;        // acknowledged, in the diagnostics
+    std::set<event_id> seen;          // there before a flush that replaces, or deletes to make room
     size_t plain_reports = SIZE_MAX;  // the first ones, before there was a report key
     bool configured = false;
     std::string device_id;
@@ -34,34 +38,25 @@ struct journal {
 
 // In the current directory, with the keys beside it; `before` goes in front of its command.
 daemon_process launch(std::vector<std::string> before = {});
-// How many errors it has logged, but for the one that is of the machine.
-size_t errors(const daemon_process& daemon);
 void wait_children(const daemon_process& daemon);
 // Until the last process that a killed daemon left behind has ended.
 void wait_orphans();
+// Does what is said in words, then asks IA: "e20" and "l20" send an event with a payload of 20
+// bytes, "l" one that the diagnostics keep, too; "values" changes the counter and the static value;
+// the last may be "NC", with the configuration beside the keys, "FL" or "FS".
+// Notes what was acknowledged. False when there was no answer.
+bool carry_out(const std::string& words, const daemon_process& daemon, journal& noted);
+
 // Reports are sealed from now on.
 void install_report_key(journal& noted);
 
-// Events and values, then a request if there is one, then IA.
-struct exchange {
-    std::vector<size_t> events;  // sizes of payloads
-    std::vector<size_t> logged;  // of those for the diagnostics, too
-    bool values;                 // change
-    const char* request;         // FS, FL, NC with the configuration beside the keys, or none
-};
-// Notes what was acknowledged. False when there was no answer.
-bool carry_out(const exchange& wanted, const daemon_process& daemon, journal& noted);
-
 // With no process at work; gives the events that are there or were seen.
-std::set<int> check_files(const journal& noted);
+std::set<event_id> check_files(const journal& noted);
 // Ahead of what may flush: what a failed report has left may be replaced then.
 void note_seen(journal& noted);
 // That what an ended daemon has left is taken up again.
 daemon_process start_again(journal& noted);
 // That all it is asked for succeeds, and that it stops without anything temporary left.
 void check_service_and_stop(daemon_process& daemon, journal& noted);
-
-// Both.
-void check_restart(journal& noted);
 
 }  // namespace kivd
