@@ -10,7 +10,7 @@
 #include <semaphore>
 
 #include "fake_daemon.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

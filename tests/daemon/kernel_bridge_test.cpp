@@ -9,7 +9,7 @@
 
 #include "kernel.pb.h"
 #include "runtime/stop.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

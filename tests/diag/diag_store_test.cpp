@@ -6,7 +6,7 @@
 
 #include "diag/file_export.h"
 #include "report.pb.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "system_logging.pb.h"
 #include "util/clock.h"

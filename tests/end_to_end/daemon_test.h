@@ -13,7 +13,7 @@
 #include <vector>
 
 #include "report.pb.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

@@ -12,7 +12,7 @@
 #include "security/key_paths.h"
 #include "settings.pb.h"
 #include "support/config_package.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

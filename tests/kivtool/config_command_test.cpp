@@ -5,7 +5,7 @@
 #include "kivtool/config/config_build.h"
 #include "kivtool/config/config_show.h"
 #include "kivtool/sample_reports.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"
 

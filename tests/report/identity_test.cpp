@@ -5,7 +5,7 @@
 #include "report/report_generation.h"
 #include "report/state_file.h"
 #include "store/events.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "util/paths.h"
 

@@ -12,7 +12,7 @@
 #include "daemon/modules.h"
 #include "report.pb.h"
 #include "report/report_generation.h"
-#include "support/daemon_process.h"
+#include "bench/daemon_process.h"
 #include "util/clock.h"
 
 namespace kivd {
