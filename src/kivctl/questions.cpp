@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "util/file_io.h"
+#include "util/unique_fd.h"
 
 namespace kivd {
 daemon_questions::daemon_questions(unsigned timeout_ms)
