@@ -9,8 +9,8 @@
 #include <memory>
 #include <semaphore>
 
-#include "fake_daemon.h"
 #include "bench/daemon_process.h"
+#include "fake_daemon.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

@@ -7,9 +7,9 @@
 #include <cstring>
 #include <thread>
 
+#include "bench/daemon_process.h"
 #include "kernel.pb.h"
 #include "runtime/stop.h"
-#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

@@ -4,9 +4,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "bench/daemon_process.h"
 #include "diag/file_export.h"
 #include "report.pb.h"
-#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "system_logging.pb.h"
 #include "util/clock.h"

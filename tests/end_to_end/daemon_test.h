@@ -12,8 +12,8 @@
 #include <string>
 #include <vector>
 
-#include "report.pb.h"
 #include "bench/daemon_process.h"
+#include "report.pb.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <map>
 
+#include "bench/daemon_process.h"
 #include "config/config_parts.h"
 #include "config/limits.h"
 #include "report.pb.h"
@@ -12,7 +13,6 @@
 #include "security/key_paths.h"
 #include "settings.pb.h"
 #include "support/config_package.h"
-#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 
 namespace kivd {

@@ -1,11 +1,11 @@
 #include <random>
 #include <sstream>
 
+#include "bench/daemon_process.h"
 #include "config.pb.h"
 #include "kivtool/config/config_build.h"
 #include "kivtool/config/config_show.h"
 #include "kivtool/sample_reports.h"
-#include "bench/daemon_process.h"
 #include "support/outside_tools.h"
 #include "support/scratch_directory.h"
 

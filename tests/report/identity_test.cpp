@@ -1,11 +1,11 @@
 #include "report/identity.h"
 
+#include "bench/daemon_process.h"
 #include "record/header_record.h"
 #include "report.pb.h"
 #include "report/report_generation.h"
 #include "report/state_file.h"
 #include "store/events.h"
-#include "bench/daemon_process.h"
 #include "support/scratch_directory.h"
 #include "util/paths.h"
 

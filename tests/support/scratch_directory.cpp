@@ -9,10 +9,10 @@
 #include <fstream>
 #include <sstream>
 
+#include "bench/daemon_process.h"
 #include "daemon/modules.h"
 #include "report.pb.h"
 #include "report/report_generation.h"
-#include "bench/daemon_process.h"
 #include "util/clock.h"
 
 namespace kivd {
