@@ -12,7 +12,7 @@ constexpr uint32_t first_capacity = 256;
 constexpr uint32_t max_probes = 1024;  // clients choose the keys, and could choose colliding ones
 
 probe_key** allocate_slots(uint32_t capacity) {
-    return static_cast<probe_key**>(calloc(capacity, sizeof(probe_key*)));
+    return static_cast<probe_key**>(calloc(capacity, sizeof(void*)));
 }
 
 }  // namespace

@@ -28,7 +28,7 @@ void any_list::use_index() {
 bool any_list::make_room() {
     if (count_ < capacity_) return true;
     const size_t capacity = size_t{count_} + grow_by_;
-    void* const grown = realloc(keys_, capacity * sizeof *keys_);
+    void* const grown = realloc(keys_, capacity * sizeof(void*));
     if (grown == nullptr) {
         __android_log_print(ANDROID_LOG_WARN, tag, "Failed to grow list to %zu elements", capacity);
         return false;
@@ -75,7 +75,7 @@ bool any_list::add_key(probe_key* added) {
         return false;
     }
     probe_key** const slot = keys_ + position;
-    memmove(slot + 1, slot, (count_ - position) * sizeof *slot);
+    memmove(slot + 1, slot, (count_ - position) * sizeof(void*));
     *slot = added;
     ++count_;
     index_.add(added);

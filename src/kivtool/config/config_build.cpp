@@ -29,6 +29,7 @@ void lint(const kiv::config::ConfigResponse& file, const std::vector<part_conten
 int run_config_build(const std::vector<part_source>& sources, const config_build_options& options,
                      std::ostream& err) try {
     std::vector<part_content> parts;
+    parts.reserve(sources.size());
     for (const part_source& source : sources) parts.push_back(read_part(source));
     kiv::config::ConfigResponse file = pack_parts(parts);
     if (!options.no_lint) lint(file, parts, options.output_path, err);

@@ -97,7 +97,7 @@ std::string compress_package(const kiv::config::ConfigPackage& package) {
 
 // protobuf writes fields in the order of their numbers, so the signature comes first.
 std::string join_config_file(const kiv::config::ConfigResponse& file) {
-    const std::string bytes = file.SerializeAsString();
+    std::string bytes = file.SerializeAsString();
     if (bytes.size() <= max_config_file_size) return bytes;
     throw std::runtime_error("a configuration has at most " + std::to_string(max_config_file_size) +
                              " bytes, this one has " + std::to_string(bytes.size()));

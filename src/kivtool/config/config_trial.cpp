@@ -116,6 +116,7 @@ int first_difference(const std::vector<bool>& before, const std::vector<bool>& a
 void try_restart(std::span<const part_content> parts, const std::vector<written_filter>& filters,
                  const lint_place& whole, lint_findings& findings) {
     std::vector<std::vector<bool>> matches;
+    matches.reserve(filters.size());
     for (const written_filter& each : filters) matches.push_back(find_matches(each));
     bool has_event_filter = false;
     judge(whole, findings, [&] {
