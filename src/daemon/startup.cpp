@@ -18,6 +18,7 @@
 #include "daemon/modules.h"
 #include "daemon/net/client_sockets.h"
 #include "daemon/options.h"
+#include "daemon/readiness.h"
 #include "diag/diag_store.h"
 #include "intake/config_request.h"
 #include "intake/intake.h"
@@ -168,6 +169,7 @@ void enter_working_directory(const options& given) {
 void shut_down() {
     join_kernel_bridge();
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting down...");
+    finish_datagrams();
     counters_save();
     static_data_save();
     state_save();
@@ -209,7 +211,9 @@ int run_daemon(int argc, char** argv) {
     run_actions();
     if (!start_kernel_bridge()) give_up(tag, "Failed to create kivkb thread, bailing.\n");
     __android_log_print(ANDROID_LOG_INFO, tag, "Ready to serve the world.");
+    tell_service_manager("READY=1");
     event_loop_run();
+    tell_service_manager("STOPPING=1");
 
     shut_down();
     return 0;

@@ -9,7 +9,6 @@
 #include <cstring>
 
 #include "daemon/loop/event_loop.h"
-#include "daemon/loop/turn_away.h"
 #include "format/record_format.h"
 #include "platform/android_log.h"
 #include "runtime/give_up.h"
@@ -20,6 +19,7 @@ namespace {
 constexpr char tag[] = "kivd-kivddi";
 constexpr uint16_t port = 2305;
 constexpr int listen_backlog = 5;
+constexpr int most_reads = 16;        // of what a client sends, at a time
 constexpr size_t frame_size = 31196;  // of the largest request packet
 
 void accept_debug_client(event_handler& handler);
@@ -40,15 +40,24 @@ void close_client() { close_handler(client); }
 // A new client takes the place of the one before.
 void accept_debug_client(event_handler& handler) {
     const int fd = accept4(handler.fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
-    if (fd < 0 && errno != EAGAIN) turn_away_client(handler.fd);
+    if (fd < 0) {
+        if (errno != EAGAIN) event_loop_pause(handler);
+        return;
+    }
     close_client();
     client.fd = fd;
-    if (fd >= 0 && !event_loop_add(client)) close_client();
+    if (!event_loop_add(client)) close_client();
 }
 
+// One that keeps sending is only read now and then.
 void read_debug_client(event_handler& handler) {
-    char unwanted[10];
-    if (recv(handler.fd, unwanted, sizeof unwanted, MSG_DONTWAIT) == 0) close_client();
+    std::array<char, 4096> unwanted;
+    for (int reads = 0; reads < most_reads; ++reads) {
+        const ssize_t size = recv(handler.fd, unwanted.data(), unwanted.size(), MSG_DONTWAIT);
+        if (size < 0 && errno == EAGAIN) return;
+        if (size <= 0) return close_client();
+    }
+    event_loop_pause(handler);
 }
 
 }  // namespace

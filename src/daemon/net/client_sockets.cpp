@@ -9,11 +9,11 @@
 #include <cstring>
 
 #include "daemon/loop/event_loop.h"
-#include "daemon/loop/turn_away.h"
+#include "daemon/net/accept.h"
 #include "daemon/net/connections.h"
 #include "daemon/net/datagrams.h"
 #include "daemon/net/packet_buffer.h"
-#include "daemon/net/wait.h"
+#include "daemon/net/stall_guard.h"
 #include "runtime/give_up.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
@@ -47,7 +47,6 @@ int create_socket(int type, const char* name) {
     if (!fd.ok()) give_up_to("create AF_UNIX socket");
     refuse_descriptors(fd.get());
     if (type == SOCK_DGRAM) {  // before the first packet can arrive
-        set_socket_timeouts(fd.get());
         const int on = 1;
         // Else descriptors would take the room that is meant for credentials.
         if (setsockopt(fd.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on) != 0) {
@@ -73,10 +72,17 @@ int create_socket(int type, const char* name) {
 
 void create_client_sockets() {
     if (!packet_buffers_init()) give_up_to("map packet buffers");
-    turn_away_init();
     for (client_socket& each : client_sockets) {
         each.handler.fd = create_socket(each.type, each.name);
         if (!event_loop_add(each.handler)) give_up_to("add socket to epoll");
+    }
+}
+
+void finish_datagrams() {
+    event_handler& datagrams = client_sockets[0].handler;
+    // From now on sends fail, so what has been sent is not more than one queue holds.
+    (void)shutdown(datagrams.fd, SHUT_RD);
+    while (receive_datagrams(datagrams.fd)) {
     }
 }
 
@@ -88,7 +94,6 @@ void remove_client_sockets() {
         each.handler.fd = -1;
     }
     connections_release();
-    turn_away_release();
     packet_buffers_release();
 }
 

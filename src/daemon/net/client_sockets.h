@@ -7,6 +7,10 @@ namespace kivd {
 // adds them to the event loop. A failure is logged and ends the process with exit status 1.
 void create_client_sockets();
 
+// Takes no more datagrams, and handles those that have been sent: a producer whose call has
+// returned may count on it.
+void finish_datagrams();
+
 // Removes their files, closes them and frees all connections.
 void remove_client_sockets();
 

@@ -8,7 +8,7 @@
 
 #include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
-#include "daemon/net/wait.h"
+#include "daemon/net/stall_guard.h"
 #include "daemon/request/handle_request.h"
 #include "runtime/log_and_raise.h"
 
@@ -46,7 +46,7 @@ int receive_batch(int fd, std::span<mmsghdr> messages) {
 
 }  // namespace
 
-void receive_dgram_client(event_handler& handler) {
+bool receive_datagrams(int fd) {
     packet_buffers& buffers = get_packet_buffers();
     std::array<control_buffer, max_batch> controls;
     std::array<iovec, max_batch> pieces;
@@ -60,13 +60,17 @@ void receive_dgram_client(event_handler& handler) {
         messages[i].msg_hdr.msg_controllen = controls[i].bytes.size();
     }
     wait_before_receive();
-    const int received = receive_batch(handler.fd, messages);
+    const int received = receive_batch(fd, messages);
 
     for (int i = 0; i < received; ++i) {
         const auto slot = static_cast<size_t>(i);
-        handle_datagram(handler.fd, {buffers.packets[slot].bytes.data(), messages[slot].msg_len},
+        handle_datagram(fd, {buffers.packets[slot].bytes.data(), messages[slot].msg_len},
                         messages[slot].msg_hdr);
     }
+    // Each comes with credentials; a socket that takes no more gives messages without.
+    return received > 0 && messages[0].msg_hdr.msg_controllen > 0;
 }
+
+void receive_dgram_client(event_handler& handler) { (void)receive_datagrams(handler.fd); }
 
 }  // namespace kivd

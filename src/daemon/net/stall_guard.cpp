@@ -1,15 +1,7 @@
-#include "daemon/net/wait.h"
+#include "daemon/net/stall_guard.h"
 
-#include <poll.h>
 #include <sys/socket.h>
 #include <sys/time.h>
-
-#include <algorithm>
-#include <array>
-#include <cerrno>
-
-#include "runtime/stop.h"
-#include "util/clock.h"
 
 namespace kivd {
 namespace {
@@ -27,17 +19,6 @@ void set_stall_timer(time_t seconds) {
 }
 
 }  // namespace
-
-bool wait_for_client(int fd, short events, int64_t deadline_ms) {
-    while (!is_stop_requested()) {
-        const int64_t left_ms = std::max(deadline_ms - monotonic_ms(), int64_t{0});
-        std::array waits = {pollfd{fd, events, 0}, pollfd{stop_event_fd(), POLLIN, 0}};
-        const int ready = poll(waits.data(), waits.size(), static_cast<int>(left_ms));
-        if (ready > 0) return waits[0].revents != 0;
-        if (ready == 0 || errno != EINTR) return false;
-    }
-    return false;
-}
 
 stall_guard::stall_guard() { set_stall_timer(1); }
 
