@@ -75,8 +75,11 @@ void send_answer(connection& to, answer given, const char* text, const char* rec
     const int error = errno;
     if (error == EAGAIN) {
         left.deadline_ms = monotonic_ms() + time_ms;
-        to.answer.reset(new (std::nothrow) unsent_answer(std::move(left)));
-        if (to.answer) return event_loop_await(to, readiness::to_write);
+        to.answer.reset(new (std::nothrow) unsent_answer);
+        if (to.answer) {
+            *to.answer = std::move(left);
+            return event_loop_await(to, readiness::to_write);
+        }
     }
     tell_failure(to.fd, left, error);
 }
