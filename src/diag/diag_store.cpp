@@ -70,12 +70,12 @@ unique_fd open_current(int32_t number) {
 void compress(int32_t number) {
     const diag_path plain('z', number);
     const diag_path compressed('y', number);
-    if (gzip_file(plain.text, paths::diag_compressed, gzip_level::best) &&
-        rename(paths::diag_compressed, compressed.text) == 0) {
-        delete_diag_file(plain);
-    } else {
-        (void)unlink(paths::diag_compressed);
+    if (gzip_file(plain.text, paths::diag_compressed, gzip_level::best)) {
+        if (rename(paths::diag_compressed, compressed.text) == 0) return delete_diag_file(plain);
+        log_and_raise(tag, "Failed to rename %s to %s, <%s>", paths::diag_compressed,
+                      compressed.text, strerror(errno));
     }
+    (void)unlink(paths::diag_compressed);
 }
 
 void start_compressor(int32_t number) {
@@ -128,6 +128,7 @@ unique_fd open_write_file() {
 void switch_off() {
     diag_wait_for_compressor();  // it would leave another file
     delete_all_diag_entries();
+    (void)unlink(paths::diag_compressed);  // of a compressor that was killed
     if (rmdir(paths::diag_dir) == 0 || errno == ENOENT) return;
     log_and_raise(tag, "Failed to remove Lumora Diagnostics output directory: %s", strerror(errno));
 }
@@ -160,7 +161,9 @@ void diag_set_active(int32_t value) {
 void diag_add_event(const char* package, const char* name, std::span<const char> payload) {
     if (active == 0 || !is_selected(package, name, payload)) return;
     const unique_fd file = open_write_file();
-    if (file.ok()) (void)write_event_record(file.get(), package, name, payload, tag);
+    const off_t size = file.ok() ? lseek(file.get(), 0, SEEK_END) : -1;
+    if (size < 0 || write_event_record(file.get(), package, name, payload, tag)) return;
+    (void)!ftruncate(file.get(), size);  // nothing may follow a torn record
 }
 
 bool diag_wants_probe(const char* package, const char* name) {

@@ -78,6 +78,9 @@ bool gzip_file(const char* source, const char* destination, gzip_level level) {
         return log_and_raise(tag, "Failed to gzopen output file");
     }
     const unique_deflate end(&stream);
+    // A bounded search for repetitions: without it, random text of two letters takes many times as
+    // long, and whatever waits for this child with it.
+    if (level == gzip_level::best) (void)deflateTune(&stream, 8, 32, 128, 256);
     return copy(input.get(), stream, output.get());
 }
 

@@ -1,5 +1,7 @@
 #include "report/state_file.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
@@ -172,7 +174,12 @@ void state_save() {
         return;
     }
     write_lines(file.get());
-    file.reset();  // a line that got lost only leaves its value at the default
+    const bool written = ferror(file.get()) == 0;
+    if (fclose(file.release()) != 0 || !written) {  // on a full device the close is what fails
+        log_and_raise(tag, "Failed to write new configuration file: %s", strerror(errno));
+        (void)unlink(paths::state_new);
+        return;
+    }
     if (rename(paths::state_new, paths::state) != 0) {
         log_and_raise(tag, "Failed to rename configuration file: %s", strerror(errno));
     }

@@ -48,7 +48,10 @@ std::optional<bool> admit() {
     if (error_nr < INT32_MAX) ++error_nr;
     if (error_nr <= error_period_limit) return error_nr == error_period_limit;
 
-    if (!read_clock(now) || now - error_time <= flood_interval) return std::nullopt;
+    if (!read_clock(now)) return std::nullopt;
+    // A clock that was set back counts as the period's end: it may have been ahead by years.
+    const time_t elapsed = now - error_time;
+    if (elapsed >= 0 && elapsed <= flood_interval) return std::nullopt;
     error_time = now;
     error_nr = 1;
     return false;

@@ -30,6 +30,12 @@ void measure_size() {
     if (size >= 0) events_size = static_cast<uint64_t>(size);
 }
 
+// A full device may have taken a part of a record, and a reader could not find the next one behind
+// it.
+void cut_torn_record() {
+    if (ftruncate(events_fd, static_cast<off_t>(events_size)) != 0) measure_size();
+}
+
 // A report that began without its header could not be read, so such a file is not kept.
 void start_file() {
     if (write_report_header(events_fd)) {
@@ -62,7 +68,7 @@ event_file events_add(const char* package, const char* name, std::span<const cha
     if (const std::optional size = write_event_record(events_fd, package, name, payload, tag)) {
         events_size += *size;
     } else {
-        measure_size();
+        cut_torn_record();
     }
     return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
 }

@@ -58,5 +58,15 @@ TEST_F(state_file, odd_lines_cost_no_more_than_their_value) {
     }
 }
 
+TEST_F(state_file, a_full_device_keeps_the_old_one) {
+    const std::string old = read_file(paths::state);
+    fs::create_symlink("/dev/full", paths::state_new);
+    state_save();
+    EXPECT_EQ(take_log().back(),
+              "E kivd-util: Failed to write new configuration file: No space left on device");
+    EXPECT_EQ(read_file(paths::state), old);
+    EXPECT_FALSE(exists(paths::state_new));
+}
+
 }  // namespace
 }  // namespace kivd
