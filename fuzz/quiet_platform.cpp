@@ -15,13 +15,18 @@ void log_forget_descriptor() {}
 bool check_permission(const char*, pid_t, uid_t) { return false; }
 void forget_permissions() {}
 
-extern "C" int __android_log_print(int /*priority*/, const char* /*tag*/, const char* format, ...) {
-    char text[2048];
+extern "C" int __android_log_print(int priority, const char* tag, const char* format, ...) {
     va_list arguments;
     va_start(arguments, format);
-    const int size = vsnprintf(text, sizeof text, format, arguments);
+    const int size = __android_log_vprint(priority, tag, format, arguments);
     va_end(arguments);
     return size;
+}
+
+extern "C" int __android_log_vprint(int /*priority*/, const char* /*tag*/, const char* format,
+                                    va_list arguments) {
+    char text[2048];
+    return vsnprintf(text, sizeof text, format, arguments);
 }
 
 extern "C" int property_get(const char* /*key*/, char* value, const char* default_value) {

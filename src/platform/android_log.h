@@ -1,9 +1,11 @@
 // The Android log call on plain Linux: one line a message, on standard error in the layout of
 // `logcat -v threadtime` (but with tags as they are, not padded) or, once the daemon has detached,
 // in the system log. There syslog() would wait for a receiver that stopped reading, so lines go by
-// a datagram that doesn't. Control characters become blanks, so no client can forge a line.
+// a datagram that doesn't. Bytes that are no UTF-8 become "?" and what acts on a display becomes
+// blanks, so no client can forge a line.
 #pragma once
 
+#include <cstdarg>
 #include <cstdint>
 
 extern "C" {
@@ -13,9 +15,12 @@ inline constexpr int ANDROID_LOG_WARN = 5;
 inline constexpr int ANDROID_LOG_ERROR = 6;
 
 // Writes one message. It never ends the daemon and hardly delays it: while nobody reads them,
-// lines are dropped, and counted in the first one that gets through again.
+// lines are dropped, and counted in the first one that gets through again. There is room for a
+// whole request in a line.
 [[gnu::format(printf, 3, 4)]] int __android_log_print(int priority, const char* tag,
                                                       const char* format, ...);
+[[gnu::format(printf, 3, 0)]] int __android_log_vprint(int priority, const char* tag,
+                                                       const char* format, va_list arguments);
 
 }  // extern "C"
 

@@ -31,11 +31,17 @@ bool check_permission(const char*, pid_t, uid_t) { return false; }
 void forget_permissions() {}
 
 extern "C" int __android_log_print(int priority, const char* tag, const char* format, ...) {
-    char text[2048];
     va_list arguments;
     va_start(arguments, format);
-    const int size = vsnprintf(text, sizeof text, format, arguments);
+    const int size = __android_log_vprint(priority, tag, format, arguments);
     va_end(arguments);
+    return size;
+}
+
+extern "C" int __android_log_vprint(int priority, const char* tag, const char* format,
+                                    va_list arguments) {
+    char text[32768];
+    const int size = vsnprintf(text, sizeof text, format, arguments);
     const std::lock_guard lock(log_mutex);
     log_lines.push_back(std::string(1, "IWE"[priority - ANDROID_LOG_INFO]) + ' ' + tag + ": " +
                         text);

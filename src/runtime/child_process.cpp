@@ -9,6 +9,7 @@
 #include <csignal>
 
 #include "platform/android_log.h"
+#include "runtime/client_lines.h"
 #include "runtime/daemon_error.h"
 #include "runtime/stop.h"
 
@@ -30,6 +31,7 @@ void drop_descriptors() {
     daemon_error_forget_connection();
     log_forget_descriptor();
     stop_forget_event();
+    line_cause_forget();
 }
 
 }  // namespace

@@ -3,7 +3,8 @@
 
 namespace kivd {
 
-// Logs at ERROR under `tag`, then raises "tag: text". Returns false, so that a failing function can
+// Logs at ERROR under `tag`, unless too many lines come from clients (runtime/client_lines.h), then
+// raises "tag: text". Returns false, so that a failing function can
 // end in `return log_and_raise(...)`. Keeps errno.
 [[gnu::format(printf, 2, 3)]] bool log_and_raise(const char* tag, const char* format, ...);
 

@@ -57,7 +57,7 @@ TEST_F(started_daemon, serves_and_stops_whatever_it_is_started_from) {
                                      SIGIO, SIGPROF, SIGVTALRM, SIGXCPU, SIGXFSZ}) {
                 daemon.send_signal(signal);
             }
-            request(std::vector<std::string>(1500, "XY"));  // more lines than a pipe holds
+            request(std::vector<std::string>(150, "EV " + std::string(1000, 'x')));  // fills a pipe
             request({"EV p event x", "FL"});
             EXPECT_GT(wait_report(1).events_size(), 0);
             std::filesystem::remove("output/kiv_1");

@@ -11,6 +11,7 @@
 #include "daemon/loop/event_loop.h"
 #include "format/record_format.h"
 #include "platform/android_log.h"
+#include "runtime/client_lines.h"
 #include "runtime/give_up.h"
 
 namespace kivd {
@@ -88,7 +89,10 @@ void debug_mirror_request(std::span<const char> packet) {
                                          static_cast<uint32_t>(packet.size()));
     const ssize_t sent = send(client.fd, frame.data(), size, MSG_DONTWAIT | MSG_NOSIGNAL);
     if (sent < 0) {
-        __android_log_print(ANDROID_LOG_ERROR, tag, "Fail to send to socket: %s", strerror(errno));
+        if (take_line()) {
+            __android_log_print(ANDROID_LOG_ERROR, tag, "Fail to send to socket: %s",
+                                strerror(errno));
+        }
         return;
     }
     // Without the rest of a frame it could not find the next one.

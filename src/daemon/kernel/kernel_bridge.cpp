@@ -21,6 +21,7 @@
 #include "daemon/kernel/process_kill.h"
 #include "format/request_words.h"
 #include "platform/android_log.h"
+#include "runtime/client_lines.h"
 #include "runtime/log_and_raise.h"
 #include "runtime/stop.h"
 #include "util/paths.h"
@@ -112,6 +113,7 @@ void pass_counter(const daemon_socket& daemon, std::string_view text) {
 // Passes on nothing but translated events and counters: every local user can send to this netlink
 // port, and the daemon takes what the bridge sends for its own.
 void pass_on(const daemon_socket& daemon, std::span<char> message) {
+    const line_cause_scope cause(line_cause::client);
     const std::string_view text(message.data(), message.size());
     size_t position = 0;
     const std::string_view command = next_token(text, position);

@@ -12,6 +12,7 @@
 
 #include "daemon/loop/save_clock.h"
 #include "platform/android_log.h"
+#include "runtime/client_lines.h"
 #include "runtime/stop.h"
 #include "util/clock.h"
 
@@ -39,7 +40,7 @@ int change(int operation, event_handler& handler, uint32_t events) {
 }
 
 bool is_ticking() {
-    return tick_function != nullptr ||
+    return tick_function != nullptr || are_lines_left_out() ||
            std::ranges::any_of(paused, [](const event_handler* each) { return each != nullptr; });
 }
 
@@ -53,10 +54,13 @@ void tick_when_due() {
     if (now_ms - last_tick_ms < tick_ms) return;
     last_tick_ms = now_ms;
     event_loop_resume();
+    tell_lines_left_out();
+    const line_cause_scope cause(line_cause::client);
     if (tick_function != nullptr && !tick_function(now_ms)) tick_function = nullptr;
 }
 
 void call_handlers(std::span<const epoll_event> events) {
+    const line_cause_scope cause(line_cause::client);  // there is one behind each of them
     for (const epoll_event& event : events) {
         if (is_stop_requested()) return;
         auto& handler = *static_cast<event_handler*>(event.data.ptr);

@@ -7,6 +7,7 @@
 #include "format/request_table.h"
 #include "platform/android_log.h"
 #include "report/state_file.h"
+#include "runtime/client_lines.h"
 #include "runtime/log_and_raise.h"
 
 namespace kivd {
@@ -38,12 +39,14 @@ answer handle_request(int fd, std::span<char> packet, const msghdr* message) {
         return no_answer();
     }
     if (row->access == request_access::permitted && !check_caller_permission(r)) {
-        __android_log_print(ANDROID_LOG_WARN, tag, "%s", row->refusal);
+        if (take_line()) __android_log_print(ANDROID_LOG_WARN, tag, "%s", row->refusal);
         return answer_with(r, row->refusal_reply);
     }
     if (row->collection == request_collection::while_collecting && !is_data_collection_enabled()) {
         return no_answer();
     }
+    const line_cause_scope cause(row->access == request_access::permitted ? line_cause::daemon
+                                                                          : line_cause::client);
     return handlers[row - request_table](r);
 }
 
