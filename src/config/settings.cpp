@@ -1,6 +1,7 @@
 #include "config/settings.h"
 
 #include <fcntl.h>
+#include <unistd.h>
 
 #include "config/config_parts.h"
 #include "platform/android_log.h"
@@ -16,8 +17,9 @@ constexpr char tag[] = "kivd-settings";
 // Now, and by the marker at every later start. Without the marker at least now.
 void disable_permanently() {
     __android_log_print(ANDROID_LOG_INFO, tag, "Kill switch enabled");
+    (void)unlink(paths::disable_marker);  // it could be a link or a pipe
     const unique_fd marker(
-        open(paths::disable_marker, O_RDONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0755));
+        open(paths::disable_marker, O_RDONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0755));
     request_stop();
 }
 

@@ -5,7 +5,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <array>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -29,6 +28,7 @@
 #include "security/signature.h"
 #include "util/directory.h"
 #include "util/file_io.h"
+#include "util/file_replacement.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -90,19 +90,20 @@ bool take_input() {
         return refuse("Failed to unpack configuration");
     }
     const std::optional<file_bytes> file = read_whole_fd(std::move(fd));
+    (void)unlink(paths::config_file);  // should it end the daemon, the next start can do without
     return file && take_config_file(file->view());
 }
 
 }  // namespace
 
 void replace_config_file(std::span<const char> bytes) {
-    const unique_fd file = create_file(paths::config_file);
-    if (!file.ok()) {
+    file_replacement file(paths::config_file, paths::config_file_new);
+    const bool created = file.ok();
+    if (created && (!write_all(file.fd(), bytes.data(), bytes.size()) || !file.close())) {
+        log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
+    } else if (!created || !file.put_into_place()) {
         log_and_raise(tag, "Failed to create configuration file: %s", strerror(errno));
-        return;
     }
-    if (write_all(file.get(), bytes.data(), bytes.size())) return;
-    log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
 }
 
 void install_first_configuration() {
@@ -113,17 +114,12 @@ void install_first_configuration() {
                             paths::first_config_file, strerror(errno));
         return;
     }
-    const unique_fd copy = create_file(paths::config_file);
-    if (!copy.ok()) {
-        __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to open input configuration: %s",
-                            strerror(errno));
+    file_replacement copy(paths::config_file, paths::config_file_new);
+    if (copy.ok() && copy_all(source.get(), copy.fd()) && copy.close() && copy.put_into_place()) {
         return;
     }
-    std::array<char, 4096> chunk;
-    ssize_t size = 0;
-    while ((size = read(source.get(), chunk.data(), chunk.size())) > 0) {
-        if (!write_all(copy.get(), chunk.data(), static_cast<size_t>(size))) return;
-    }
+    __android_log_print(ANDROID_LOG_ERROR, tag, "Failed to open input configuration: %s",
+                        strerror(errno));
 }
 
 bool store_configuration(std::span<const uint8_t> file) {

@@ -46,6 +46,12 @@ struct report_entry {
     uint64_t size;
 };
 
+// A name that only begins like a report's has a number that is taken, but there is no such report
+// to delete.
+bool is_report(const char* name, int32_t number) {
+    return std::string_view(name) == report_name(number).text;
+}
+
 struct directory_state {
     uint64_t total_size = 0;
     int32_t highest = 0;
@@ -55,8 +61,6 @@ struct directory_state {
     size_t oldest_count = 0;
 
     void add(const report_entry& report) {
-        total_size += report.size;
-        highest = std::max(highest, report.number);
         if (oldest_count < oldest.size()) {
             ++oldest_count;
         } else if (oldest.back().number <= report.number) {
@@ -80,11 +84,12 @@ bool scan_output_dir(directory_state& state) {
             return;
         }
         const auto size = static_cast<uint64_t>(status.st_size);
+        state.total_size += size;
         if (const std::optional<int32_t> number = scan_report_number(name)) {
-            state.add({*number, size});
+            state.highest = std::max(state.highest, *number);
+            if (is_report(name, *number)) state.add({*number, size});
             return;
         }
-        state.total_size += size;
         __android_log_print(ANDROID_LOG_WARN, tag, "Bad file in our %s directory: %s",
                             paths::output_dir, name);
     });

@@ -22,6 +22,8 @@
 #include "store/events.h"
 #include "store/static_data.h"
 #include "util/clock.h"
+#include "util/file_io.h"
+#include "util/file_replacement.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -65,6 +67,20 @@ void start_compactor() {
     _exit(0);
 }
 
+// Moves a finished report to where collectors find it, which may be another file system.
+bool publish_report(const char* path) {
+    if (rename(paths::compacted_data, path) == 0) return true;
+    if (errno != EXDEV) return false;
+    const unique_fd source = open_readable(paths::compacted_data);
+    file_replacement copy(path, paths::new_report);
+    if (!source.ok() || !copy.ok() || !copy_all(source.get(), copy.fd()) || !copy.close() ||
+        !copy.put_into_place()) {
+        return false;
+    }
+    (void)unlink(paths::compacted_data);
+    return true;
+}
+
 }  // namespace
 
 bool generate_report() {
@@ -89,7 +105,7 @@ bool compact_report() {
     }
     if (report_key_available() && !seal_compacted_data()) return false;
     const report_path report(next_report_number(*highest));
-    if (rename(paths::compacted_data, report.text) != 0) {
+    if (!publish_report(report.text)) {
         return log_and_raise(tag, "Failed to rename output file: %s", strerror(errno));
     }
     (void)unlink(paths::flushed_data);

@@ -1,6 +1,7 @@
 #include "store/events.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -36,16 +37,22 @@ void cut_torn_record() {
     if (ftruncate(events_fd, static_cast<off_t>(events_size)) != 0) measure_size();
 }
 
-// A report that began without its header could not be read, so such a file is not kept.
+// A report that began without its header could not be read, so such a file is not kept. A link is,
+// since somebody wants events elsewhere.
 void start_file() {
     if (write_report_header(events_fd)) {
         measure_size();
         return;
     }
-    (void)!ftruncate(events_fd, 0);  // in case it cannot be removed either
-    (void)close(events_fd);
-    events_fd = -1;
-    (void)unlink(paths::events);
+    (void)!ftruncate(events_fd, 0);
+    events_release();
+    struct stat status = {};
+    if (lstat(paths::events, &status) != 0 || !S_ISLNK(status.st_mode)) (void)unlink(paths::events);
+}
+
+bool is_empty() {
+    struct stat status = {};
+    return stat(paths::events, &status) == 0 && status.st_size == 0;
 }
 
 }  // namespace
@@ -76,7 +83,7 @@ event_file events_add(const char* package, const char* name, std::span<const cha
 bool events_flush() {
     events_open();
     events_release();
-    return rename(paths::events, paths::flushed_data) == 0;
+    return !is_empty() && rename(paths::events, paths::flushed_data) == 0;
 }
 
 bool events_pending() { return access(paths::events, F_OK) == 0; }

@@ -19,11 +19,11 @@ enum class event_file : bool {
                                     std::span<const char> payload);
 
 // Makes sure that private/events is open and begins with a header; a new file whose header cannot
-// be written whole is removed. Failures have been logged and raised.
+// be written whole is removed, or emptied behind a link. Failures have been logged and raised.
 void events_open();
 
-// Moves the event file, which is made if there is none, to private/flushed_data. False, with errno
-// set, when that fails.
+// Moves the event file, which is made if there is none, to private/flushed_data. False when that
+// fails.
 [[nodiscard]] bool events_flush();
 
 // Whether there is an event file.

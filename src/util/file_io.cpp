@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 
 namespace kivd {
@@ -33,6 +34,16 @@ bool write_all(int fd, std::span<iovec> pieces) {
         }
     }
     return true;
+}
+
+bool copy_all(int source, int destination) {
+    std::array<char, 16384> chunk;
+    for (;;) {
+        const ssize_t size = read(source, chunk.data(), chunk.size());
+        if (size < 0 && errno == EINTR) continue;
+        if (size <= 0) return size == 0;
+        if (!write_all(destination, chunk.data(), static_cast<size_t>(size))) return false;
+    }
 }
 
 std::optional<uint64_t> get_file_size(FILE* file) {

@@ -37,6 +37,9 @@ struct file_bytes {
 // read, is shorter than it said, or there is no memory for it.
 [[nodiscard]] std::optional<file_bytes> read_whole_fd(unique_fd fd);
 
+// Writes all that is left of what `source` reads. False, with errno set, when either fails.
+[[nodiscard]] bool copy_all(int source, int destination);
+
 // Creates a file to write to, or empties the one that is there; not ok, with errno set, on failure.
 [[nodiscard]] unique_fd create_file(const char* path);
 

@@ -14,6 +14,7 @@
 #include "settings.pb.h"
 #include "support/config_package.h"
 #include "support/scratch_directory.h"
+#include "util/paths.h"
 
 namespace kivd {
 namespace {
@@ -179,6 +180,29 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
     const std::string whole = config_file(good);
     EXPECT_TRUE(take(whole + std::string(204799 - whole.size(), 'x')));
     EXPECT_EQ(part("a", "x"), "new");
+}
+
+// Others may write in input/ and output/.
+TEST_F(intake, what_lies_at_a_name_is_neither_followed_nor_waited_for) {
+    const std::string file =
+        config_file({own_part<kivd::Settings>("Settings", "permanently_disable: true")});
+    write_file("precious", "x");
+    for (const bool is_pipe : {false, true}) {
+        for (const char* name : {paths::config_file, paths::config_file_new, paths::config_request,
+                                 paths::config_request_new, paths::disable_marker}) {
+            fs::remove(name);
+            if (!is_pipe) fs::create_symlink("../precious", name);
+            EXPECT_EQ(mkfifo(name, 0600), is_pipe ? 0 : -1);
+        }
+        replace_config_file(file);
+        EXPECT_EQ(read_file("input/config"), file);
+        EXPECT_TRUE(take_new_configuration());
+        for (const char* name : {paths::config_request, paths::disable_marker}) {
+            EXPECT_TRUE(fs::is_regular_file(fs::symlink_status(name))) << name;
+        }
+        EXPECT_FALSE(exists(paths::config_request_new));
+    }
+    EXPECT_EQ(read_file("precious"), "x");
 }
 
 TEST_F(intake, with_a_key_only_what_it_has_signed_is_taken) {

@@ -46,7 +46,7 @@ TEST_F(output_dir, the_lowest_numbers_go_until_there_is_room) {
         {{"bad", "kiv_", "kiv_disabled"}, 300, -1, {"bad", "kiv_", "kiv_disabled"}},
         {{"kiv_-5", "kiv_1"}, 101, 1, {"kiv_1"}},
         {{"kiv_12abc", "kiv_3"}, 101, 12, {"kiv_12abc"}},
-        {{"kiv_12abc", "kiv_13"}, 101, -1, {"kiv_12abc", "kiv_13"}},  // there is no kiv_12
+        {{"kiv_1.part", "kiv_12abc", "kiv_13"}, 201, 12, {"kiv_1.part", "kiv_12abc"}},
         {{"kiv_007"}, 100, -1, {"kiv_007"}},
         {{"kiv_99999999999"}, 101, 1215752191, {"kiv_99999999999"}},
         {{"kiv_2147483647"}, 101, 2147483647, {"kiv_2147483647"}},
