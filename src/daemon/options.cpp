@@ -77,6 +77,9 @@ void set_certificate_path(const char* path) {
     snprintf(directory + size, sizeof directory - size, "%s%s", size > 0 ? "/" : "", path);
     set_report_key_dir(directory);
     set_config_key_dir(directory);
+    if (is_sealing_on() || is_verification_on()) return;
+    __android_log_print(ANDROID_LOG_WARN, tag, "No key can be read in %s: is the last / missing?",
+                        directory);
 }
 
 // Where the files of the command-line operations are looked for; on failure we stay where we are.

@@ -53,12 +53,14 @@ void open_standard_descriptors() {
 
 void detach() {
     const pid_t pid = fork();
-    if (pid < 0) exit(1);
+    if (pid < 0 || (pid == 0 && setsid() < 0))
+        give_up(tag, "Failed to detach: %s", strerror(errno));
     if (pid > 0) _exit(0);
-    if (setsid() < 0) exit(1);
     (void)close_range(0, ~0U, 0);
-    if (open("/dev/null", O_RDWR) != 0 || dup(0) != 1 || dup(0) != 2) exit(1);  // NOLINT
     log_to_system();
+    if (open("/dev/null", O_RDWR) != 0 || dup(0) != 1 || dup(0) != 2) {  // NOLINT
+        give_up(tag, "Failed to detach: %s", strerror(errno));
+    }
 }
 
 unique_fd lock_file() {
@@ -87,7 +89,10 @@ void take_lock() {
     while (!is_current_lock(fd.get())) fd = lock_file();
     char line[20];
     const int size = snprintf(line, sizeof line, "%d\n", getpid());
-    if (!write_all(fd.get(), line, static_cast<size_t>(size))) exit(1);
+    if (!write_all(fd.get(), line, static_cast<size_t>(size))) {
+        give_up(tag, "Failed to write lock file %s, and errno is %s", paths::lock_file,
+                strerror(errno));
+    }
     set_inherited_descriptor(fd.release());
 }
 

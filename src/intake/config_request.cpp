@@ -38,7 +38,7 @@ bool write_content(int fd) {
 }  // namespace
 
 void write_config_request() {
-    file_replacement file(paths::config_request, paths::config_request_new);
+    file_replacement file(paths::config_request, paths::new_config_request);
     if (!file.ok()) return tell_no_file();
     if (!write_content(file.fd())) return;
     if (!file.close() || !file.put_into_place()) tell_no_file();

@@ -97,7 +97,7 @@ bool take_input() {
 }  // namespace
 
 void replace_config_file(std::span<const char> bytes) {
-    file_replacement file(paths::config_file, paths::config_file_new);
+    file_replacement file(paths::config_file, paths::new_config_file);
     const bool created = file.ok();
     if (created && (!write_all(file.fd(), bytes.data(), bytes.size()) || !file.close())) {
         log_and_raise(tag, "Failed to write configuration file: %s", strerror(errno));
@@ -114,7 +114,7 @@ void install_first_configuration() {
                             paths::first_config_file, strerror(errno));
         return;
     }
-    file_replacement copy(paths::config_file, paths::config_file_new);
+    file_replacement copy(paths::config_file, paths::new_config_file);
     if (copy.ok() && copy_all(source.get(), copy.fd()) && copy.close() && copy.put_into_place()) {
         return;
     }
@@ -124,8 +124,7 @@ void install_first_configuration() {
 
 bool store_configuration(std::span<const uint8_t> file) {
     if (!extract_config_fields(file)) return refuse("Failed to unpack configuration");
-    if (config_key_available() &&
-        !verify_file(paths::new_config_data, paths::new_config_signature)) {
+    if (is_verification_on() && !verify_file(paths::new_config_data, paths::new_config_signature)) {
         return refuse("Failed to verify configuration");
     }
     const std::optional<file_bytes> package = read_config_package();

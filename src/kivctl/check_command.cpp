@@ -1,5 +1,7 @@
 #include "kivctl/check_command.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
@@ -10,6 +12,7 @@
 #include "diag/diag_store.h"
 #include "kivctl/daemon_state.h"
 #include "kivctl/directory_faults.h"
+#include "kivctl/file_rights.h"
 #include "kivctl/io.h"
 #include "report/output_dir.h"
 #include "toolkit/json.h"
@@ -56,6 +59,11 @@ fault_list find_collection(const facts& f) {
     if (!f.state.saved) return std::nullopt;
     return if_known(f.state.saved->is_collecting,
                     [](bool is_on) { return one_if(!is_on, "data collection is off"); });
+}
+
+fault_list find_open_lock(const facts& /*all*/) {
+    return one_if(is_open_to_all(paths::lock_file, S_IROTH | S_IWOTH),
+                  std::string("every user can open ") + paths::lock_file);
 }
 
 fault_list find_certificate_path(const facts& f) {
@@ -167,6 +175,9 @@ constexpr check checks[] = {
     {"socket", [](const facts& f) { return f.sockets; },
      "programs cannot reach the daemon as they should",
      "start the daemon again, and find out who changed it"},
+    {"lock_file", find_open_lock,
+     "whoever opens it can lock it, and the daemon would not start again",
+     "start the daemon with a umask of 0077, or chmod 600 the file each time"},
     {"cert_path", find_certificate_path,
      "keys that are elsewhere protect nothing",
      "give the directory of the keys to -c, with the final \"/\", and start the daemon again"},
@@ -205,7 +216,7 @@ constexpr check checks[] = {
      "a report could not be made of it, and the next one takes its place",
      "look for errors of kivd-compactor in the log; save the file first if it is needed"},
     {"bad_file", find_bad_files,
-     "it counts towards the size limit and is never deleted for room; under a name like kiv_7x it even keeps reports from being made",
+     "it counts towards the size limit and is never deleted for room",
      "remove it"},
     {"partial_file", find_full_partial,
      "the next events make a report of it; if it stays like this, reports cannot be made",

@@ -7,11 +7,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <climits>
-#include <cstdlib>
 
+#include "kivctl/file_rights.h"
 #include "security/seal.h"
 #include "util/file_io.h"
 #include "util/unique_openssl.h"
@@ -69,23 +67,6 @@ key_verdict inspect_as(const user_ids& user, std::optional<pid_t> pid, const cha
     return static_cast<key_verdict>(WEXITSTATUS(status));
 }
 
-bool is_open_to_all(const std::string& path, mode_t mode) {
-    struct stat status = {};
-    return stat(path.c_str(), &status) == 0 && (status.st_mode & mode) == mode;
-}
-
-// Whether every user can read the file and search each directory on the way.
-bool is_readable_to_all(const char* path) {
-    char real_path[PATH_MAX];
-    if (realpath(path, real_path) == nullptr || !is_open_to_all(real_path, S_IROTH)) return false;
-    std::string directory = real_path;
-    while (!directory.empty()) {
-        directory.resize(directory.rfind('/'));
-        if (!is_open_to_all(directory + "/", S_IXOTH)) return false;
-    }
-    return true;
-}
-
 }  // namespace
 
 key_verdict check_key(const std::string& path, key_use use, const std::optional<user_ids>& user,
@@ -93,7 +74,7 @@ key_verdict check_key(const std::string& path, key_use use, const std::optional<
     if (user && user->uid == geteuid() && user->uid != 0) return inspect(path.c_str(), use);
     if (user && geteuid() == 0) return inspect_as(*user, pid, path.c_str(), use);
     const key_verdict seen = inspect(path.c_str(), use);
-    if (seen == key_verdict::missing || is_readable_to_all(path.c_str())) return seen;
+    if (seen == key_verdict::missing || is_open_to_all(path, S_IROTH)) return seen;
     return key_verdict::unknown;
 }
 

@@ -103,7 +103,7 @@ bool compact_report() {
     if (!gzip_file(paths::flushed_data, paths::compacted_data, compression)) {
         return log_and_raise(tag, "Failed to compact file");
     }
-    if (report_key_available() && !seal_compacted_data()) return false;
+    if (is_sealing_on() && !seal_compacted_data()) return false;
     const report_path report(next_report_number(*highest));
     if (!publish_report(report.text)) {
         return log_and_raise(tag, "Failed to rename output file: %s", strerror(errno));

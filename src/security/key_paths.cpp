@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
 #include <cstdio>
 
 #include "util/file_io.h"
@@ -20,6 +21,11 @@ constinit key_path config_key_path = {};
 
 void set_path(key_path& path, const char* directory, const char* name) {
     snprintf(path.data(), path.size(), "%s%s", directory, name);
+}
+
+bool is_expected(const key_path& path) {
+    if (access(path.data(), R_OK) == 0) return true;
+    return errno != ENOENT && errno != ENOTDIR && errno != EACCES;
 }
 
 unique_pkey load_public_key(const key_path& path) {
@@ -51,9 +57,9 @@ void clear_report_key_path() { report_key_path.front() = '\0'; }
 
 void clear_config_key_path() { config_key_path.front() = '\0'; }
 
-bool report_key_available() { return access(report_key_path.data(), R_OK) == 0; }
+bool is_sealing_on() { return is_expected(report_key_path); }
 
-bool config_key_available() { return access(config_key_path.data(), R_OK) == 0; }
+bool is_verification_on() { return is_expected(config_key_path); }
 
 unique_pkey load_report_key() { return load_public_key(report_key_path); }
 

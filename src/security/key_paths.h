@@ -1,6 +1,7 @@
-// The two public keys of the device: where they are, and reading them. Each protection is on
-// exactly when its key file is readable. The files are read anew for each use, so that a replaced
-// one takes effect without a restart.
+// The two public keys of the device: where they are, and reading them. A protection is off only
+// while its key file is absent or not ours to read; a file that cannot be looked at for any other
+// reason counts as there, so that what needs it fails. The files are read anew for each use, so that
+// a replaced one takes effect without a restart.
 #pragma once
 
 #include "util/unique_openssl.h"
@@ -19,9 +20,9 @@ void set_config_key_dir(const char* directory);
 void clear_report_key_path();
 void clear_config_key_path();
 
-// Whether there is a key file that the process may read, whatever is in it.
-[[nodiscard]] bool report_key_available();
-[[nodiscard]] bool config_key_available();
+// Whether the protection is on.
+[[nodiscard]] bool is_sealing_on();
+[[nodiscard]] bool is_verification_on();
 
 // The public key in the key file, in PEM; null when the file cannot be read or holds none.
 [[nodiscard]] unique_pkey load_report_key();

@@ -17,10 +17,15 @@ constexpr char tag[] = "kivd/crypto";
 constexpr size_t chunk_size = 16384;
 
 // A report gives the length of the encrypted key in bytes, so the modulus has to have whole bytes.
-bool is_report_key(const EVP_PKEY* key) {
-    if (key == nullptr || EVP_PKEY_is_a(key, "RSA") == 0) return false;
+bool check_report_key(const EVP_PKEY* key) {
+    if (key == nullptr) return log_and_raise(tag, "Failed to open report key");
     const int bits = EVP_PKEY_get_bits(key);
-    return bits > 0 && bits <= int{max_report_key_bits} && bits % 8 == 0;
+    if (EVP_PKEY_is_a(key, "RSA") == 1 && bits > 0 && bits <= int{max_report_key_bits} &&
+        bits % 8 == 0) {
+        return true;
+    }
+    return log_and_raise(tag, "Report key is %s of %d bits, not RSA of at most %d in whole bytes",
+                         EVP_PKEY_get0_type_name(key), bits, int{max_report_key_bits});
 }
 
 bool write_sealed(int output, const uint8_t* bytes, int size) {
@@ -32,10 +37,7 @@ bool write_sealed(int output, const uint8_t* bytes, int size) {
 
 std::optional<sealing> start_sealing() {
     const unique_pkey key = load_report_key();
-    if (!is_report_key(key.get())) {
-        log_and_raise(tag, "Failed to open report key");
-        return std::nullopt;
-    }
+    if (!check_report_key(key.get())) return std::nullopt;
     sealing fresh = {};
     fresh.key_bits = static_cast<uint32_t>(EVP_PKEY_get_bits(key.get()));
     fresh.cipher.reset(EVP_CIPHER_CTX_new());

@@ -28,12 +28,12 @@ inline constexpr char encrypted_data[] = "private/flushed_data.encrypted";
 
 inline constexpr char config_request_name[] = "config_request";  // in output_dir
 inline constexpr char config_request[] = "output/config_request";
-inline constexpr char config_request_new[] = "output/config_request_";  // while it is written
-inline constexpr char new_report[] = "output/new_report";               // while it is copied there
+inline constexpr char new_config_request[] = "output/new_config_request";  // while it is written
+inline constexpr char new_report[] = "output/new_report";  // while it is copied there
 inline constexpr char disable_marker[] = "output/kiv_disabled";
 
 inline constexpr char config_file[] = "input/config";
-inline constexpr char config_file_new[] = "input/config_";  // while it is written
+inline constexpr char new_config_file[] = "input/new_config";  // while it is written
 inline constexpr char first_config_file[] = "/system/etc/kivd.conf";
 inline constexpr char new_config_signature[] = "private/new_config.sig";
 inline constexpr char new_config_data[] = "private/new_config.gz";

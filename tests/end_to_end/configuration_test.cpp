@@ -180,8 +180,19 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
     request({"EV p event x", "FL"});
     EXPECT_EQ(open_report("output/kiv_1").events_size(), 1);
     EXPECT_TRUE(run({"--encrypt", "none"}).starts_with("0 File not found.: No such file"));
-    EXPECT_TRUE(run({"-c", directory, "--encrypt", "file"})  // no "/" at its end
-                    .find("E kivd/crypto: Failed to open report key") != std::string::npos);
+    std::filesystem::create_directory("ec");
+    EXPECT_EQ(system("openssl ecparam -genkey -name prime256v1 -noout | openssl ec -pubout "
+                     "-out ec/kiv_report.pem 2>ec/errors"),
+              0);
+    const std::pair<std::string, std::string> unusable[] = {
+        {"ec/", "E kivd/crypto: Report key is EC of 256 bits, not RSA of at most 4096 in whole"},
+        {directory, "W kivd: No key can be read in " + directory + ": is the last / missing?"},
+        {directory, "E kivd/crypto: Failed to open report key"},
+    };
+    for (const auto& [keys, text] : unusable) {
+        const std::string log = run({"-c", keys, "--encrypt", "file"});
+        EXPECT_NE(log.find(text), std::string::npos) << log;
+    }
 }
 
 }  // namespace

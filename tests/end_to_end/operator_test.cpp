@@ -56,6 +56,7 @@ class operator_commands : public daemon_test {
 
 TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
     daemon_process daemon = start_with_keys();
+    EXPECT_EQ(chmod("kivd.pid", 0600), 0);
     const std::string key = "keys/kiv_report.pem", config_key = "keys/kiv_config.pem";
     const std::string record = "; printf '\\0\\0\\n' >>private/sdata.txt";
     const auto fill = [](int size) {
@@ -105,13 +106,17 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
         {"truncate -s 4349952 output/kiv_1", "output_size"},
         {"sed -i 's/^data-collection.*/data-collection: 0/' private/kivd.state", "collection_off"},
         {"chmod 600 kiv_co_stream", "socket"},
+        {"chmod 604 kivd.pid", "lock_file"},
+        {"chmod 604 kivd.pid; chmod 710 .", ""},
     };
     EXPECT_EQ(system("tar cf all.tar keys private output"), 0);
     for (const auto& c : cases) {
         SCOPED_TRACE(c.damage);
         EXPECT_EQ(system(("( " + c.damage + " ) 2>/dev/null").c_str()), 0);
         EXPECT_EQ(check(), std::pair(c.found, c.found.empty() ? 0 : 1));
-        EXPECT_EQ(system("rm -r keys private output; tar xpf all.tar; chmod 622 kiv_co_stream"), 0);
+        EXPECT_EQ(system("rm -r keys private output; tar xpf all.tar; "
+                         "chmod 755 .; chmod 600 kivd.pid; chmod 622 kiv_co_stream"),
+                  0);
     }
 }
 

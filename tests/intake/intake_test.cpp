@@ -188,8 +188,8 @@ TEST_F(intake, what_lies_at_a_name_is_neither_followed_nor_waited_for) {
         config_file({own_part<kivd::Settings>("Settings", "permanently_disable: true")});
     write_file("precious", "x");
     for (const bool is_pipe : {false, true}) {
-        for (const char* name : {paths::config_file, paths::config_file_new, paths::config_request,
-                                 paths::config_request_new, paths::disable_marker}) {
+        for (const char* name : {paths::config_file, paths::new_config_file, paths::config_request,
+                                 paths::new_config_request, paths::disable_marker}) {
             fs::remove(name);
             if (!is_pipe) fs::create_symlink("../precious", name);
             EXPECT_EQ(mkfifo(name, 0600), is_pipe ? 0 : -1);
@@ -200,7 +200,7 @@ TEST_F(intake, what_lies_at_a_name_is_neither_followed_nor_waited_for) {
         for (const char* name : {paths::config_request, paths::disable_marker}) {
             EXPECT_TRUE(fs::is_regular_file(fs::symlink_status(name))) << name;
         }
-        EXPECT_FALSE(exists(paths::config_request_new));
+        EXPECT_FALSE(exists(paths::new_config_request));
     }
     EXPECT_EQ(read_file("precious"), "x");
 }
@@ -218,6 +218,11 @@ TEST_F(intake, with_a_key_only_what_it_has_signed_is_taken) {
         EXPECT_FALSE(take(config_file(data, signature)));
         EXPECT_EQ(take_log(), lines({verify_failure}));
     }
+    fs::create_directory("loop");
+    fs::create_symlink("kiv_config.pem", "loop/kiv_config.pem");  // there, but it cannot be read
+    set_config_key_dir("loop/");
+    EXPECT_FALSE(take(file));
+    set_config_key_dir("./");
     // What an intake that was killed left behind is not this file's.
     write_file("private/new_config.sig", sign(data, "config"));
     EXPECT_FALSE(take(config_file(data)));

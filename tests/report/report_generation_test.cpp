@@ -79,6 +79,17 @@ TEST_F(report_generation, a_failed_compactor_leaves_its_data_and_no_report) {
     EXPECT_TRUE(exists("output/kiv_1"));
 }
 
+TEST_F(report_generation, the_output_may_be_on_a_file_system_of_its_own) {
+    std::string elsewhere = "/dev/shm/kivd-XXXXXX";
+    ASSERT_NE(mkdtemp(elsewhere.data()), nullptr);
+    fs::remove("output");
+    fs::create_directory_symlink(elsewhere, "output");
+    (void)events_add("p", "e", "x"s);
+    EXPECT_EQ(contents(next_report()), "P1; e x; ");
+    EXPECT_FALSE(exists(paths::compacted_data) || exists(paths::new_report));
+    fs::remove_all(elsewhere);
+}
+
 TEST_F(report_generation, a_report_that_cannot_be_sealed_whole_does_not_appear) {
     make_keys("report");
     set_report_key_dir("./");

@@ -50,5 +50,16 @@ TEST_F(event_store, a_torn_event_is_cut_off) {
     }
 }
 
+TEST_F(event_store, a_link_stays_when_there_is_no_room_for_a_header) {
+    fs::create_symlink("../elsewhere", paths::events);
+    limit_file_size(header.size() - 1);
+    (void)add();
+    EXPECT_FALSE(events_flush());
+    EXPECT_EQ(read_file("elsewhere"), "");
+    limit_file_size(RLIM_INFINITY);
+    (void)add();
+    EXPECT_EQ(read_file("elsewhere"), header + event);
+}
+
 }  // namespace
 }  // namespace kivd

@@ -31,6 +31,7 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivkb";
+constexpr int retry_ms = 100;
 constexpr suseconds_t send_timeout_us = 50000;  // then it looks whether the daemon is to stop
 
 constinit pthread_t thread = {};
@@ -55,6 +56,12 @@ bool wait_for_message(int fd) {
 // The size of the message that waits, without taking it; -1 on failure.
 ssize_t peek_size(int netlink) {
     return recv(netlink, nullptr, 0, MSG_PEEK | MSG_TRUNC | MSG_DONTWAIT);
+}
+
+// The message is still there after an error that lasts, and would be found again at once.
+void wait_after(int error) {
+    const bool is_over = error == EAGAIN || error == EINTR || error == ENOBUFS;  // it tells a loss
+    if (!is_over) wait_for_stop(retry_ms);
 }
 
 // Waits for room in the daemon's queue, until the daemon is to stop. Returns what sendto returns.
@@ -176,15 +183,15 @@ bool send_pid_to_kernel(int netlink) {
 void receive_kernel_message(int netlink, daemon_socket& daemon) {
     if (!wait_for_message(netlink)) return;
     const ssize_t peeked = peek_size(netlink);
-    if (peeked < 0) return;  // messages were lost before this one
+    if (peeked < 0) return wait_after(errno);
     const auto size = static_cast<size_t>(peeked);
     const unique_malloc<char> buffer(static_cast<char*>(malloc(size + 1)));
     if (!buffer) {
         log_and_raise(tag, "Unable to create buffer.\n");
-        return;
+        return wait_after(ENOMEM);
     }
     const ssize_t received = recv(netlink, buffer.get(), size + 1, MSG_DONTWAIT);
-    if (received <= 0) return;
+    if (received < 0) return wait_after(errno);
     const std::span<char> message(buffer.get(), static_cast<size_t>(received));
     pass_on(daemon, message.subspan(std::min(sizeof(nlmsghdr), message.size())));
 }
