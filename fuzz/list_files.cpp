@@ -24,15 +24,15 @@ void stop_clock() { set_test_clock(2000000000); }
 
 void save_counters() {
     stop_clock();
-    counters_update("fuzz", "touched", 0, counter_mode::increment);
+    counters_update("fuzz", "touched", 0, counter_mode::increment, 0);
     stop_clock();
     counters_save();
 }
 
 void save_static_data() {
-    static_data_set("fuzz", "touched", "before");
+    static_data_set("fuzz", "touched", "before", 0);
     stop_clock();
-    static_data_set("fuzz", "touched", "after");
+    static_data_set("fuzz", "touched", "after", 0);
     stop_clock();
     static_data_save();
 }

@@ -55,7 +55,8 @@ constinit probe_store<counter_entry> store(tag, paths::counters, &limits::expire
 
 void counters_init() { store.load(); }
 
-void counters_update(const char* package, const char* name, int32_t value, counter_mode mode) {
+void counters_update(const char* package, const char* name, int32_t value, counter_mode mode,
+                     uid_t user) {
     if (!filter_match(filter_kind::counters, package, name)) return;
     const probe_key key = {package, name};
     const int64_t now = now_ms();
@@ -67,8 +68,10 @@ void counters_update(const char* package, const char* name, int32_t value, count
         store.mark_changed();
         return;
     }
+    if (!store.make_room(key, user)) return;
     unique_entry<counter_entry> added = make_entry<counter_entry>(key, now, now, int64_t{value});
-    if (added && !store.add(std::move(added))) log_and_raise(tag, "Failed to add new counter.");
+    if (added && !store.add(std::move(added), user))
+        log_and_raise(tag, "Failed to add new counter.");
 }
 
 void counters_save() { store.save(); }

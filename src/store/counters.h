@@ -3,6 +3,8 @@
 // so gone after a restart.
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 
 #include "record/record_file.h"
@@ -14,9 +16,11 @@ enum class counter_mode : uint8_t { set, increment };
 // Loads private/counters.txt; a missing file is fine.
 void counters_init();
 
-// Sets the counter to `value` or adds it (the sum wraps); an unknown counter is created with it.
-// A counter that the filter refuses is left as it is.
-void counters_update(const char* package, const char* name, int32_t value, counter_mode mode);
+// Sets the counter to `value` or adds it (the sum wraps); an unknown counter is created with it, if
+// there is room for one of that user's (store/probe_store.h). A counter that the filter refuses is
+// left as it is.
+void counters_update(const char* package, const char* name, int32_t value, counter_mode mode,
+                     uid_t user);
 
 // Writes private/counters.txt when something changed since the last good save. Failures have been
 // logged and raised; the next save tries again.

@@ -1,6 +1,13 @@
 // What the stores of counters and of static data have in common: a sorted list of named values that
 // is loaded at the start, saved when something changed, and reported by what changed.
+//
+// A store has at most as many names as a list file, so that a start finds all of them again. Some
+// places are kept for the daemon's own user, whose errors are counted too, and of the others a user
+// other than root may have taken half. What has been loaded is nobody's.
 #pragma once
+
+#include <sys/types.h>
+#include <unistd.h>
 
 #include <cstdint>
 #include <optional>
@@ -11,6 +18,9 @@
 #include "list/list_file.h"
 #include "list/sorted_list.h"
 #include "record/record_file.h"
+#include "runtime/log_and_raise.h"
+#include "util/clock.h"
+#include "util/user_counts.h"
 
 namespace kivd {
 
@@ -30,7 +40,7 @@ class probe_store {
 
     // A missing file is fine.
     void load() {
-        list_.clear();
+        release();
         dirty_ = false;
         list_.use_index();
         (void)list_load(list_, path_, entry::parse);
@@ -38,9 +48,19 @@ class probe_store {
 
     [[nodiscard]] entry* find(const probe_key& key) const { return list_.find(key); }
 
+    // Whether that user may add the name. There may be room once what has expired is gone. If there
+    // is none, that has been logged and raised.
+    [[nodiscard]] bool make_room(const probe_key& key, uid_t user) {
+        if (has_room(user)) return true;
+        drop_expired();
+        return has_room(user) ||
+               log_and_raise(tag_, "Too many names - dropping. [%s:%s] of user %u", key.package,
+                             key.name, user);
+    }
+
     // False when the entry could not be added; it is then gone.
-    [[nodiscard]] bool add(unique_entry<entry> added) {
-        if (list_.add(std::move(added)) == nullptr) return false;
+    [[nodiscard]] bool add(unique_entry<entry> added, uid_t user) {
+        if (!makers_.add(user) || list_.add(std::move(added)) == nullptr) return false;
         dirty_ = true;
         return true;
     }
@@ -74,14 +94,43 @@ class probe_store {
             [since_ms](const entry& each) { return each.changed_ms() >= since_ms; });
     }
 
-    void release() { list_.clear(); }
+    void release() {
+        list_.clear();
+        makers_.clear();
+        last_drop_ms_ = 0;
+    }
 
  private:
+    static constexpr uint32_t kept_names = 16;
+    static constexpr uint32_t most_names = list_records_max - kept_names;
+    static constexpr int64_t drop_interval_ms = 60000;  // it looks at every entry
+
+    [[nodiscard]] bool has_room(uid_t user) const {
+        if (user == getuid()) return list_.size() < list_records_max;
+        return list_.size() < most_names &&
+               (is_privileged(user) || makers_.of(user) < list_records_max / 2);
+    }
+
+    // The names that are left belong to nobody, as after a start.
+    void drop_expired() {
+        const int64_t now_ms = monotonic_ms();
+        if (last_drop_ms_ != 0 && now_ms - last_drop_ms_ < drop_interval_ms) return;
+        last_drop_ms_ = now_ms;
+        const int64_t cutoff_ms = expiry_cutoff_ms(get_limits().*expire_age_);
+        const uint32_t before = list_.size();
+        list_.drop_if([cutoff_ms](const entry& each, const entry* /*next*/) {
+            return each.seen_ms() <= cutoff_ms;
+        });
+        if (list_.size() < before) makers_.clear();
+    }
+
     const char* tag_;
     const char* path_;
     uint32_t limits::*expire_age_;
     sorted_list<entry> list_;
     bool dirty_ = false;
+    user_counts makers_;
+    int64_t last_drop_ms_ = 0;
 };
 
 }  // namespace kivd

@@ -4,6 +4,8 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <functional>
+#include <string_view>
 
 #include "config/filters.h"
 #include "format/record_format.h"
@@ -23,12 +25,31 @@ constexpr size_t saved_value_size = 256;
 
 const char* or_null(const char* text) { return text != nullptr ? text : "NULL"; }
 
+// What is needed of a value. No report has more of it than fits into a record, so the rest is only
+// there to be compared.
+struct kept_value {
+    static constexpr size_t size_max = 512;
+
+    // Without a text when there is no memory.
+    explicit kept_value(const char* value) : text(strndup(value, size_max)), hash(hash_of(value)) {}
+
+    [[nodiscard]] bool equals(const char* value) const {
+        return hash == hash_of(value) && strncmp(text.get(), value, size_max) == 0;
+    }
+
+    unique_malloc<char> text;  // its first bytes
+    uint64_t hash;             // of all of it
+
+ private:
+    static uint64_t hash_of(const char* value) { return std::hash<std::string_view>()(value); }
+};
+
 struct static_entry : probe_key {
     int64_t timestamp;  // when the value last changed, in ms
     int64_t last_seen;  // when it was last set, in ms
-    unique_malloc<char> value;
+    kept_value value;
 
-    static constexpr size_t report_record_size = 512;
+    static constexpr size_t report_record_size = kept_value::size_max;
 
     static unique_entry<static_entry> parse(std::string_view record) {
         std::array<const char*, 5> fields;
@@ -43,21 +64,21 @@ struct static_entry : probe_key {
     // Null when there is no memory.
     static unique_entry<static_entry> make(const probe_key& key, int64_t timestamp,
                                            int64_t last_seen, const char* value) {
-        unique_malloc<char> copy(strdup(value));
-        if (!copy) return nullptr;
-        return make_entry<static_entry>(key, timestamp, last_seen, std::move(copy));
+        kept_value kept(value);
+        if (!kept.text) return nullptr;
+        return make_entry<static_entry>(key, timestamp, last_seen, std::move(kept));
     }
     [[nodiscard]] bool write(list_writer& writer) const {
         writer.text(package);
         writer.text(name);
         writer.number(timestamp);
         writer.number(last_seen);
-        writer.text({value.get(), strnlen(value.get(), saved_value_size)});
+        writer.text({value.text.get(), strnlen(value.text.get(), saved_value_size)});
         if (writer.end_record()) return true;
         return log_and_raise(tag, "Failed to write to sdata file: %s", strerror(errno));
     }
     [[nodiscard]] size_t pack(std::span<uint8_t> record) const {
-        return pack_static_record(record, package, name, timestamp, value.get());
+        return pack_static_record(record, package, name, timestamp, value.text.get());
     }
     [[nodiscard]] int64_t changed_ms() const { return timestamp; }
     [[nodiscard]] int64_t seen_ms() const { return last_seen; }
@@ -66,9 +87,9 @@ struct static_entry : probe_key {
 constinit probe_store<static_entry> store(tag, paths::static_data, &limits::expire_sdata_age);
 
 void change_value(static_entry& item, const char* value, int64_t now) {
-    unique_malloc<char> copy(strdup(value));
-    if (!copy) return;
-    item.value = std::move(copy);
+    kept_value kept(value);
+    if (!kept.text) return;
+    item.value = std::move(kept);
     item.timestamp = now;
     store.mark_changed();
 }
@@ -77,17 +98,19 @@ void change_value(static_entry& item, const char* value, int64_t now) {
 
 void static_data_init() { store.load(); }
 
-void static_data_set(const char* package, const char* name, const char* value) {
+void static_data_set(const char* package, const char* name, const char* value, uid_t user) {
     if (!filter_match(filter_kind::static_data, package, name)) return;
     const probe_key key = {package, name};
     const int64_t now = now_ms();
     if (static_entry* const item = store.find(key)) {
         item->last_seen = now;
-        if (strcmp(item->value.get(), value) != 0) change_value(*item, value, now);
+        if (!item->value.equals(value)) change_value(*item, value, now);
         return;
     }
+    if (!store.make_room(key, user)) return;
     unique_entry<static_entry> added = static_entry::make(key, now, now, value);
-    if (added && !store.add(std::move(added))) log_and_raise(tag, "Failed to add new static data.");
+    if (added && !store.add(std::move(added), user))
+        log_and_raise(tag, "Failed to add new static data.");
 }
 
 void static_data_save() { store.save(); }

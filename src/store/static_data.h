@@ -2,6 +2,8 @@
 // it changed; setting it again to the same text only keeps it from expiring.
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 
 #include "record/record_file.h"
@@ -11,8 +13,9 @@ namespace kivd {
 // Loads private/sdata.txt; a missing file is fine.
 void static_data_init();
 
-// Stores a copy of `value`, of any length.
-void static_data_set(const char* package, const char* name, const char* value);
+// Stores what can be reported and saved of `value`, and what tells it from others. There has to be
+// room for a new name of that user's (store/probe_store.h).
+void static_data_set(const char* package, const char* name, const char* value, uid_t user);
 
 // Writes private/sdata.txt when an item was created or changed since the last good save, each value
 // cut to 256 bytes. Failures have been logged and raised; the next save tries again.

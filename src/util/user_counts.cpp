@@ -1,9 +1,13 @@
 #include "util/user_counts.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cstdlib>
 
 namespace kivd {
+
+bool is_privileged(uid_t uid) { return uid == 0 || uid == getuid(); }
 
 user_counts::count* user_counts::find(uid_t uid) const {
     const auto found = std::ranges::find_if(

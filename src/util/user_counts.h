@@ -1,4 +1,4 @@
-// How many things of one kind each user has.
+// Sharing out what is scarce: how many things of one kind each user has.
 #pragma once
 
 #include <sys/types.h>
@@ -9,6 +9,9 @@
 #include "util/releaser.h"
 
 namespace kivd {
+
+// Whether it is root, or whom this process runs as: they may use what is kept from others.
+[[nodiscard]] bool is_privileged(uid_t uid);
 
 // There are few users, so a search from the first one on is quick.
 class user_counts {

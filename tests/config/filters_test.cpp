@@ -112,8 +112,8 @@ TEST_F(filters, each_store_asks_its_own) {
                 " } staticdata_filter { type: EXCLUDE " + item("p", "s") + " }");
     for (const char* name : {"e", "c", "s"}) {
         (void)events_add("p", name, std::string_view("data"));
-        counters_update("p", name, 1, counter_mode::set);
-        static_data_set("p", name, "value");
+        counters_update("p", name, 1, counter_mode::set, 0);
+        static_data_set("p", name, "value", 0);
     }
     EXPECT_EQ(contents(next_report()), "P1; c data; s data; e=1; s=1; c: value; e: value; ");
 

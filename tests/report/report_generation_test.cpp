@@ -25,11 +25,11 @@ TEST_F(report_generation, all_files_have_the_documented_bytes) {
     set_test_clock(start);
     (void)events_add("app", "start", "\x01\xFF"s);
     set_test_clock(start);
-    counters_update("app", "starts", 5, counter_mode::increment);
+    counters_update("app", "starts", 5, counter_mode::increment, 0);
     set_test_clock(start + 2);
-    counters_update("app", "starts", -7, counter_mode::increment);
+    counters_update("app", "starts", -7, counter_mode::increment, 0);
     set_test_clock(start + 4);
-    for (int i = 0; i < 2; ++i) static_data_set("app", "mode", "night, auto");
+    for (int i = 0; i < 2; ++i) static_data_set("app", "mode", "night, auto", 0);
     set_test_clock(start + 4);
     (void)events_add("a", "b", {});
     counters_save();
@@ -50,7 +50,7 @@ TEST_F(report_generation, all_files_have_the_documented_bytes) {
 TEST_F(report_generation, each_report_has_what_came_since_the_last_one) {
     EXPECT_FALSE(generate_report());
     EXPECT_EQ(take_log(), lines{});
-    counters_update("p", "c1", 1, counter_mode::set);
+    counters_update("p", "c1", 1, counter_mode::set, 0);
     EXPECT_EQ(contents(next_report()), "P1; c1=1; ");
     for (const int64_t flushed = now_ms(); now_ms() == flushed;) {
     }

@@ -1,7 +1,6 @@
 #include "daemon/net/client_places.h"
 
 #include <sys/resource.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cstdint>
@@ -27,8 +26,6 @@ uint32_t all_places() {
 }
 
 uint32_t kept_places(uint32_t places) { return std::clamp(places / 8, 2U, 64U); }
-
-bool is_privileged(uid_t uid) { return uid == 0 || uid == getuid(); }
 
 }  // namespace
 

@@ -35,11 +35,19 @@ std::optional<ucred> peer_of(int fd) {
     return std::nullopt;
 }
 
+std::optional<ucred> caller_of(const request& r) {
+    return r.message != nullptr ? sender_of(*r.message) : peer_of(r.fd);
+}
+
 }  // namespace
 
+uid_t user_of(const request& r) {
+    const std::optional<ucred> caller = caller_of(r);
+    return caller ? caller->uid : unknown_user;
+}
+
 bool check_caller_permission(const request& r) {
-    const std::optional<ucred> caller =
-        r.message != nullptr ? sender_of(*r.message) : peer_of(r.fd);
+    const std::optional<ucred> caller = caller_of(r);
     if (!caller) return false;
     return caller->uid == getuid() ||
            check_permission(private_permission, caller->pid, caller->uid);

@@ -1,9 +1,16 @@
 // Who sent a request, and what they may do.
 #pragma once
 
+#include <sys/types.h>
+
 #include "daemon/request/request.h"
 
 namespace kivd {
+
+inline constexpr auto unknown_user = static_cast<uid_t>(-1);
+
+// Whom the sender runs as; unknown_user without credentials.
+[[nodiscard]] uid_t user_of(const request& r);
 
 // Whether the sender runs under the daemon's own user id or holds the permission for private
 // requests. A sender without credentials does not. A connection has the credentials of the moment

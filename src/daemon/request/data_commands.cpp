@@ -1,6 +1,7 @@
 // The commands that every client may send: probe data and queries.
 #include "config/config_parts.h"
 #include "config/filters.h"
+#include "daemon/request/caller.h"
 #include "daemon/request/commands.h"
 #include "diag/diag_store.h"
 #include "format/request_words.h"
@@ -22,7 +23,7 @@ void update_counter(request& r, counter_mode mode) {
     if (!take_probe_id(r, probe)) return;
     const char* const value = next_token(r);
     if (!check_probe_value(r, probe, value)) return;
-    counters_update(probe.package, probe.name, parse_saturated(value), mode);
+    counters_update(probe.package, probe.name, parse_saturated(value), mode, user_of(r));
 }
 
 }  // namespace
@@ -55,7 +56,8 @@ answer set_static_data(request& r) {
     probe_id probe = {};
     if (!take_probe_id(r, probe)) return no_answer();
     const char* const value = text_rest(r);
-    if (check_probe_value(r, probe, value)) static_data_set(probe.package, probe.name, value);
+    if (!check_probe_value(r, probe, value)) return no_answer();
+    static_data_set(probe.package, probe.name, value, user_of(r));
     return no_answer();
 }
 
