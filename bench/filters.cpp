@@ -66,7 +66,7 @@ double time_matches(const std::vector<probe>& asked, unsigned calls, auto match)
 double time_filter(Filter::Type type, const std::vector<probe>& listed,
                    const std::vector<probe>& asked, unsigned calls) {
     const std::string payload = pack_event_filter(type, listed);
-    retire_config_parts();
+    retire_config_parts({});
     store_config_part("kivd", "FilterConfig",
                       {reinterpret_cast<const uint8_t*>(payload.data()), payload.size()});
     apply_filter_config();

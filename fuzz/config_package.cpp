@@ -9,11 +9,11 @@
 #include "config/filters.h"
 #include "config/limits.h"
 #include "config/settings.h"
+#include "format/protobuf_message.h"
 #include "fuzz/harness.h"
 #include "intake/run_actions.h"
 #include "report/output_dir.h"
 #include "util/paths.h"
-#include "util/protobuf_message.h"
 
 namespace kivd {
 namespace {
@@ -59,8 +59,8 @@ std::vector<bool> ask_filters(const Kiv__Config__FilterConfig& config) {
 
 void apply_filters(input_bytes part) {
     apply_filter_config();
-    const auto config = unpack_message<kiv__config__filter_config__unpack,
-                                       kiv__config__filter_config__free_unpacked>(part);
+    const auto config =
+        unpack_message<Kiv__Config__FilterConfig>(kiv__config__filter_config__descriptor, part);
     if (!config) {
         require(!exists(paths::event_filter), "a filter without a configuration");
         return;

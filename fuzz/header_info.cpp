@@ -1,11 +1,11 @@
 // The identity that is given by hand, in private/header_info.conf.
+#include "format/protobuf_message.h"
 #include "fuzz/harness.h"
 #include "record/header_record.h"
 #include "report.pb-c.h"
 #include "report/identity.h"
 #include "report/state_file.h"
 #include "util/paths.h"
-#include "util/protobuf_message.h"
 
 namespace kivd {
 namespace {
@@ -14,7 +14,7 @@ namespace {
 std::string updated_header() {
     update_header_info();
     const auto header = get_report_header();
-    const auto report = unpack_message<kiv__report__unpack, kiv__report__free_unpacked>(header);
+    const auto report = unpack_message<Kiv__Report>(kiv__report__descriptor, header);
     require(report && report->header != nullptr, "the report header cannot be decoded");
     return {header.begin(), header.end()};
 }

@@ -3,9 +3,9 @@
 #include <string_view>
 
 #include "diag/log_message.h"
+#include "format/protobuf_message.h"
 #include "fuzz/harness.h"
 #include "system_logging.pb-c.h"
-#include "util/protobuf_message.h"
 
 namespace kivd {
 namespace {
@@ -13,8 +13,8 @@ namespace {
 constexpr std::string_view kept_tags[] = {"am_anr", "am_crash", "RILJ"};
 
 void check_kept(input_bytes input) {
-    const auto message = unpack_message<kiv__system_logging__log_message__unpack,
-                                        kiv__system_logging__log_message__free_unpacked>(input);
+    const auto message = unpack_message<Kiv__SystemLogging__LogMessage>(
+        kiv__system_logging__log_message__descriptor, input);
     require(message != nullptr && message->tag != nullptr, "what is no message is kept");
     require(std::ranges::find(kept_tags, std::string_view(message->tag)) != std::end(kept_tags),
             "a message that nobody wants is kept");

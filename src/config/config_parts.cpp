@@ -6,6 +6,8 @@
 #include <array>
 #include <climits>
 #include <cstdio>
+#include <cstring>
+#include <iterator>
 #include <string_view>
 
 #include "format/probe_key.h"
@@ -20,7 +22,6 @@ namespace kivd {
 namespace {
 
 constexpr char tag[] = "kivd-conf";
-constexpr char own_package[] = "kivd";
 
 // Holds the highest id that was ever given out; has no file and is never in force.
 constexpr probe_key last_id_key = {own_package, "_last_id"};
@@ -129,12 +130,24 @@ config_item* add_part(const probe_key& key) {
     return added;
 }
 
-void write_part(int32_t id, std::span<const uint8_t> payload) {
+bool write_part(int32_t id, std::span<const uint8_t> payload) {
     const part_path path(id);
     const unique_fd file = create_file(path.text);
-    if (!file.ok() || write_all(file.get(), payload.data(), payload.size())) return;
-    log_and_raise(tag, "Failed to write config %d with %zu bytes", id, payload.size());
+    if (file.ok() && write_all(file.get(), payload.data(), payload.size())) return true;
     (void)unlink(path.text);
+    return log_and_raise(tag, "Failed to write config %d with %zu bytes", id, payload.size());
+}
+
+bool is_retired(const config_item& item) { return item.in_use == 0 && !is_last_id(item); }
+
+void delete_file_of(const config_item& item) { (void)unlink(part_path(item.id).text); }
+
+// The places of the parts that left earlier; their ids are not given out again.
+void free_places() {
+    parts.drop_if([](const config_item& item, const config_item* /*next*/) {
+        if (is_retired(item)) delete_file_of(item);
+        return is_retired(item);
+    });
 }
 
 }  // namespace
@@ -160,7 +173,30 @@ std::optional<file_bytes> read_own_part(const char* name) {
     return read_whole_fd(std::move(part));
 }
 
-void retire_config_parts() {
+bool can_hold_parts(new_parts given) {
+    constexpr size_t most_parts = list_records_max - 1;  // beside the highest id
+    if (given.size() > most_parts) {
+        return log_and_raise(tag, "Too many parts: %zu, of at most %zu", given.size(), most_parts);
+    }
+    char digits[20];
+    const char* const end = format_int64(digits, highest_id() + std::ssize(given));
+    const size_t numbers_size = static_cast<size_t>(end - digits) + 1;  // an id, and in_use
+    for (const Kiv__Config__ConfigPart* part : given) {
+        const size_t text_size = strlen(part->package) + strlen(part->name);
+        if (fits_list_record(4, text_size + numbers_size)) continue;
+        return log_and_raise(tag, "Too long name of part [%s:%s]", part->package, part->name);
+    }
+    return true;
+}
+
+void retire_config_parts(new_parts next) {
+    parts.for_each([](config_item& item) { item.in_use = 0; });
+    size_t added = parts.find(last_id_key) != nullptr ? 0 : 1;
+    for (const Kiv__Config__ConfigPart* part : next) {
+        config_item* const item = parts.find({part->package, part->name});
+        item != nullptr ? item->in_use = 1 : ++added;
+    }
+    if (parts.size() + added > list_records_max) free_places();
     parts.for_each([](config_item& item) { item.in_use = 0; });
 }
 
@@ -172,16 +208,14 @@ void store_config_part(const char* package, const char* name, std::span<const ui
     }
     config_item* item = parts.find(key);
     if (item == nullptr) item = add_part(key);
-    if (item == nullptr) return;
-    item->in_use = 1;
-    write_part(item->id, payload);
+    if (item != nullptr) item->in_use = static_cast<int32_t>(write_part(item->id, payload));
 }
 
 bool save_config_list() { return list_save(parts, paths::config_list, write_record); }
 
 void delete_retired_parts() {
     parts.for_each([](const config_item& item) {
-        if (item.in_use == 0 && !is_last_id(item)) (void)unlink(part_path(item.id).text);
+        if (is_retired(item)) delete_file_of(item);
     });
 }
 

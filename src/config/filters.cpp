@@ -142,6 +142,24 @@ void apply_filter(filter& applied, const filter_message* wanted) {
     applied.type = type;
 }
 
+using filter_config = Kiv__Config__FilterConfig;
+constexpr const ProtobufCMessageDescriptor& config_type = kiv__config__filter_config__descriptor;
+
+bool can_hold(const filter_message* filter) {
+    if (filter == nullptr) return true;
+    constexpr size_t most_records = list_records_max - 1;
+    const size_t records = filter->n_item + (type_of(*filter) == exclude_type ? 1 : 0);
+    if (records > most_records) {
+        return log_and_raise(tag, "Too many items in a filter: %zu", filter->n_item);
+    }
+    for (size_t i = 0; i < filter->n_item; ++i) {
+        const auto& item = *filter->item[i];
+        if (fits_list_record(2, strlen(item.package) + strlen(item.name))) continue;
+        return log_and_raise(tag, "Too long filter item <%s><%s>", item.package, item.name);
+    }
+    return true;
+}
+
 filter& get_filter(filter_kind kind) { return filters[static_cast<size_t>(kind)]; }
 
 }  // namespace
@@ -159,14 +177,21 @@ void release_filters() {
     }
 }
 
+bool can_hold_filters(std::span<const uint8_t> part) {
+    if (measure_message(config_type, part) == message_size::too_large) {
+        return log_and_raise(tag, "Too many items in the filters");
+    }
+    const auto config = unpack_message<filter_config>(config_type, part);
+    return !config || (can_hold(config->counter_filter) && can_hold(config->staticdata_filter) &&
+                       can_hold(config->event_filter));
+}
+
 void apply_filter_config() {
-    const auto config = unpack_own_part<kiv__config__filter_config__unpack,
-                                        kiv__config__filter_config__free_unpacked>("FilterConfig");
+    const auto config = unpack_own_part<filter_config>(config_type, filter_part_name);
     const auto wanted = [&config](auto field) { return config ? config.get()->*field : nullptr; };
-    using message = Kiv__Config__FilterConfig;
-    apply_filter(get_filter(filter_kind::counters), wanted(&message::counter_filter));
-    apply_filter(get_filter(filter_kind::static_data), wanted(&message::staticdata_filter));
-    apply_filter(get_filter(filter_kind::events), wanted(&message::event_filter));
+    apply_filter(get_filter(filter_kind::counters), wanted(&filter_config::counter_filter));
+    apply_filter(get_filter(filter_kind::static_data), wanted(&filter_config::staticdata_filter));
+    apply_filter(get_filter(filter_kind::events), wanted(&filter_config::event_filter));
 }
 
 bool filter_match(filter_kind kind, const char* package, const char* name) {

@@ -41,8 +41,7 @@ void check_limits(limits& values) {
 void apply_settings() {
     limits& values = get_limits();
     values = get_base_limits();
-    const auto message =
-        unpack_own_part<kivd__settings__unpack, kivd__settings__free_unpacked>("Settings");
+    const auto message = unpack_own_part<Kivd__Settings>(kivd__settings__descriptor, "Settings");
     if (!message) return;
     if (message->has_permanently_disable && message->permanently_disable) disable_permanently();
     for (const setting& each : settings) {

@@ -6,9 +6,8 @@
 namespace kivd {
 
 // Whether the payload is a kiv.system_logging.LogMessage about an application that crashed or
-// stopped responding, or about a call that failed. One that cannot be decoded, has no tag or is
-// nested more than 64 levels deep has been logged and raised: the decoder recurses at each level,
-// so a small payload could overflow the stack.
+// stopped responding, or about a call that failed. One that cannot be decoded (see
+// format/protobuf_message.h) or has no tag has been logged and raised.
 [[nodiscard]] bool is_kept_log_message(std::span<const char> payload);
 
 }  // namespace kivd

@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -17,6 +18,7 @@
 #include "config/filters.h"
 #include "config/settings.h"
 #include "format/config_file.h"
+#include "format/probe_key.h"
 #include "intake/config_file.h"
 #include "intake/config_request.h"
 #include "intake/run_actions.h"
@@ -52,12 +54,30 @@ bool checksum_of(std::span<const uint8_t> file, config_checksum& checksum) {
     return EVP_Digest(file.data(), file.size(), checksum.data(), nullptr, EVP_sha1(), nullptr) == 1;
 }
 
+bool is_filter_part(const Kiv__Config__ConfigPart& part) {
+    return compare_probes({part.package, part.name}, {own_package, filter_part_name}) == 0;
+}
+
+// Whether all of it can be read back at the next start.
+bool can_hold(new_parts parts) {
+    return can_hold_parts(parts) &&
+           std::ranges::all_of(parts, [](const Kiv__Config__ConfigPart* part) {
+               return !is_filter_part(*part) ||
+                      can_hold_filters({part->payload.data, part->payload.len});
+           });
+}
+
 bool store_package(std::span<const uint8_t> bytes) {
-    const auto package = unpack_message<kiv__config__config_package__unpack,
-                                        kiv__config__config_package__free_unpacked>(bytes);
+    const ProtobufCMessageDescriptor& type = kiv__config__config_package__descriptor;
+    if (measure_message(type, bytes) == message_size::too_large) {
+        return refuse("Too many fields in the configuration");
+    }
+    const auto package = unpack_message<Kiv__Config__ConfigPackage>(type, bytes);
     if (!package) return false;
-    retire_config_parts();
-    for (const Kiv__Config__ConfigPart* part : std::span(package->parts, package->n_parts)) {
+    const new_parts parts(package->parts, package->n_parts);
+    if (!can_hold(parts)) return false;
+    retire_config_parts(parts);
+    for (const Kiv__Config__ConfigPart* part : parts) {
         store_config_part(part->package, part->name, {part->payload.data, part->payload.len});
     }
     return save_config_list();

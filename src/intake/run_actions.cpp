@@ -16,7 +16,7 @@ constexpr char once_part[] = "RunActionsOnce";
 
 void run_actions() {
     const auto actions =
-        unpack_own_part<kivd__run_actions__unpack, kivd__run_actions__free_unpacked>("RunActions");
+        unpack_own_part<Kivd__RunActions>(kivd__run_actions__descriptor, "RunActions");
     if (!actions) return;
     stop_log_reader();
     if (actions->has_run_log_reader && actions->run_log_reader) start_log_reader();
@@ -26,8 +26,7 @@ void run_actions() {
 
 void run_actions_once() {
     const auto actions =
-        unpack_own_part<kivd__run_actions_once__unpack, kivd__run_actions_once__free_unpacked>(
-            once_part);
+        unpack_own_part<Kivd__RunActionsOnce>(kivd__run_actions_once__descriptor, once_part);
     if (!actions) return;
     if (actions->has_remove_reports && actions->remove_reports) {
         wait_for_compactor();  // its report is one of them

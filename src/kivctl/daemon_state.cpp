@@ -16,6 +16,7 @@
 #include "daemon/option_names.h"
 #include "diag/diag_store.h"
 #include "format/config_file.h"
+#include "format/protobuf_message.h"
 #include "format/report_name.h"
 #include "kivctl/io.h"
 #include "report/output_dir.h"
@@ -26,7 +27,6 @@
 #include "util/file_io.h"
 #include "util/numbers.h"
 #include "util/paths.h"
-#include "util/protobuf_message.h"
 #include "util/text_scan.h"
 
 namespace kivd {
@@ -73,9 +73,8 @@ std::optional<saved_state> read_saved_state() {
 std::optional<std::string> find_requested_checksum() {
     const auto text = read_if_possible(paths::config_request, config_request_size_max);
     if (!text) return std::nullopt;
-    const auto request =
-        unpack_message<kiv__config__config_request__unpack,
-                       kiv__config__config_request__free_unpacked>(bytes_of(*text));
+    const auto request = unpack_message<Kiv__Config__ConfigRequest>(
+        kiv__config__config_request__descriptor, bytes_of(*text));
     config_checksum checksum;
     if (!request || request->current_config.len != checksum.size()) return std::nullopt;
     std::copy_n(request->current_config.data, checksum.size(), checksum.begin());
@@ -88,9 +87,8 @@ std::optional<std::string> find_requested_checksum() {
 std::optional<bool> find_diagnostics(daemon_questions& questions) {
     const config_part_answer part = questions.own_part("RunActions");
     if (part.payload) {
-        const auto actions =
-            unpack_message<kivd__run_actions__unpack, kivd__run_actions__free_unpacked>(
-                bytes_of(*part.payload));
+        const auto actions = unpack_message<Kivd__RunActions>(kivd__run_actions__descriptor,
+                                                              bytes_of(*part.payload));
         if (actions) {
             return actions->has_activate_lumora_diagnostics != 0 &&
                    actions->activate_lumora_diagnostics != 0;

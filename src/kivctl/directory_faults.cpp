@@ -10,11 +10,11 @@
 
 #include "config.pb-c.h"
 #include "format/list_record.h"
+#include "format/protobuf_message.h"
 #include "kivctl/io.h"
 #include "util/bytes.h"
 #include "util/directory.h"
 #include "util/paths.h"
-#include "util/protobuf_message.h"
 
 namespace kivd {
 namespace {
@@ -160,9 +160,8 @@ fault_list find_filter_faults(daemon_questions& questions) {
     if (!part.is_known) return std::nullopt;
     std::vector<std::string> found;
     if (!part.payload) return found;
-    const auto config =
-        unpack_message<kiv__config__filter_config__unpack,
-                       kiv__config__filter_config__free_unpacked>(bytes_of(*part.payload));
+    const auto config = unpack_message<Kiv__Config__FilterConfig>(
+        kiv__config__filter_config__descriptor, bytes_of(*part.payload));
     if (!config) {
         found.emplace_back("the part kivd:FilterConfig in force cannot be decoded");
         return found;

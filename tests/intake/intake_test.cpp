@@ -84,6 +84,21 @@ TEST_F(intake, parts_come_and_go_but_ids_are_never_given_out_twice) {
     EXPECT_EQ(part("b", "y"), "none");
     ASSERT_TRUE(take(config_file(pack({{"a", "x", "as it is"}}))));  // need not be compressed
     EXPECT_EQ(part("a", "x"), "as it is");
+
+    // Those that are gone lose their places when there are no others, but never their ids.
+    std::string list = "kivd\0_last_id\00019998\0000\0\0\n"s;
+    for (int id = 1; id < 19999; ++id) {
+        const std::string text = std::to_string(id);
+        list += "x\0"s + text + '\0' + text + "\0000\0\0\n"s;
+    }
+    write_file("private/config_list.txt", list);
+    restart();
+    ASSERT_TRUE(take(config_file({{"x", "7", "old"}, {"z", "8", "new"}})));
+    EXPECT_EQ(read_file("private/config_list.txt").size(), list.size() + sizeof "z 8 19999 1  ");
+    ASSERT_TRUE(take(config_file({{"x", "7", "old"}, {"z", "9", "new"}})));
+    EXPECT_EQ(
+        read_file("private/config_list.txt"),
+        "kivd\0_last_id\00020000\0000\0\0\nx\0007\0007\0001\0\0\nz\0009\00020000\0001\0\0\n"s);
 }
 
 TEST_F(intake, a_damaged_list_gives_no_part_the_file_of_another) {
@@ -135,6 +150,7 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
     const std::string good = gzip(pack({{"a", "x", "new"}}));
     std::string flipped = good;
     flipped[flipped.size() - 6] ^= 1;  // in the checksum
+    const std::string long_name(1100, 'n');
     std::string two_members = gzip("") + good.substr(0, good.size() - 1);
 
     const std::pair<std::string, refusals> cases[] = {
@@ -154,7 +170,16 @@ TEST_F(intake, whatever_is_wrong_leaves_the_configuration_in_force_untouched) {
         {config_file(two_members), {read_failure}},
         {config_file(flipped), {read_failure}},
         {config_file(gzip(std::string((8 << 20) + 1, '\0'))), {read_failure}},
-        {config_file(gzip(std::string(8 << 20, '\0'))), {parse_failure}},
+        {config_file(gzip(std::string(8 << 20, '\0'))),
+         {"E kivd-conf: Too many fields in the configuration", parse_failure}},
+        {config_file(gzip(pack(std::vector<config_part>(20000, {"p", "n", ""})))),
+         {"E kivd-conf: Too many parts: 20000, of at most 19999", parse_failure}},
+        {config_file({{"p", long_name, ""}}),
+         {"E kivd-conf: Too long name of part [p:" + long_name + "]", parse_failure}},
+        {config_file({own_part<kiv::config::FilterConfig>(
+             "FilterConfig",
+             "event_filter { type: INCLUDE item { package: 'a' name: '" + long_name + "' } }")}),
+         {"E kivd-filter: Too long filter item <a><" + long_name + ">", parse_failure}},
         {config_file("not a package"), {parse_failure}},
         {config_file(gzip("\x0a\x03\x0a\x01p")), {parse_failure}},
     };

@@ -149,7 +149,7 @@ TEST_F(configurations, that_the_daemon_would_not_take_are_not_built) {
     } cases[] = {
         {{"kivd:_last_id=a"}, "Skipped part with the reserved name", ""},
         {{"p:n=a", "p:m=a", "p:n=a"}, "p:n: is given twice", ""},
-        {{long_package + ":" + std::string(517, 'n') + "=a"}, "loses this part", ""},
+        {{long_package + ":" + std::string(517, 'n') + "=a"}, "Too long name of part", ""},
         {{"p:n=none"}, "/none: cannot be opened: No such file or directory", ""},
         {{"p:n=large"}, "/large: has more than 8388608 bytes", ""},
         {{"p:n=a"}, "/key.pub.pem: holds no private key", "key.pub.pem"},

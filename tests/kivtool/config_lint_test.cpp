@@ -44,9 +44,11 @@ TEST(config_lint, of_filters_finds_what_does_not_outlive_a_start) {
         std::string filter, found;  // empty: nothing
     } cases[] = {
         {numbered_filter(include, 19'999, "p", "n"), ""},
-        {numbered_filter(include, 20'000, "p", "n"), "item 1 (numbered 1): from its next start"},
-        {numbered_filter(exclude, 20'000, "p", "n"), "item 20000 (p n): from its next start on"},
-        {numbered_filter(include, 1, std::string(1020, 'p'), "n"), "Corrupt data when reading"},
+        {numbered_filter(exclude, 19'998, "p", "n"), ""},
+        {numbered_filter(include, 20'000, "p", "n"), "Too many items in a filter: 20000"},
+        {numbered_filter(exclude, 19'999, "p", "n"), "Too many items in a filter: 19999"},
+        {numbered_filter(include, 1, std::string(1019, 'p'), "n"), ""},
+        {numbered_filter(include, 1, std::string(1020, 'p'), "n"), "Too long filter item <ppp"},
         {numbered_filter(include, 2, "__type", "exclude"), "(numbered 1): from its next start on"},
         {numbered_filter(exclude, 1, "*", "*"), "new probe filter not activated!"},
         {numbered_filter(include, 1, "*", "*"), ""},
@@ -70,7 +72,7 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
         {{}, ""},
         {{{"p:" + n1006, ""}}, ""},  // 1007 bytes in all
         {{{"p:" + n1006 + "n", ""}}, "...: package and name make a record of up to 1025"},
-        {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "the daemon loses this part"},
+        {{{"p:" + n1006 + "nnnnnnnnnn", ""}}, "Too long name of part"},
         {{{":n", ""}}, "f: error: :n: its package is empty"},
         {{{"p:n m", ""}}, "f: warning: p:n m: its name holds a blank"},
         {{{"p:n" + nul, ""}}, "f: error: p:n\\x00: its name holds a NUL"},
@@ -125,7 +127,7 @@ TEST(config_lint, says_where_and_what_the_daemon_does) {
     }
     EXPECT_EQ(found_in(many), "");
     many.push_back({"p", "last", "", "f", nullptr});
-    EXPECT_TRUE(says(found_in(many), "p:last: the daemon loses this part"));
+    EXPECT_TRUE(says(found_in(many), "Too many parts: 20000, of at most 19999"));
     EXPECT_TRUE(says(found_in({}), "all: warning: there is no filter of events"));
 }
 

@@ -75,8 +75,7 @@ void lint_id(const part_content& part, lint_findings& findings) {
     findings.warning(place_of(part), "package and name make a record of up to " +
                                          std::to_string(size) + " bytes; the daemon reads " +
                                          std::to_string(list_record_size_max) +
-                                         " at most and forgets this part and others at its next "
-                                         "start");
+                                         " at most and may refuse the configuration");
 }
 
 // Finds what the daemon accepts without complaint, but the author can hardly have meant.

@@ -83,14 +83,6 @@ const part_content* find_own(std::span<const part_content> parts, std::string_vi
     return found == parts.rend() ? nullptr : &*found;
 }
 
-// The first part that is not available to programs; null when all are.
-const part_content* find_lost(std::span<const part_content> parts) {
-    const auto lost = std::ranges::find_if(parts, [](const part_content& part) {
-        return !get_config_fd(part.package.c_str(), part.name.c_str()).ok();
-    });
-    return lost == parts.end() ? nullptr : &*lost;
-}
-
 // For each item of the filter, whether the probe of that name is kept.
 std::vector<bool> find_matches(const written_filter& filter) {
     std::vector<bool> matches;
@@ -113,8 +105,8 @@ int first_difference(const std::vector<bool>& before, const std::vector<bool>& a
     return at == before.end() ? -1 : static_cast<int>(at - before.begin());
 }
 
-void try_restart(std::span<const part_content> parts, const std::vector<written_filter>& filters,
-                 const lint_place& whole, lint_findings& findings) {
+void try_restart(const std::vector<written_filter>& filters, const lint_place& whole,
+                 lint_findings& findings) {
     std::vector<std::vector<bool>> matches;
     matches.reserve(filters.size());
     for (const written_filter& each : filters) matches.push_back(find_matches(each));
@@ -124,10 +116,6 @@ void try_restart(std::span<const part_content> parts, const std::vector<written_
         has_event_filter = start_modules();
     });
 
-    if (const part_content* const lost = find_lost(parts)) {
-        findings.error({lost->path, 0, id_of(*lost)},
-                       "the daemon loses this part at its next start, and perhaps others");
-    }
     for (size_t i = 0; i < filters.size(); ++i) {
         const int other = first_difference(matches[i], find_matches(filters[i]));
         if (other < 0) continue;
@@ -169,7 +157,7 @@ void try_config(std::string_view bytes, std::span<const part_content> parts,
     const part_content* const filter_part = find_own(parts, "FilterConfig");
     const auto filters = filter_part ? filters_of(*filter_part) : std::vector<written_filter>();
     for (const written_filter& each : filters) warn_of_nothing(each, findings);
-    try_restart(parts, filters, whole, findings);
+    try_restart(filters, whole, findings);
 }
 
 }  // namespace kivd
