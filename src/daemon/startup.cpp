@@ -1,7 +1,6 @@
 #include "daemon/startup.h"
 
 #include <fcntl.h>
-#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -13,6 +12,7 @@
 
 #include "daemon/debug/debug_interface.h"
 #include "daemon/kernel/kernel_bridge.h"
+#include "daemon/lock_file.h"
 #include "daemon/loop/event_loop.h"
 #include "daemon/loop/save_clock.h"
 #include "daemon/modules.h"
@@ -61,39 +61,6 @@ void detach() {
     if (open("/dev/null", O_RDWR) != 0 || dup(0) != 1 || dup(0) != 2) {  // NOLINT
         give_up(tag, "Failed to detach: %s", strerror(errno));
     }
-}
-
-unique_fd lock_file() {
-    unique_fd fd(open(paths::lock_file, O_RDWR | O_CREAT | O_CLOEXEC, 0644));
-    if (!fd.ok()) {
-        give_up(tag, "Failed to open lock file %s, and errno is %s", paths::lock_file,
-                strerror(errno));
-    }
-    if (flock(fd.get(), LOCK_EX | LOCK_NB) != 0) {
-        give_up(tag, "Another kivd is already running, and errno is %s", strerror(errno));
-    }
-    return fd;
-}
-
-// Whether the file still has that name: a daemon that is just ending removes its own.
-bool is_current_lock(int fd) {
-    struct stat locked = {};
-    struct stat named = {};
-    return fstat(fd, &locked) == 0 && stat(paths::lock_file, &named) == 0 &&
-           locked.st_ino == named.st_ino && locked.st_dev == named.st_dev;
-}
-
-// The lock is held, through the open descriptor, until the process and its children have ended.
-void take_lock() {
-    unique_fd fd = lock_file();
-    while (!is_current_lock(fd.get())) fd = lock_file();
-    char line[20];
-    const int size = snprintf(line, sizeof line, "%d\n", getpid());
-    if (!write_all(fd.get(), line, static_cast<size_t>(size))) {
-        give_up(tag, "Failed to write lock file %s, and errno is %s", paths::lock_file,
-                strerror(errno));
-    }
-    set_inherited_descriptor(fd.release());
 }
 
 struct signal_action {
