@@ -76,6 +76,8 @@ bool store_package(std::span<const uint8_t> bytes) {
     if (!package) return false;
     const new_parts parts(package->parts, package->n_parts);
     if (!can_hold(parts)) return false;
+    // From here on the next start goes on with it.
+    (void)rename(paths::tried_config_file, paths::config_file);
     retire_config_parts(parts);
     for (const Kiv__Config__ConfigPart* part : parts) {
         store_config_part(part->package, part->name, {part->payload.data, part->payload.len});
@@ -110,7 +112,8 @@ bool take_input() {
         return refuse("Failed to unpack configuration");
     }
     const std::optional<file_bytes> file = read_whole_fd(std::move(fd));
-    (void)unlink(paths::config_file);  // should it end the daemon, the next start can do without
+    // Should it end the daemon while it is decoded, the next start does without.
+    (void)rename(paths::config_file, paths::tried_config_file);
     return file && take_config_file(file->view());
 }
 

@@ -33,7 +33,8 @@ inline constexpr char new_report[] = "output/new_report";  // while it is copied
 inline constexpr char disable_marker[] = "output/kiv_disabled";
 
 inline constexpr char config_file[] = "input/config";
-inline constexpr char new_config_file[] = "input/new_config";  // while it is written
+inline constexpr char new_config_file[] = "input/new_config";      // while it is written
+inline constexpr char tried_config_file[] = "input/tried_config";  // while it is decoded
 inline constexpr char first_config_file[] = "/system/etc/kivd.conf";
 inline constexpr char new_config_signature[] = "private/new_config.sig";
 inline constexpr char new_config_data[] = "private/new_config.gz";

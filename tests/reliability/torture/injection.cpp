@@ -34,7 +34,7 @@ constexpr watched_call watched[] = {
 #ifdef SYS_open  // which younger machines don't have
     {SYS_open, "open", true, 0}, {SYS_creat, "open", true, 0}, {SYS_rename, "rename", true, 0},
     {SYS_unlink, "unlink", true, 0}, {SYS_mkdir, "mkdir", true, 0}, {SYS_rmdir, "rmdir", true, 0},
-    {SYS_link, "link", true, 0}, {SYS_chmod, "chmod", true, 0},
+    {SYS_link, "link", true, 0}, {SYS_chmod, "chmod", true, 0}, {SYS_access, "access", true, 0},
 #endif
     {SYS_openat, "open", true, 1}, {SYS_renameat, "rename", true, 1},
     {SYS_renameat2, "rename", true, 1}, {SYS_unlinkat, "unlink", true, 1},

@@ -158,8 +158,8 @@ void fill_at(size_t step, size_t blocks_left) {
     daemon_process daemon = launch();
     live(daemon, noted, [&](size_t at) {
         if (at != step) return;
-        noted.kills_only = noted.acknowledges = false;
-        noted.may_tear = noted.may_prune = true;
+        noted.kills_only = false;
+        noted.may_prune = true;
         note_seen(noted);
         fill_disk(blocks_left);
     });

@@ -31,9 +31,8 @@ struct journal {
     std::string device_id;
 
     bool kills_only = true;    // no call has failed
-    bool may_tear = false;     // a full disk may have cut records short
-    bool may_prune = false;    // and reports may have been deleted on it
-    bool acknowledges = true;  // not behind a torn record
+    bool may_prune = false;    // the first reports may have been deleted to make room
+    bool acknowledges = true;  // diagnostics are kept
 };
 
 // In the current directory, with the keys beside it; `before` goes in front of its command.
