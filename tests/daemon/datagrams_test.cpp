@@ -2,9 +2,11 @@
 
 #include <sys/socket.h>
 
+#include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
 #include "report/state_file.h"
 #include "support/scratch_directory.h"
+#include "util/clock.h"
 
 namespace kivd {
 namespace {
@@ -37,6 +39,15 @@ TEST_F(datagrams, each_is_handled_in_order_and_up_to_its_limit) {
     EXPECT_EQ(take_log(), lines{"E kivd: Too large packet (dgram) from client " +
                                 std::to_string(handler.fd) + ", dropping."});
     EXPECT_EQ(contents(next_report()), "P1; e1 ; e2 ; e3 ; n=5; ");
+}
+
+TEST_F(datagrams, are_received_one_by_one_when_there_is_a_delay) {
+    set_receive_delay(20);
+    for (const char* packet : {"EV p e1", "EV p e2"}) send(packet);
+    const int64_t start_ms = monotonic_ms();
+    receive_dgram_client(handler);
+    EXPECT_GE(monotonic_ms() - start_ms, 20);
+    EXPECT_EQ(contents(next_report()), "P1; e1 ; ");
 }
 
 TEST_F(datagrams, attached_descriptors_never_become_ours) {

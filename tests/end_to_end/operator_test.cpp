@@ -114,6 +114,11 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
         SCOPED_TRACE(c.damage);
         EXPECT_EQ(system(("( " + c.damage + " ) 2>/dev/null").c_str()), 0);
         EXPECT_EQ(check(), std::pair(c.found, c.found.empty() ? 0 : 1));
+        daemon_process tool = kivctl({"check"});
+        EXPECT_EQ(tool.wait_exit(), c.found.empty() ? 0 : 1);
+        const std::string first = c.found.substr(0, c.found.find(' '));
+        EXPECT_TRUE(tool.output().starts_with(first.empty() ? "all is well\n" : first + ": "))
+            << tool.output();
         EXPECT_EQ(system("rm -r keys private output; tar xpf all.tar; "
                          "chmod 755 .; chmod 600 kivd.pid; chmod 622 kiv_co_stream"),
                   0);
@@ -128,10 +133,14 @@ TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
         {directory, "DIR"},
         {"\"pid\":" + std::to_string(daemon.pid()) + ",", "PID,"},
         {read_file("private/kivd.state").substr(17, 40), "SUM"},
+        {"(\\d+\\.\\d+ ms|\\d+ bytes and \\d+ inodes|[-\\d]+ \\d\\d:\\d\\d:\\d\\d)", "#"},
+        {"process \\d+", "process PID"},
         {"(answer_us\"|inodes\"|saved_at\"|space\":\\{\"size\"):\\d+", "$1:#"},
     };
-    const auto status = [&](uid_t uid) {
-        daemon_process tool = kivctl({"status", "--json"}, uid);
+    const auto status = [&](uid_t uid, const std::vector<std::string>& more = {"--json"}) {
+        std::vector<std::string> arguments = {"status"};
+        arguments.insert(arguments.end(), more.begin(), more.end());
+        daemon_process tool = kivctl(arguments, uid);
         std::string text = std::to_string(tool.wait_exit());
         text += tool.output();
         for (const auto& [what, by] : changing) {
@@ -150,6 +159,20 @@ TEST_F(operator_commands, status_tells_what_can_be_known_from_where_it_runs) {
               R"("config_checksum":"SUM","error_guard":{"used":0,"limit":100,)"
               R"("suppressed":false,"suppressed_until":null,"saved_at":#}})"
               "\n");
+    EXPECT_EQ(status(daemon_user, {}),
+              "0directory       DIR\n"
+              "running         yes, process PID\n"
+              "answers         yes, in #\n"
+              "collection      on\n"
+              "diagnostics     off\n"
+              "partial file    3 of 409600 bytes (0 %)\n"
+              "reports         1, kiv_7 to kiv_7\n"
+              "output size     5 of 4833280 bytes (0 %)\n"
+              "free space      #, needed: 1331200 bytes\n"
+              "sealing         on, with DIR/keys/kiv_report.pem\n"
+              "verification    on, with DIR/keys/kiv_config.pem\n"
+              "configuration   SUM\n"
+              "error guard     0 of 100 error events used, as saved at #\n");
     if (daemon_user != 0) {
         const std::string seen = status(1);  // who sees no more than that it runs
         for (const char* part : {R"("running":true,PID,"stopped":false,"lock_held":true)",

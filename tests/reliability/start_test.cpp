@@ -1,6 +1,8 @@
 // Whatever state its parent has left it in.
 #include <fcntl.h>
 #include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
 #include <csignal>
 
@@ -73,6 +75,19 @@ TEST_F(started_daemon, serves_and_stops_whatever_it_is_started_from) {
             }
         }
     }
+}
+
+TEST_F(started_daemon, tells_the_service_manager_when_it_serves_and_when_it_stops) {
+    const unique_fd manager(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    const sockaddr_un address = {AF_UNIX, "notify"};
+    ASSERT_EQ(bind(manager.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    setenv("NOTIFY_SOCKET", (directory + "/notify").c_str(), 1);
+    daemon_process daemon = launch({{"-C"}});
+    EXPECT_EQ(receive_text(manager.get()), "READY=1");
+    EXPECT_TRUE(connect_client(socket_kind::stream).ok());
+    daemon.send_signal(SIGTERM);
+    EXPECT_EQ(receive_text(manager.get()), "STOPPING=1");
+    EXPECT_EQ(daemon.wait_exit(), 0);
 }
 
 }  // namespace

@@ -51,15 +51,18 @@ TEST_F(report_generation, each_report_has_what_came_since_the_last_one) {
     EXPECT_FALSE(generate_report());
     EXPECT_EQ(take_log(), lines{});
     counters_update("p", "c1", 1, counter_mode::set, 0);
-    EXPECT_EQ(contents(next_report()), "P1; c1=1; ");
+    const std::string payload(5000, 'x');
+    (void)events_add("p", "e0", payload);
+    EXPECT_EQ(contents(next_report()), "P1; e0 " + payload + "; c1=1; ");
+    EXPECT_LT(fs::file_size("output/kiv_1"), 500U);
     for (const int64_t flushed = now_ms(); now_ms() == flushed;) {
     }
     set_last_flush(now_ms());  // it may have been the counter's own millisecond
 
     set_output_compression(false);
-    (void)events_add("p", "e1", std::string(5000, 'x'));
+    (void)events_add("p", "e1", payload);
     (void)events_add("p", "e2", {});
-    EXPECT_EQ(contents(next_report()), "P1; e1 " + std::string(5000, 'x') + "; e2 ; ");
+    EXPECT_EQ(contents(next_report()), "P1; e1 " + payload + "; e2 ; ");
     EXPECT_GT(fs::file_size("output/kiv_2"), 5000U);
 
     write_file(paths::header_info, "");

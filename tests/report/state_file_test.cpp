@@ -66,6 +66,11 @@ TEST_F(state_file, a_full_device_keeps_the_old_one) {
               "E kivd-util: Failed to write new configuration file: No space left on device");
     EXPECT_EQ(read_file(paths::state), old);
     EXPECT_FALSE(exists(paths::state_new));
+    fs::remove(paths::state);
+    fs::create_directories(paths::state + "/old"s);
+    state_save();
+    EXPECT_EQ(take_log().back(),
+              "E kivd-util: Failed to rename configuration file: Is a directory");
 }
 
 }  // namespace
