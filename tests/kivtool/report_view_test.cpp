@@ -136,6 +136,36 @@ TEST_F(report_views, of_people_say_who_when_and_what) {
     expect_parts(text, {"app kind0", "app kind1 ", "app count5", "app count6", "total"}, false);
 }
 
+TEST_F(report_views, of_people_have_what_a_header_has_and_how_long_it_took) {
+    const std::pair<int64_t, std::string> durations[] = {
+        {59'999, "59 s"},         {60'000, "1 min"},           {3'599'000, "59 min"},
+        {3'600'000, "1 h 0 min"}, {86'399'000, "23 h 59 min"}, {90'000'000, "1 d 1 h"},
+    };
+    for (const auto& [length_ms, text] : durations) {
+        const std::string summary = show_records(
+            records_of("header { product_id: 'p' software_version: 's' software_variant: 'v' "
+                       "device_id: 'd' build_type: 'b' serial_number: 'n' device_imei: 'i' "
+                       "CDF_id: 'c' config_checksum: 'x' timezone: 3600 group_id: ['g', 'h'] }" +
+                       event_text("a", length_ms) + event_text("b", 0)),
+            report_format::summary);
+        const std::string facts = summary.substr(0, summary.find("  contents"));
+        EXPECT_TRUE(facts.ends_with(", " + text + "\n")) << facts;
+        EXPECT_NE(facts.find("  product        p\n"
+                             "  software       s\n"
+                             "  variant        v\n"
+                             "  build type     b\n"
+                             "  device id      d\n"
+                             "  serial number  n\n"
+                             "  IMEI           i\n"
+                             "  CDF id         c\n"
+                             "  groups         g, h\n"
+                             "  configuration  x\n"
+                             "  local time     UTC+01:00\n"),
+                  std::string::npos)
+            << facts;
+    }
+}
+
 // Of a directory, reports only, in the order of their numbers.
 TEST_F(report_views, of_several_files_end_with_the_total) {
     const auto report = [](const std::string& name, int64_t value) {
