@@ -1,7 +1,7 @@
 // The two public keys of the device: where they are, and reading them. A protection is off only
 // while its key file is absent or not ours to read; a file that cannot be looked at for any other
-// reason counts as there, so that what needs it fails. The files are read anew for each use, so that
-// a replaced one takes effect without a restart.
+// reason counts as there, so that what needs it fails. The files are read anew for each use, so
+// that a replaced one takes effect without a restart.
 #pragma once
 
 #include "util/unique_openssl.h"
