@@ -77,7 +77,7 @@ double time_in_process(unsigned counters, unsigned increments) {
         for (unsigned i = 0; i < count; ++i) {
             const std::string& packet = packets[i % packets.size()];
             memcpy(buffer, packet.c_str(), packet.size() + 1);
-            (void)handle_request(-1, {buffer, packet.size()}, nullptr);
+            (void)handle_request({-1, getuid(), nullptr}, {buffer, packet.size()});
         }
     };
     run(2 * counters);

@@ -47,7 +47,7 @@ class datagram_message {
 std::string ask(int fd, std::string_view packet, const msghdr* message) {
     const auto block = std::make_unique<char[]>(packet.size() + 1 + max_reply_size);
     packet.copy(block.get(), packet.size());
-    const size_t size = handle_request(fd, {block.get(), packet.size()}, message).size;
+    const size_t size = handle_request({fd, getuid(), message}, {block.get(), packet.size()}).size;
     require(size <= max_reply_size, "a reply is too long");
     return {block.get(), size};
 }

@@ -20,8 +20,8 @@ class handle_request : public scratch_directory {
         (void)take_log();
         const size_t size = packet.size();
         packet.resize(size + 65);
-        std::string answer =
-            packet.substr(0, kivd::handle_request(ends_[0], {packet.data(), size}, message).size);
+        std::string answer = packet.substr(
+            0, kivd::handle_request({ends_[0], getuid(), message}, {packet.data(), size}).size);
         for (const std::string& line : take_log()) answer += line;
         return answer;
     }

@@ -62,7 +62,7 @@ size_t receive_packet(connection& from, char* buffer, const char* kind) {
 
 void handle_packet(connection& from, std::span<char> packet, const char* receiver) {
     packet.data()[packet.size()] = '\0';
-    answer given = handle_request(from.fd, packet, nullptr);
+    answer given = handle_request({from.fd, from.uid, nullptr}, packet);
     send_answer(from, std::move(given), packet.data(), receiver);
     if (from.answer) event_loop_tick(tend_connections);
 }

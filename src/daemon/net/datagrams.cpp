@@ -30,7 +30,7 @@ void handle_datagram(int fd, std::span<char> packet, const msghdr& message) {
         return;
     }
     packet.data()[packet.size()] = '\0';
-    (void)handle_request(-1, packet, &message);
+    (void)handle_request({-1, 0, &message}, packet);
 }
 
 // One packet at a time when there is a delay, which is meant for each.

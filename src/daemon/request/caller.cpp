@@ -35,19 +35,17 @@ std::optional<ucred> peer_of(int fd) {
     return std::nullopt;
 }
 
-std::optional<ucred> caller_of(const request& r) {
-    return r.message != nullptr ? sender_of(*r.message) : peer_of(r.fd);
-}
-
 }  // namespace
 
 uid_t user_of(const request& r) {
-    const std::optional<ucred> caller = caller_of(r);
-    return caller ? caller->uid : unknown_user;
+    if (r.sender.message == nullptr) return r.sender.uid;
+    const std::optional<ucred> credentials = sender_of(*r.sender.message);
+    return credentials ? credentials->uid : unknown_user;
 }
 
 bool check_caller_permission(const request& r) {
-    const std::optional<ucred> caller = caller_of(r);
+    const std::optional<ucred> caller =
+        r.sender.message != nullptr ? sender_of(*r.sender.message) : peer_of(r.sender.fd);
     if (!caller) return false;
     return caller->uid == getuid() ||
            check_permission(private_permission, caller->pid, caller->uid);

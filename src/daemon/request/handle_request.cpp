@@ -24,9 +24,9 @@ constexpr answer (*handlers[])(request&) = {
 
 }  // namespace
 
-answer handle_request(int fd, std::span<char> packet, const msghdr* message) {
+answer handle_request(const request_sender& sender, std::span<char> packet) {
     debug_mirror_request(packet);
-    request r = make_request(fd, packet, message);
+    request r = make_request(sender, packet);
     if (r.command == nullptr) {
         log_and_raise(tag, "Invalid command: none - dropping.");
         return no_answer();

@@ -15,8 +15,8 @@ const char* or_null(const char* text) { return text != nullptr ? text : "null"; 
 
 }  // namespace
 
-request make_request(int fd, std::span<char> packet, const msghdr* message) {
-    request r = {fd, packet, message, packet.data(), packet.data(), nullptr};
+request make_request(const request_sender& sender, std::span<char> packet) {
+    request r = {sender, packet, packet.data(), packet.data(), nullptr};
     r.command = next_token(r);
     return r;
 }
@@ -42,7 +42,7 @@ answer answer_with(request& r, std::string_view text) {
 }
 
 answer answer_with(request& r, unique_fd descriptor) {
-    if (r.fd < 0) return no_answer();
+    if (r.sender.fd < 0) return no_answer();
     if (!descriptor.ok()) return answer_with(r, "FAIL");
     return {0, std::move(descriptor)};
 }

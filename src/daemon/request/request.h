@@ -12,17 +12,22 @@
 
 namespace kivd {
 
+struct request_sender {
+    int fd;                 // the connection; -1 for a datagram
+    uid_t uid;              // of a connection's peer
+    const msghdr* message;  // of a datagram: carries its sender's credentials
+};
+
 struct request {
-    int fd;                  // the connection; -1 for a datagram
+    request_sender sender;
     std::span<char> packet;  // followed by a NUL and by room for a reply
-    const msghdr* message;   // of a datagram: carries its sender's credentials
     char* token_end;         // the NUL behind the last token taken
     char* rest;              // where the next token is looked for
     const char* command;     // the first token; null when there is none
 };
 
 // Takes the command off the packet.
-[[nodiscard]] request make_request(int fd, std::span<char> packet, const msghdr* message);
+[[nodiscard]] request make_request(const request_sender& sender, std::span<char> packet);
 
 // The next token, or null when there is none left.
 [[nodiscard]] const char* next_token(request& r);
