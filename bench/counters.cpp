@@ -73,11 +73,12 @@ double time_in_process(unsigned counters, unsigned increments) {
     set_data_collection(true);
     const std::vector<std::string> packets = increment_packets(counters);
     static char buffer[packet_limit + 1];
+    const request_sender sender{-1, getuid(), nullptr};
     const auto run = [&](unsigned count) {
         for (unsigned i = 0; i < count; ++i) {
             const std::string& packet = packets[i % packets.size()];
             memcpy(buffer, packet.c_str(), packet.size() + 1);
-            (void)handle_request({-1, getuid(), nullptr}, {buffer, packet.size()});
+            (void)handle_request(sender, {buffer, packet.size()});
         }
     };
     run(2 * counters);
