@@ -162,8 +162,9 @@ void diag_add_event(const char* package, const char* name, std::span<const char>
     if (active == 0 || !is_selected(package, name, payload)) return;
     const unique_fd file = open_write_file();
     const off_t size = file.ok() ? lseek(file.get(), 0, SEEK_END) : -1;
-    if (size < 0 || write_event_record(file.get(), package, name, payload, tag)) return;
-    (void)!ftruncate(file.get(), size);  // nothing may follow a torn record
+    event_record record;
+    if (size < 0 || !make_event_record(record, package, name, payload, tag)) return;
+    (void)write_event_records(file.get(), static_cast<uint64_t>(size), {&record, 1}, tag);
 }
 
 bool diag_wants_probe(const char* package, const char* name) {

@@ -4,16 +4,20 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
-#include <optional>
+#include <span>
+#include <utility>
 
 #include "config/filters.h"
 #include "config/limits.h"
 #include "record/event_record.h"
 #include "record/header_record.h"
 #include "runtime/log_and_raise.h"
+#include "util/parent_memory.h"
 #include "util/paths.h"
 #include "util/unique_fd.h"
 
@@ -31,10 +35,43 @@ void measure_size() {
     if (size >= 0) events_size = static_cast<uint64_t>(size);
 }
 
-// A full device may have taken a part of a record, and a reader could not find the next one behind
-// it.
-void cut_torn_record() {
-    if (ftruncate(events_fd, static_cast<off_t>(events_size)) != 0) measure_size();
+// Events of the current batch, which are not in the file yet.
+struct held_events {
+    std::array<event_record, max_events_a_write> records;
+    size_t count;
+    uint64_t size;  // of all records in bytes
+};
+constinit parent_memory<held_events> held;
+constinit bool is_holding = false;
+
+void write_held() {
+    if (!is_holding || held->count == 0) return;
+    const std::span records(held->records.data(), std::exchange(held->count, 0));
+    held->size = 0;
+    events_size = write_event_records(events_fd, events_size, records, tag);
+}
+
+// False when there is no memory for it: each event is then written at once.
+bool prepare_holding() {
+    static const bool ends_with_exit = atexit(write_held) == 0;
+    if (ends_with_exit && !held) held = map_parent_memory<held_events>();
+    return held != nullptr;
+}
+
+bool is_full(uint64_t size) { return size >= get_limits().max_report_size; }
+
+void hold_event(const char* package, const char* name, std::span<const char> payload) {
+    event_record& record = held->records[held->count];
+    if (!make_event_record(record, package, name, payload, tag)) return;
+    ++held->count;
+    held->size += record.size();
+    if (held->count == held->records.size() || is_full(events_size + held->size)) write_held();
+}
+
+void write_event(const char* package, const char* name, std::span<const char> payload) {
+    event_record record;
+    if (!make_event_record(record, package, name, payload, tag)) return;
+    events_size = write_event_records(events_fd, events_size, {&record, 1}, tag);
 }
 
 // A report that began without its header could not be read, so such a file is not kept. A link is,
@@ -68,16 +105,19 @@ void events_open() {
     if (events_size == 0) start_file();
 }
 
+event_batch::event_batch() { is_holding = prepare_holding(); }
+
+event_batch::~event_batch() {
+    write_held();
+    is_holding = false;
+}
+
 event_file events_add(const char* package, const char* name, std::span<const char> payload) {
     if (!filter_match(filter_kind::events, package, name)) return event_file::open;
     events_open();
     if (events_fd < 0) return event_file::open;
-    if (const std::optional size = write_event_record(events_fd, package, name, payload, tag)) {
-        events_size += *size;
-    } else {
-        cut_torn_record();
-    }
-    return events_size >= get_limits().max_report_size ? event_file::full : event_file::open;
+    is_holding ? hold_event(package, name, payload) : write_event(package, name, payload);
+    return is_full(events_size) ? event_file::full : event_file::open;
 }
 
 bool events_flush() {
@@ -89,6 +129,7 @@ bool events_flush() {
 bool events_pending() { return access(paths::events, F_OK) == 0; }
 
 void events_release() {
+    write_held();
     if (events_fd >= 0) (void)close(events_fd);
     events_fd = -1;
     events_size = 0;

@@ -221,6 +221,12 @@ std::string frame(const std::string& packet) {
     return "\0\0\0"s + static_cast<char>(size + 2) + "\x0a" + size + packet;
 }
 
+// How many calls have written to files.
+size_t writes_of(const daemon_process& daemon) {
+    const std::string text = read_file("/proc/" + std::to_string(daemon.pid()) + "/io");
+    return std::stoul(text.substr(text.find("syscw: ") + 7));
+}
+
 TEST_F(hostile_debug_clients, see_every_request_of_others_and_cost_nothing) {
     besiege({{"-C", "-d"}});
     std::filesystem::create_directory("other");
@@ -238,6 +244,18 @@ TEST_F(hostile_debug_clients, see_every_request_of_others_and_cost_nothing) {
     EXPECT_TRUE(send_text(connect_client(datagram).get(), "EV p \xff \0y"s));
     const std::string expected = frame("IA") + frame("EV p \xff \0y"s);
     EXPECT_EQ(hear(debugger, expected.size()), expected);
+
+    // Each event is stored before the next request is shown, and together when nobody looks.
+    for (const bool is_watched : {true, false}) {
+        expect_service();
+        daemon.send_signal(SIGSTOP);
+        const size_t writes = writes_of(daemon);
+        flood(connect_client(datagram), 5, "EV p n x");
+        daemon.send_signal(SIGCONT);
+        expect_service();
+        EXPECT_EQ(writes_of(daemon) - writes == 5, is_watched);
+        debugger.reset();
+    }
 
     flood(connect_client(packets), 2000, "EV p n " + std::string(30000, 'x'));  // read by nobody
     debugger = connect_debugger();

@@ -82,8 +82,10 @@ void debug_release() {
     close_handler(listener);
 }
 
+bool debug_has_client() { return client.fd >= 0; }
+
 void debug_mirror_request(std::span<const char> packet) {
-    if (client.fd < 0) return;
+    if (!debug_has_client()) return;
     static constinit std::array<uint8_t, frame_size> frame = {};
     const size_t size = pack_debug_frame(frame, reinterpret_cast<const uint8_t*>(packet.data()),
                                          static_cast<uint32_t>(packet.size()));

@@ -13,6 +13,8 @@ void debug_start();
 // Stops listening and hangs up.
 void debug_release();
 
+[[nodiscard]] bool debug_has_client();
+
 // Sends the packet to the client, if there is one, without waiting. A frame that finds no room is
 // lost, with a log line. After one that was sent in part the client is dropped, since it could not
 // find the start of the next.

@@ -6,11 +6,13 @@
 #include <cerrno>
 #include <span>
 
+#include "daemon/debug/debug_interface.h"
 #include "daemon/net/delays.h"
 #include "daemon/net/packet_buffer.h"
 #include "daemon/net/stall_guard.h"
 #include "daemon/request/handle_request.h"
 #include "runtime/log_and_raise.h"
+#include "store/events.h"
 
 namespace kivd {
 namespace {
@@ -33,9 +35,12 @@ void handle_datagram(int fd, std::span<char> packet, const msghdr& message) {
     (void)handle_request({-1, 0, &message}, packet);
 }
 
-// One packet at a time when there is a delay, which is meant for each.
+// A delay is meant for each packet, and a debug client sees a packet when the one before it has
+// been stored.
+bool takes_one() { return get_receive_delay() > 0 || debug_has_client(); }
+
 int receive_batch(int fd, std::span<mmsghdr> messages) {
-    const auto wanted = static_cast<unsigned>(get_receive_delay() > 0 ? 1 : messages.size());
+    const auto wanted = static_cast<unsigned>(takes_one() ? 1 : messages.size());
     const stall_guard guard;
     int received = 0;
     do {
@@ -62,6 +67,7 @@ bool receive_datagrams(int fd) {
     wait_before_receive();
     const int received = receive_batch(fd, messages);
 
+    const event_batch batch;
     for (int i = 0; i < received; ++i) {
         const auto slot = static_cast<size_t>(i);
         handle_datagram(fd, {buffers.packets[slot].bytes.data(), messages[slot].msg_len},

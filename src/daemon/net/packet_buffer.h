@@ -17,8 +17,6 @@ struct alignas(64) packet_buffer {
     std::array<char, receive_size + 1 + max_reply_size> bytes;
 };
 
-// They lie in a mapping of their own that forked children don't get: the parent writes to it all
-// the time, and each page written would have to be copied.
 struct packet_buffers {
     std::array<packet_buffer, max_batch> packets;
 };
