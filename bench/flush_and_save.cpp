@@ -14,7 +14,7 @@ namespace kivd::bench {
 
 namespace {
 
-constexpr unsigned flushed_counters = 10'000;
+constexpr unsigned flushed_counters = 20'000;
 constexpr unsigned saved_counters = 20'000;
 constexpr size_t payload_size = 512;
 constexpr size_t event_file_size = 400'000;  // just below the size that starts a report by itself
@@ -122,10 +122,12 @@ void measure_flush(const setup& s) {
     run_flush(s, compression::on, flushed_counters, compressed);
     run_flush(s, compression::off, flushed_counters, stored);
     run_flush(s, compression::on, 0, without_counters);
-    print_row("10,000 changed counters", compressed.elapsed_ms, "ms", {bound::at_most, 4});
+    print_row("20,000 changed counters", compressed.elapsed_ms, "ms", {bound::at_most, 4});
     print_row("the same, CPU time of the main thread", compressed.cpu_ms, "ms");
-    print_row("10,000 changed counters, reports not compressed", stored.elapsed_ms, "ms");
+    print_row("20,000 changed counters, reports not compressed", stored.elapsed_ms, "ms");
+    print_row("the same, CPU time of the main thread", stored.cpu_ms, "ms");
     print_row("no counters", without_counters.elapsed_ms, "ms");
+    print_row("the same, CPU time of the main thread", without_counters.cpu_ms, "ms");
 }
 
 void measure_save(const setup& s) {
@@ -139,28 +141,40 @@ void measure_save(const setup& s) {
 
     std::vector<double> daemon_ms;
     std::vector<double> plain_ms;
+    std::vector<double> daemon_cpu_ms;
+    std::vector<double> plain_cpu_ms;
     for (unsigned i = 0; i < amount(s, 25, 7) + 1; ++i) {
         touch_counters(directory.path(), 1);  // or there is nothing to save
         (void)ask(control.get(), "IA");
         (void)usleep(settle_us);
+        int64_t cpu_before = main_thread_cpu_ns(daemon.pid());
         int64_t start = now_ns();
         order(control.get(), "FS");
         (void)ask(control.get(), "IA");
         const int64_t daemon_ns = now_ns() - start;
+        (void)usleep(settle_us);
+        const int64_t daemon_cpu_ns = main_thread_cpu_ns(daemon.pid()) - cpu_before;
         const std::vector<record> records = read_records(saved);
+        cpu_before = main_thread_cpu_ns(getpid());
         start = now_ns();
         save_plainly(records, plain);
         const int64_t plain_ns = now_ns() - start;
+        const int64_t plain_cpu_ns = main_thread_cpu_ns(getpid()) - cpu_before;
         if (records.size() != saved_counters || read_file(saved) != read_file(plain))
             give_up("the saved counters are not the expected ones");
         if (i == 0) continue;  // a file that replaces none
         daemon_ms.push_back(static_cast<double>(daemon_ns) / 1e6);
         plain_ms.push_back(static_cast<double>(plain_ns) / 1e6);
+        daemon_cpu_ms.push_back(static_cast<double>(daemon_cpu_ns) / 1e6);
+        plain_cpu_ms.push_back(static_cast<double>(plain_cpu_ns) / 1e6);
     }
     stop(daemon);
     print_row("fprintf for every record, rename", plain_ms, "ms");
     print_row("kivd", daemon_ms, "ms");
-    print_row("kivd : fprintf", ratios(daemon_ms, plain_ms), "x", {bound::at_most, 0.6});
+    print_row("kivd : fprintf", ratios(daemon_ms, plain_ms), "x", {bound::at_most, 0.35});
+    print_row("CPU time, fprintf", plain_cpu_ms, "ms");
+    print_row("CPU time, kivd", daemon_cpu_ms, "ms");
+    print_row("CPU time, kivd : fprintf", ratios(daemon_cpu_ms, plain_cpu_ms), "x");
 }
 
 }  // namespace kivd::bench

@@ -8,7 +8,6 @@
 #include <cstring>
 
 #include "util/file_io.h"
-#include "util/numbers.h"
 
 namespace kivd {
 namespace {
@@ -60,31 +59,6 @@ list_writer::list_writer(const char* path) : path_(path) {
 void list_writer::flush() {
     const size_t size = std::exchange(used_, 0);
     if (error_ == 0 && !write_all(file_.get(), bytes_.data(), size)) error_ = errno;
-}
-
-void list_writer::put(std::string_view bytes) {
-    while (!bytes.empty()) {
-        if (used_ == bytes_.size()) flush();
-        const size_t size = bytes.copy(bytes_.data() + used_, bytes_.size() - used_);
-        used_ += size;
-        bytes.remove_prefix(size);
-    }
-}
-
-void list_writer::text(std::string_view field) {
-    put(field);
-    put(list_record_end.substr(0, 1));
-}
-
-void list_writer::number(int64_t field) {
-    char digits[20];
-    text({digits, format_int64(digits, field)});
-}
-
-bool list_writer::end_record() {
-    put(list_record_end.substr(1));
-    errno = error_;
-    return error_ == 0;
 }
 
 bool list_writer::finish(bool records_written) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <array>
+#include <cerrno>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -10,6 +11,7 @@
 #include "format/list_record.h"
 #include "list/sorted_list.h"
 #include "runtime/log_and_raise.h"
+#include "util/numbers.h"
 #include "util/unique_fd.h"
 
 namespace kivd {
@@ -44,12 +46,25 @@ class list_writer {
  public:
     explicit list_writer(const char* path);  // which the caller keeps; it may be -1, see `finish`
 
-    // One record: its fields in their order, and its end. Errors show at any of them or in
-    // `finish`.
-    void text(std::string_view field);
-    void number(int64_t field);
-    // False, with errno set, once a write has failed.
-    [[nodiscard]] bool end_record();
+    // One record: its fields in their order, and its end. False, with errno set, once a write has
+    // failed, or a field is longer than a whole record may be (EMSGSIZE).
+    void text(std::string_view field) {
+        if (!make_room(field.size() + 1)) return;
+        used_ += field.copy(bytes_.data() + used_, field.size());
+        bytes_[used_++] = '\0';
+    }
+    void number(int64_t field) {
+        if (!make_room(21)) return;
+        char* const digits = bytes_.data() + used_;
+        used_ += static_cast<size_t>(format_int64(digits, field) - digits);
+        bytes_[used_++] = '\0';
+    }
+    [[nodiscard]] bool end_record() {
+        (void)make_room(list_record_end.size());
+        used_ += list_record_end.copy(bytes_.data() + used_, list_record_end.npos, 1);
+        errno = error_;
+        return error_ == 0;
+    }
 
     // Puts the file into place. On failure, logged and raised, the old one is untouched and the
     // temporary one gone; `records_written` says whether the caller has been able to write them
@@ -59,7 +74,13 @@ class list_writer {
     [[nodiscard]] bool is_open() const { return file_.ok(); }
 
  private:
-    void put(std::string_view bytes);
+    [[nodiscard]] bool make_room(size_t size) {
+        if (size <= bytes_.size() - used_) return true;
+        flush();
+        if (size <= bytes_.size()) return true;
+        if (error_ == 0) error_ = EMSGSIZE;
+        return false;
+    }
     void flush();
 
     const char* path_;
@@ -67,7 +88,7 @@ class list_writer {
     unique_fd file_;
     int error_ = 0;  // errno of the first failure
     size_t used_ = 0;
-    std::array<char, 16384> bytes_;
+    std::array<char, 32768> bytes_;
 };
 
 // Appends what `parse` makes of the records of the file at `path`: a unique_entry, or null to skip

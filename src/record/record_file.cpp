@@ -93,12 +93,6 @@ void rescue_event_file(const char* path, record_header header) {
     }
 }
 
-void record_appender::append(std::span<const uint8_t> record, const char* store_tag) {
-    if (record.size() > buffer_.size() - used_) flush(store_tag);
-    std::ranges::copy(record, buffer_.begin() + used_);
-    used_ += record.size();
-}
-
 void record_appender::flush(const char* store_tag) {
     const size_t size = std::exchange(used_, 0);
     if (write_all(fd_, buffer_.data(), size)) {

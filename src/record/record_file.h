@@ -31,9 +31,13 @@ class record_appender {
     // `fd`, which stays the caller's, is open for appending and stands at its end.
     record_appender(int fd, uint64_t file_size) : fd_(fd), file_size_(file_size) {}
 
-    // Takes a copy of a record; nothing when it is empty. A failure to write those before it is
-    // logged and raised under `store_tag`, as in `flush`.
-    void append(std::span<const uint8_t> record, const char* store_tag);
+    // Has `pack(room)` put a record into room for `largest` bytes; it gives the record's size, or 0
+    // to leave it out. A failure to write those before it is logged and raised under `store_tag`,
+    // as in `flush`.
+    void append(size_t largest, const char* store_tag, auto pack) {
+        if (largest > buffer_.size() - used_) flush(store_tag);
+        used_ += pack(std::span(buffer_).subspan(used_, largest));
+    }
 
     // Writes what `append` has taken.
     void flush(const char* store_tag);
@@ -41,7 +45,7 @@ class record_appender {
  private:
     int fd_;
     uint64_t file_size_;  // whole records so far
-    std::array<uint8_t, 8192> buffer_;
+    std::array<uint8_t, 32768> buffer_;
     size_t used_ = 0;
 };
 

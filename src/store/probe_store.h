@@ -82,8 +82,8 @@ class probe_store {
     void write_report(record_appender& report, int64_t since_ms) const {
         list_.for_each([&](const entry& each) {
             if (each.changed_ms() < since_ms) return;
-            uint8_t record[entry::report_record_size];
-            report.append({record, each.pack(record)}, tag_);
+            report.append(entry::report_record_size, tag_,
+                          [&each](std::span<uint8_t> room) { return each.pack(room); });
         });
         report.flush(tag_);
     }
