@@ -19,6 +19,7 @@
 #include "report/report_sealing.h"
 #include "security/key_paths.h"
 #include "security/seal.h"
+#include "toolkit/unique_openssl.h"
 #include "util/file_io.h"
 
 namespace kivd::bench {

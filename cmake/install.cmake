@@ -1,6 +1,5 @@
 # What `cmake --install` puts where, in four components: daemon, library (what programs need to
 # run), development (what they need to be built) and tools.
-include(GNUInstallDirs)
 include(CMakePackageConfigHelpers)
 
 set(packaging ${PROJECT_SOURCE_DIR}/packaging)
@@ -30,6 +29,7 @@ endfunction()
 # daemon
 set(daemon_doc_dir ${CMAKE_INSTALL_DATAROOTDIR}/doc/kivd)
 install(TARGETS kivd RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR} COMPONENT daemon)
+install(TARGETS kivd_crypto LIBRARY DESTINATION ${KIV_MODULE_INSTALL_DIRECTORY} COMPONENT daemon)
 install_with_prefix(${packaging}/kivd.service lib/systemd/system daemon)
 install(FILES ${packaging}/sysusers.conf DESTINATION lib/sysusers.d RENAME kivd.conf
     COMPONENT daemon)

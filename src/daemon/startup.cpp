@@ -29,6 +29,7 @@
 #include "runtime/child_process.h"
 #include "runtime/give_up.h"
 #include "runtime/stop.h"
+#include "security/crypto_module.h"
 #include "security/key_paths.h"
 #include "store/counters.h"
 #include "store/static_data.h"
@@ -122,6 +123,11 @@ void wait_while_disabled() {
     while (!is_stop_requested()) wait_for_stop(day_ms);
 }
 
+// With a key there, a missing module is told at the start.
+void load_crypto_for_keys() {
+    if (is_sealing_on() || is_verification_on()) (void)get_crypto();
+}
+
 // Detaches, enters the working directory and makes sure to be the only daemon there.
 void enter_working_directory(const options& given) {
     if (given.detach && getppid() != 1) {
@@ -168,6 +174,7 @@ int run_daemon(int argc, char** argv) {
 
     __android_log_print(ANDROID_LOG_INFO, tag, "Starting up...");
     create_directories();
+    load_crypto_for_keys();
     const bool has_filter = start_modules();
     write_config_request();
     if (!has_filter && !is_test_mode()) install_first_configuration();

@@ -1,7 +1,6 @@
 #include "intake/intake.h"
 
 #include <fcntl.h>
-#include <openssl/evp.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -26,6 +25,7 @@
 #include "report/identity.h"
 #include "report/state_file.h"
 #include "runtime/log_and_raise.h"
+#include "security/crypto_module.h"
 #include "security/key_paths.h"
 #include "security/signature.h"
 #include "util/directory.h"
@@ -51,7 +51,8 @@ void clean_input_dir() {
 bool refuse(const char* reason) { return log_and_raise(tag, "%s", reason); }
 
 bool checksum_of(std::span<const uint8_t> file, config_checksum& checksum) {
-    return EVP_Digest(file.data(), file.size(), checksum.data(), nullptr, EVP_sha1(), nullptr) == 1;
+    const crypto_functions* const crypto = get_crypto();
+    return crypto != nullptr && crypto->sha1(file, checksum);
 }
 
 bool is_filter_part(const Kiv__Config__ConfigPart& part) {

@@ -11,8 +11,8 @@
 
 #include "kivctl/file_rights.h"
 #include "security/seal.h"
+#include "toolkit/unique_openssl.h"
 #include "util/file_io.h"
-#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {

@@ -20,6 +20,7 @@
 #include <span>
 #include <string_view>
 
+#include "util/mutex.h"
 #include "util/utf8.h"
 
 namespace kivd {
@@ -28,7 +29,7 @@ namespace {
 constexpr size_t line_size = 32768;  // longer ones are cut
 constexpr int stalled_wait_ms = 20;  // what a receiver that stopped reading may cost, once
 
-constinit std::mutex mutex;  // guards everything below, and the time zone that dates are made with
+constinit mutex guard;  // guards everything below, and the time zone that dates are made with
 constinit bool to_system = false;
 constinit int system_log_fd = -1;
 constinit unsigned lines_lost = 0;
@@ -160,9 +161,9 @@ void log_to_system() { to_system = true; }
 
 void log_forget_descriptor() { system_log_fd = -1; }
 
-void log_lock() { mutex.lock(); }
+void log_lock() { guard.lock(); }
 
-void log_unlock() { mutex.unlock(); }
+void log_unlock() { guard.unlock(); }
 
 extern "C" int __android_log_print(int priority, const char* tag, const char* format, ...) {
     va_list arguments;
@@ -175,7 +176,7 @@ extern "C" int __android_log_print(int priority, const char* tag, const char* fo
 extern "C" int __android_log_vprint(int priority, const char* tag, const char* format,
                                     va_list arguments) {
     const int saved_errno = errno;
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     const bool caught_up = lines_lost == 0 || log_line(ANDROID_LOG_WARN, "kivd",
                                                        "%u log lines were lost here", lines_lost);
     if (caught_up) lines_lost = 0;

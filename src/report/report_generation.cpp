@@ -17,6 +17,7 @@
 #include "report/state_file.h"
 #include "runtime/child_process.h"
 #include "runtime/log_and_raise.h"
+#include "security/crypto_module.h"
 #include "security/key_paths.h"
 #include "store/counters.h"
 #include "store/events.h"
@@ -53,6 +54,7 @@ bool flush_stores() {
 }
 
 void start_compactor() {
+    if (is_sealing_on()) (void)get_crypto();  // or each compactor would load it
     const pid_t pid = fork_child(child_kind::worker);
     if (pid < 0) {
         log_and_raise(tag, "Failed to fork compactor thread.");

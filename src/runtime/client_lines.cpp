@@ -6,6 +6,7 @@
 
 #include "platform/android_log.h"
 #include "util/clock.h"
+#include "util/mutex.h"
 
 namespace kivd {
 namespace {
@@ -15,7 +16,7 @@ constexpr int64_t period_ms = 1000;
 
 constinit thread_local line_cause current_cause = line_cause::daemon;
 
-constinit std::mutex mutex;  // guards everything below; a forked child does not take it
+constinit mutex guard;  // guards everything below; a forked child does not take it
 constinit int64_t period_start_ms = 0;
 constinit unsigned lines = 0;
 constinit unsigned left_out = 0;
@@ -38,7 +39,7 @@ line_cause_scope::~line_cause_scope() { current_cause = before_; }
 
 bool take_line() {
     if (current_cause == line_cause::daemon) return true;
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     begin_period_when_due();
     const bool allowed = lines < most_lines;
     ++(allowed ? lines : left_out);
@@ -46,12 +47,12 @@ bool take_line() {
 }
 
 bool are_lines_left_out() {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     return left_out > 0;
 }
 
 void tell_lines_left_out() {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     if (left_out > 0) begin_period_when_due();
 }
 

@@ -15,6 +15,7 @@
 #include "daemon_error.pb-c.h"
 #include "platform/android_log.h"
 #include "util/clock.h"
+#include "util/mutex.h"
 #include "util/releaser.h"
 
 namespace kivd {
@@ -22,7 +23,7 @@ namespace {
 
 constexpr char tag[] = "kivd-error";
 
-constinit std::mutex mutex;  // guards everything below
+constinit mutex guard;  // guards everything below
 constinit int32_t error_nr = 0;
 constinit time_t error_time = 0;
 constinit bool notice_logged = false;
@@ -100,13 +101,13 @@ void send_event(char* text, bool flooding) {
 }  // namespace
 
 void daemon_error_init(const char* directory) {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     connection_directory = directory;
     if (is_test_mode()) flood_interval = error_flood_interval_in_test_mode;
 }
 
 void daemon_error_release() {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     error_nr = 0;
     error_time = 0;
     notice_logged = false;
@@ -123,7 +124,7 @@ void raise_daemon_error(const char* format, ...) {
     vsnprintf(text, sizeof text, format, arguments);
     va_end(arguments);
 
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     if (const std::optional<bool> flooding = admit()) {
         notice_logged = false;
         if (connect_to_self()) {
@@ -143,28 +144,28 @@ void fatal_error(const char* message) {
 }
 
 int32_t get_error_nr() {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     return error_nr;
 }
 
 void set_error_nr(int32_t count) {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     error_nr = count;
 }
 
 time_t get_error_time() {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     return error_time;
 }
 
 void set_error_time(time_t start) {
-    const std::lock_guard lock(mutex);
+    const std::lock_guard lock(guard);
     error_time = start;
 }
 
-void daemon_error_lock() { mutex.lock(); }
+void daemon_error_lock() { guard.lock(); }
 
-void daemon_error_unlock() { mutex.unlock(); }
+void daemon_error_unlock() { guard.unlock(); }
 
 void daemon_error_forget_connection() { connection = nullptr; }
 

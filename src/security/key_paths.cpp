@@ -1,7 +1,5 @@
 #include "security/key_paths.h"
 
-#include <openssl/err.h>
-#include <openssl/pem.h>
 #include <unistd.h>
 
 #include <array>
@@ -28,14 +26,10 @@ bool is_expected(const key_path& path) {
     return errno != ENOENT && errno != ENOTDIR && errno != EACCES;
 }
 
-unique_pkey load_public_key(const key_path& path) {
+crypto_key load_public_key(const key_path& path) {
     const unique_file file = open_to_read(path.data());
-    if (!file) return nullptr;
-    // An empty pass phrase replaces the library's own callback, which would ask at the terminal.
-    char no_pass_phrase[] = "";
-    unique_pkey key(PEM_read_PUBKEY(file.get(), nullptr, nullptr, no_pass_phrase));
-    ERR_clear_error();
-    return key;
+    const crypto_functions* const crypto = file ? get_crypto() : nullptr;
+    return crypto_key(crypto != nullptr ? crypto->read_key(file.get()) : nullptr);
 }
 
 }  // namespace
@@ -61,8 +55,8 @@ bool is_sealing_on() { return is_expected(report_key_path); }
 
 bool is_verification_on() { return is_expected(config_key_path); }
 
-unique_pkey load_report_key() { return load_public_key(report_key_path); }
+crypto_key load_report_key() { return load_public_key(report_key_path); }
 
-unique_pkey load_config_key() { return load_public_key(config_key_path); }
+crypto_key load_config_key() { return load_public_key(config_key_path); }
 
 }  // namespace kivd

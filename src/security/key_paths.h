@@ -4,7 +4,7 @@
 // that a replaced one takes effect without a restart.
 #pragma once
 
-#include "util/unique_openssl.h"
+#include "security/crypto_module.h"
 
 namespace kivd {
 
@@ -24,8 +24,9 @@ void clear_config_key_path();
 [[nodiscard]] bool is_sealing_on();
 [[nodiscard]] bool is_verification_on();
 
-// The public key in the key file, in PEM; null when the file cannot be read or holds none.
-[[nodiscard]] unique_pkey load_report_key();
-[[nodiscard]] unique_pkey load_config_key();
+// The public key in the key file, in PEM; null when the file cannot be read or holds
+// none, or the module for keys cannot be loaded, which has been logged and raised.
+[[nodiscard]] crypto_key load_report_key();
+[[nodiscard]] crypto_key load_config_key();
 
 }  // namespace kivd

@@ -2,25 +2,21 @@
 // IV of its own, and that key with the RSA report key (RSAES-PKCS1-v1_5).
 #pragma once
 
-#include <openssl/evp.h>
-
 #include <array>
 #include <cstdint>
 #include <optional>
 #include <span>
 
-#include "util/unique_openssl.h"
+#include "security/crypto_module.h"
 
 namespace kivd {
 
-inline constexpr uint32_t max_report_key_bits = 4096;
-
 // One encryption that is under way.
 struct sealing {
-    unique_cipher cipher;
+    crypto_cipher cipher;
     std::array<uint8_t, max_report_key_bits / 8> encrypted_key;  // as long as the key's modulus
     uint32_t key_bits;
-    std::array<uint8_t, EVP_MAX_IV_LENGTH> iv;
+    std::array<uint8_t, cipher_block_size> iv;
 
     [[nodiscard]] std::span<const uint8_t> key() const {
         return std::span(encrypted_key).first(key_bits / 8);

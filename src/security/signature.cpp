@@ -1,16 +1,14 @@
 #include "security/signature.h"
 
-#include <openssl/err.h>
-#include <openssl/evp.h>
-
 #include <array>
 #include <cstdio>
+#include <span>
 
 #include "runtime/log_and_raise.h"
+#include "security/crypto_module.h"
 #include "security/key_paths.h"
 #include "util/file_io.h"
 #include "util/unique_fd.h"
-#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {
@@ -19,26 +17,25 @@ constexpr char tag[] = "kivd/crypto";
 constexpr size_t max_signature_size = 1024;
 constexpr size_t chunk_size = 4096;
 
-bool digest_file(EVP_MD_CTX* digest, FILE* data) {
+bool digest_file(digest* started, FILE* data) {
     std::array<uint8_t, chunk_size> chunk;
     while (const size_t size = fread(chunk.data(), 1, chunk.size(), data)) {
-        if (EVP_DigestUpdate(digest, chunk.data(), size) != 1) return false;
+        if (!get_crypto()->add_data(started, std::span(chunk).first(size))) return false;
     }
     return ferror(data) == 0;
 }
 
-bool verify_signature(FILE* data, FILE* signature, EVP_PKEY* key) {
-    const unique_digest digest(EVP_MD_CTX_new());
-    if (!digest) {
-        return log_and_raise(tag, "Failed to create EVP context");
-    }
-    if (EVP_DigestInit_ex(digest.get(), EVP_sha1(), nullptr) != 1) {
+bool verify_signature(FILE* data, FILE* signature, const public_key* key) {
+    const crypto_functions& crypto = *get_crypto();
+    const crypto_digest digest(crypto.create_digest());
+    if (!digest) return log_and_raise(tag, "Failed to create EVP context");
+    if (!crypto.start_digest(digest.get())) {
         return log_and_raise(tag, "Failed to initialize EVP");
     }
     if (!digest_file(digest.get(), data)) return false;
     std::array<uint8_t, max_signature_size> bytes;
     const size_t size = fread(bytes.data(), 1, bytes.size(), signature);
-    return EVP_VerifyFinal(digest.get(), bytes.data(), static_cast<unsigned>(size), key) == 1;
+    return crypto.is_signed(digest.get(), std::span(bytes).first(size), key);
 }
 
 }  // namespace
@@ -52,13 +49,11 @@ bool verify_file(const char* data_path, const char* signature_path) {
     if (!signature) {
         return log_and_raise(tag, "Failed to open signature file.");
     }
-    const unique_pkey key = load_config_key();
+    const crypto_key key = load_config_key();
     if (!key) {
         return log_and_raise(tag, "Failed to load public key.");
     }
-    const bool holds = verify_signature(data.get(), signature.get(), key.get());
-    ERR_clear_error();
-    return holds;
+    return verify_signature(data.get(), signature.get(), key.get());
 }
 
 }  // namespace kivd

@@ -43,6 +43,7 @@ struct held_events {
 };
 constinit parent_memory<held_events> held;
 constinit bool is_holding = false;
+constinit bool is_written_at_exit = false;
 
 void write_held() {
     if (!is_holding || held->count == 0) return;
@@ -53,8 +54,8 @@ void write_held() {
 
 // False when there is no memory for it: each event is then written at once.
 bool prepare_holding() {
-    static const bool ends_with_exit = atexit(write_held) == 0;
-    if (ends_with_exit && !held) held = map_parent_memory<held_events>();
+    if (!is_written_at_exit) is_written_at_exit = atexit(write_held) == 0;
+    if (is_written_at_exit && !held) held = map_parent_memory<held_events>();
     return held != nullptr;
 }
 

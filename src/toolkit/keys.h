@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "util/unique_openssl.h"
+#include "toolkit/unique_openssl.h"
 
 namespace kivd {
 

@@ -10,24 +10,24 @@
 namespace kivd {
 
 struct memory_unmapper {
-    template <typename T>
-    void operator()(T* mapped) const {
-        (void)munmap(mapped, sizeof(T));
+    template <typename type>
+    void operator()(type* mapped) const {
+        (void)munmap(mapped, sizeof(type));
     }
 };
 
-template <typename T>
-using parent_memory = std::unique_ptr<T, memory_unmapper>;
+template <typename type>
+using parent_memory = std::unique_ptr<type, memory_unmapper>;
 
-// A T of zero bytes in a mapping of its own; null, with errno set, when that is not possible.
-template <typename T>
-[[nodiscard]] parent_memory<T> map_parent_memory() {
-    static_assert(std::is_trivially_destructible_v<T>);
+// A value of zero bytes in a mapping of its own; null, with errno set, when that is not possible.
+template <typename type>
+[[nodiscard]] parent_memory<type> map_parent_memory() {
+    static_assert(std::is_trivially_destructible_v<type>);
     void* const mapping =
-        mmap(nullptr, sizeof(T), PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+        mmap(nullptr, sizeof(type), PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
     if (mapping == MAP_FAILED) return nullptr;
-    (void)madvise(mapping, sizeof(T), MADV_DONTFORK);
-    return parent_memory<T>(static_cast<T*>(mapping));
+    (void)madvise(mapping, sizeof(type), MADV_DONTFORK);
+    return parent_memory<type>(static_cast<type*>(mapping));
 }
 
 }  // namespace kivd

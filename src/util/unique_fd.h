@@ -17,7 +17,7 @@ using unique_dir = std::unique_ptr<DIR, releaser<closedir>>;
 // Owns a descriptor; -1 is none.
 class unique_fd {
  public:
-    explicit unique_fd(int fd = -1) noexcept : fd_(fd) {}
+    constexpr explicit unique_fd(int fd = -1) noexcept : fd_(fd) {}
     unique_fd(unique_fd&& other) noexcept : fd_(other.release()) {}
     unique_fd& operator=(unique_fd&& other) noexcept {
         reset(other.release());

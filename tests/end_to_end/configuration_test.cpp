@@ -195,5 +195,21 @@ TEST_F(configuration, files_are_verified_and_sealed_from_the_command_line) {
     }
 }
 
+// Found before the real one.
+TEST_F(configuration, nothing_is_reported_or_taken_without_the_module_for_keys) {
+    std::filesystem::create_directory("broken");
+    write_file("broken/kivd-crypto.so", "");
+    EXPECT_EQ(setenv("LD_LIBRARY_PATH", (directory + "/broken").c_str(), 1), 0);
+    make_keys("report");
+    daemon_process daemon = start({{"-C", "-c", directory + "/"}});
+    EXPECT_TRUE(daemon.wait_log("E kivd/crypto: Failed to load the module for keys: "));
+    request({"EV p event x", "FL"});
+    EXPECT_TRUE(daemon.wait_log("E kivd-compactor: Failed to initialize encryption."));
+    EXPECT_EQ(install(config_file({{"app", "part", "x"}})), "0");
+    EXPECT_TRUE(report_paths().empty());
+    EXPECT_EQ(daemon.stop(), 0);
+    EXPECT_EQ(unsetenv("LD_LIBRARY_PATH"), 0);
+}
+
 }  // namespace
 }  // namespace kivd

@@ -3,12 +3,12 @@
 #include <linux/netlink.h>
 #include <poll.h>
 #include <pthread.h>
+#include <semaphore.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <atomic>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
@@ -36,7 +36,11 @@ constexpr suseconds_t send_timeout_us = 50000;  // then it looks whether the dae
 
 constinit pthread_t thread = {};
 constinit bool thread_started = false;
-constinit std::atomic<bool> is_set_up = false;
+sem_t is_set_up = {};
+
+// These stay open until the process ends, so that nobody else takes the port.
+constinit daemon_socket to_daemon;
+constinit unique_fd from_kernel;
 
 // Logs "WHAT [errno/text]".
 bool fail(const char* what, const char* end = "") {
@@ -197,33 +201,31 @@ void receive_kernel_message(int netlink, daemon_socket& daemon) {
 }
 
 void run_kernel_bridge() {
-    // These stay open until the process ends, so that nobody else takes the port.
-    static daemon_socket daemon;
-    static unique_fd netlink;
-    const bool serving = open_daemon_socket(daemon) && open_netlink_socket(netlink) &&
-                         send_pid_to_kernel(netlink.get());
-    is_set_up = true;
-    is_set_up.notify_one();
+    const bool serving = open_daemon_socket(to_daemon) && open_netlink_socket(from_kernel) &&
+                         send_pid_to_kernel(from_kernel.get());
+    (void)sem_post(&is_set_up);
     if (!serving) return;
-    while (!is_stop_requested()) receive_kernel_message(netlink.get(), daemon);
+    while (!is_stop_requested()) receive_kernel_message(from_kernel.get(), to_daemon);
     __android_log_print(ANDROID_LOG_INFO, tag, "Shutting Down...");
 }
 
 bool start_kernel_bridge() {
+    if (sem_init(&is_set_up, 0, 0) != 0) return false;
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
     pthread_sigmask(SIG_SETMASK, &all, &before);  // a stop signal has to wake the loop
     thread_started = pthread_create(&thread, nullptr, run_thread, nullptr) == 0;
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    if (thread_started) is_set_up.wait(false);  // what it opens is open from the start on
+    // What it opens is open from the start on.
+    while (thread_started && sem_wait(&is_set_up) != 0 && errno == EINTR) {
+    }
     return thread_started;
 }
 
 void join_kernel_bridge() {
     if (thread_started) (void)pthread_join(thread, nullptr);
     thread_started = false;
-    is_set_up = false;
 }
 
 }  // namespace kivd

@@ -16,7 +16,7 @@ namespace kivd {
 
 // Where the requests go.
 struct daemon_socket {
-    sockaddr_un address;
+    sockaddr_un address = {};
     unique_fd fd;
 };
 

@@ -7,8 +7,8 @@
 namespace kivd {
 
 // Takes up to 16 packets that wait on the socket and handles each to its end, in order; events
-// are stored when this returns. It takes one with a receive delay, or while there is a debug client.
-// False when there was none.
+// are stored when this returns. It takes one with a receive delay, or while there is a debug
+// client. False when there was none.
 bool receive_datagrams(int fd);
 
 // The same as a callback.

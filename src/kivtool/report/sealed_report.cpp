@@ -8,9 +8,9 @@
 #include <new>
 #include <span>
 
+#include "toolkit/unique_openssl.h"
 #include "toolkit/unpacked_bytes.h"
 #include "util/bytes.h"
-#include "util/unique_openssl.h"
 
 namespace kivd {
 namespace {
