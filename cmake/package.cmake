@@ -54,6 +54,9 @@ set(CPACK_DEBIAN_PACKAGE_PRIORITY optional)
 set(CPACK_DEBIAN_DAEMON_PACKAGE_SECTION admin)
 set(CPACK_DEBIAN_DAEMON_PACKAGE_DEPENDS
     "systemd | systemd-standalone-sysusers | systemd-sysusers")
+if(KIV_PACKS_RELOCATIONS)
+    string(APPEND CPACK_DEBIAN_DAEMON_PACKAGE_DEPENDS ", libc6 (>= 2.36)")  # no symbol tells
+endif()
 set(CPACK_DEBIAN_DAEMON_PACKAGE_RECOMMENDS kiv-tools)
 set(CPACK_DEBIAN_DAEMON_PACKAGE_CONTROL_EXTRA
     ${packaging}/deb/kivd/postinst ${packaging}/deb/kivd/prerm ${packaging}/deb/kivd/postrm)
