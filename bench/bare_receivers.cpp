@@ -5,14 +5,19 @@
 #include <sys/socket.h>
 #include <sys/uio.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
+#include <filesystem>
 #include <memory>
+#include <span>
+#include <utility>
 #include <vector>
 
 #include "bench/measure.h"
+#include "config/limits.h"
 
 namespace kivd::bench {
 
@@ -104,6 +109,74 @@ void receive_batched(int fd, int file, std::vector<char>& head, size_t payload_a
     }
 }
 
+// The event file of a receiver that makes reports.
+class reported_file {
+ public:
+    reported_file(std::string directory, gzip_level level)
+        : directory_(std::move(directory)), level_(level) {
+        std::filesystem::create_directory(directory_ + "/output");
+        open();
+    }
+    // False when the records cannot be written.
+    bool append(std::span<const iovec> pieces, size_t size) {
+        const ssize_t n = writev(file_.get(), pieces.data(), static_cast<int>(pieces.size()));
+        if (n != static_cast<ssize_t>(size)) return false;
+        size_ += size;
+        if (size_ >= limits().max_report_size) flush();
+        return true;
+    }
+
+ private:
+    void open() {
+        file_ = unique_fd(::open((directory_ + "/events").c_str(),
+                                 O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, S_IRWXU));
+        if (!file_.ok()) give_up("%s/events: %s", directory_.c_str(), strerror(errno));
+        size_ = 0;
+    }
+    void flush() {
+        const std::string flushed = directory_ + "/flushed";
+        const std::string copy = directory_ + "/copy";
+        const std::string report = directory_ + "/output/kiv_" + std::to_string(++reports_);
+        if (child_ > 0) (void)waitpid(child_, nullptr, 0);
+        if (rename((directory_ + "/events").c_str(), flushed.c_str()) != 0) return;
+        child_ = fork();
+        if (child_ == 0) {
+            const bool made = gzip_file(flushed.c_str(), copy.c_str(), level_) &&
+                              rename(copy.c_str(), report.c_str()) == 0;
+            _exit(made && unlink(flushed.c_str()) == 0 ? 0 : 1);
+        }
+        open();
+    }
+
+    std::string directory_;
+    gzip_level level_;
+    unique_fd file_;
+    size_t size_ = 0;
+    unsigned reports_ = 0;
+    pid_t child_ = -1;
+};
+
+void receive_gathered(int fd, const std::string& directory, std::vector<char>& head,
+                      size_t payload_at, gzip_level level) {
+    const unique_fd poller = watch(fd);
+    const auto packets = std::make_unique<batch>();
+    reported_file file(directory, level);
+    epoll_event events[max_events];
+    while (epoll_wait(poller.get(), events, max_events, idle_limit_ms) > 0) {
+        const int count = receive_batch(fd, *packets);
+        std::vector<iovec> pieces;
+        size_t bytes = 0;
+        for (int i = 0; i < count; ++i) {
+            const size_t size = packets->messages[i].msg_len;
+            if (size <= payload_at) continue;
+            pieces.push_back({head.data(), head.size()});
+            pieces.push_back({packets->packets[i] + payload_at, size - payload_at});
+            bytes += head.size() + size - payload_at;
+        }
+        if (!pieces.empty() && !file.append(pieces, bytes)) return;
+    }
+}
+
 void echo(int listener) {
     const unique_fd poller = watch(listener);
     epoll_event events[max_events];
@@ -133,7 +206,7 @@ void echo(int listener) {
 }  // namespace
 
 child_process start_receiver(receiver kind, const std::string& directory, size_t head_size,
-                             size_t payload_at) {
+                             size_t payload_at, gzip_level level) {
     const unique_fd fd = bind_socket(SOCK_DGRAM, directory + "/kiv_cl");
     const timeval timeout{.tv_sec = 1, .tv_usec = 0};
     (void)setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
@@ -143,6 +216,8 @@ child_process start_receiver(receiver kind, const std::string& directory, size_t
     return fork_child([&] {
         std::vector<char> head(head_size, 'h');
         if (kind == receiver::batched_discard) return receive_batched(fd.get(), -1, head, 0);
+        if (kind == receiver::gathered)
+            return receive_gathered(fd.get(), directory, head, payload_at, level);
         const std::string path = directory + "/events";
         const unique_fd file(
             open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, S_IRWXU));
