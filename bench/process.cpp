@@ -155,6 +155,10 @@ int64_t private_dirty_bytes(pid_t pid) {
     return read_field(proc_path(pid, "smaps_rollup"), "Private_Dirty:") * 1024;
 }
 
+int64_t resident_bytes(pid_t pid) {
+    return read_field(proc_path(pid, "smaps_rollup"), "Rss:") * 1024;
+}
+
 unique_fd open_system_call_counter(pid_t thread) {
     std::ifstream file("/sys/kernel/tracing/events/raw_syscalls/sys_enter/id");
     uint64_t id = 0;

@@ -71,6 +71,8 @@ class pinned_thread {
 [[nodiscard]] int64_t voluntary_switches(pid_t pid);
 // Memory that no other process shares and no file backs.
 [[nodiscard]] int64_t private_dirty_bytes(pid_t pid);
+// All that is in memory, shared libraries included.
+[[nodiscard]] int64_t resident_bytes(pid_t pid);
 
 // Kernel counters, read with read_counter. None where the kernel or its settings don't allow them.
 //
