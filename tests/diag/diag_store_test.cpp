@@ -57,6 +57,9 @@ std::string file(int number) {
 std::vector<std::string> stored() {
     kiv::Report records;
     EXPECT_TRUE(records.ParsePartialFromString(read_file("private/qz/qz_1")));
+    for (const char* path : {"private/qz", "private/qz/qz_1"}) {
+        EXPECT_EQ(fs::status(path).permissions(), fs::perms::owner_all) << path;
+    }
     std::vector<std::string> names;
     for (const auto& event : records.events()) names.push_back(event.package() + event.name());
     return names;

@@ -107,6 +107,7 @@ TEST_F(operator_commands, each_damage_is_found_and_nothing_else) {
         {"sed -i 's/^data-collection.*/data-collection: 0/' private/kivd.state", "collection_off"},
         {"chmod 600 kiv_co_stream", "socket"},
         {"chmod 604 kivd.pid", "lock_file"},
+        {"chmod 602 kivd.pid", "lock_file"},
         {"chmod 604 kivd.pid; chmod 710 .", ""},
     };
     EXPECT_EQ(system("tar cf all.tar keys private output"), 0);

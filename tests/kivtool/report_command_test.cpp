@@ -50,6 +50,7 @@ TEST_F(report_command, shows_every_file_it_can_and_tells_what_is_wrong_with_the_
         EXPECT_EQ(out.find("torn"), std::string::npos) << out;
         EXPECT_EQ(err, complaints);
         EXPECT_EQ(show({good}, {format}).status, 0);
+        EXPECT_EQ(show({good}, {format, missing}).status, 1);  // no such key
 
         std::ofstream full("/dev/full");
         std::ostringstream problem;

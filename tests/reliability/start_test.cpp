@@ -2,6 +2,7 @@
 #include <fcntl.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 
 #include <csignal>
@@ -75,6 +76,30 @@ TEST_F(started_daemon, serves_and_stops_whatever_it_is_started_from) {
             }
         }
     }
+}
+
+TEST_F(started_daemon, leaves_its_files_to_those_they_are_for) {
+    umask(0);
+    daemon_process daemon = start();
+    request({"EV p n x", "CI p c 1", "FL", "EV p n x", "FS"});
+    (void)wait_report(1);
+    const std::map<std::string, unsigned> modes = {{"input", 0755},
+                                                   {"output", 0755},
+                                                   {"output/kiv_1", 0644},
+                                                   {"private", 0700},
+                                                   {"private/events", 0700},
+                                                   {"private/kivd.state", 0644},
+                                                   {"private/counters.txt", 0644},
+                                                   {"kivd.pid", 0644},
+                                                   {"kiv_cl", 0622},
+                                                   {"kiv_co", 0622},
+                                                   {"kiv_co_stream", 0622}};
+    for (const auto& [path, mode] : modes) {
+        struct stat status = {};
+        EXPECT_EQ(stat(path.c_str(), &status), 0) << path;
+        EXPECT_EQ(status.st_mode & 0777U, mode) << path;
+    }
+    EXPECT_EQ(daemon.stop(), 0);
 }
 
 TEST_F(started_daemon, tells_the_service_manager_when_it_serves_and_when_it_stops) {

@@ -112,6 +112,10 @@ TEST_F(event_store, a_link_stays_when_there_is_no_room_for_a_header) {
     (void)add();
     EXPECT_FALSE(events_flush());
     EXPECT_EQ(read_file("elsewhere"), "");
+    EXPECT_EQ(unlink(paths::events), 0);
+    (void)add();
+    EXPECT_FALSE(fs::exists(paths::events));  // a file of its own goes instead
+    fs::create_symlink("../elsewhere", paths::events);
     limit_file_size(RLIM_INFINITY);
     (void)add();
     EXPECT_EQ(read_file("elsewhere"), header + event);
