@@ -13,7 +13,10 @@ class daemon_log : public daemon_test {};
 TEST_F(daemon_log, shows_what_clients_send_whole_and_harmless) {
     const daemon_process daemon = start();
     const std::string token(20000, 'x');
-    request({"EV " + token, "EV a\x1b[2J\x7f\vb\xff\x9b\xc2\x9b\xe2\x80\xa8\xe2\x81\xa6ä₀\xed\xa0\x80\xf4\x90\x80\x80"});
+    request(
+        {"EV " + token,
+         "EV "
+         "a\x1b[2J\x7f\vb\xff\x9b\xc2\x9b\xe2\x80\xa8\xe2\x81\xa6ä₀\xed\xa0\x80\xf4\x90\x80\x80"});
     for (const std::string& shown : {token, "a [2J  b??        ä₀???????"s}) {
         EXPECT_TRUE(daemon.wait_log("dropping. [" + shown + ":null]\n")) << daemon.log();
     }
