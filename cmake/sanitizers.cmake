@@ -3,5 +3,6 @@ set(KIV_SANITIZE "" CACHE STRING "Sanitizers to build with, as -fsanitize= takes
 if(KIV_SANITIZE)
     add_compile_options(-fsanitize=${KIV_SANITIZE} -fno-omit-frame-pointer
         -fno-sanitize-recover=all)
-    add_link_options(-fsanitize=${KIV_SANITIZE})
+    # The sanitizers' own dlopen does not see the newer kind of run path.
+    add_link_options(-fsanitize=${KIV_SANITIZE} -Wl,--disable-new-dtags)
 endif()
